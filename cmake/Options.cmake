@@ -1,0 +1,39 @@
+# SPDX-License-Identifier: Apache-2.0
+# Compiler and linker settings that every target of the build shares.
+set(LDAPPW_SANITIZE "" CACHE STRING "Sanitizers to build with, as -fsanitize= takes them")
+option(LDAPPW_COVERAGE "Instrument for gcov" OFF)
+
+set(CMAKE_CXX_STANDARD 17)
+set(CMAKE_CXX_STANDARD_REQUIRED ON)
+set(CMAKE_CXX_EXTENSIONS OFF)
+set(CMAKE_C_STANDARD 11)
+set(CMAKE_C_STANDARD_REQUIRED ON)
+set(CMAKE_C_EXTENSIONS OFF)
+set(CMAKE_POSITION_INDEPENDENT_CODE ON)
+set(CMAKE_C_VISIBILITY_PRESET hidden)
+set(CMAKE_CXX_VISIBILITY_PRESET hidden)
+set(CMAKE_VISIBILITY_INLINES_HIDDEN ON)
+set(CMAKE_CXX_FLAGS_RELEASE "-O2 -DNDEBUG")
+set(CMAKE_C_FLAGS_RELEASE "-O2 -DNDEBUG")
+
+add_library(ldappw_options INTERFACE)
+target_compile_options(ldappw_options INTERFACE -Wall -Wextra -Wpedantic -Wconversion -Wshadow -Werror)
+if(LDAPPW_SANITIZE)
+  target_compile_options(ldappw_options INTERFACE -fsanitize=${LDAPPW_SANITIZE} -fno-sanitize-recover=all
+                                                  -fno-omit-frame-pointer)
+  target_link_options(ldappw_options INTERFACE -fsanitize=${LDAPPW_SANITIZE})
+endif()
+if(LDAPPW_COVERAGE)
+  target_compile_options(ldappw_options INTERFACE --coverage)
+  target_link_options(ldappw_options INTERFACE --coverage)
+endif()
+
+# The linker's part of a shared library: nothing undefined, tables read-only after start-up, and one list of exports.
+# The sanitizers' runtimes resolve at load time only, so their builds leave the first of these out.
+function(ldappw_harden target versionScript)
+  target_link_options(${target} PRIVATE -Wl,-z,relro -Wl,-z,now -Wl,--version-script=${versionScript})
+  if(NOT LDAPPW_SANITIZE)
+    target_link_options(${target} PRIVATE -Wl,-z,defs)
+  endif()
+  set_target_properties(${target} PROPERTIES LINK_DEPENDS ${versionScript})
+endfunction()

@@ -1,0 +1,288 @@
+// SPDX-License-Identifier: Apache-2.0
+// The masked encoding: data scattered over random background, enciphered, and written as text over one of sixteen
+// alphabets, with a control packet inside that tells how to undo it.
+#include <climits>
+#include <cstring>
+#include <ctime>
+
+#include "encoding_utils.h"
+#include "masking_bits.h"
+#include "masking_cipher.h"
+#include "masking_tables.h"
+#include "owners.h"
+#include "simple_crypt.h"
+
+namespace ldappw::masking {
+namespace {
+
+constexpr unsigned encodingMax = sizeof encodings / sizeof encodings[0] - 1;
+constexpr int kLargestLength = 0xffffff;  // the packet states a length in three bytes
+
+// The control packet. From kBlockAt on it is enciphered.
+constexpr size_t kPacketBytes = 26;
+constexpr size_t kIdentifierAt = 1;
+constexpr size_t kLengthAt = 2;
+constexpr size_t kBlockKeyAt = 12;
+constexpr size_t kBlockSelectorAt = 13;
+constexpr size_t kBlockAt = 18;
+constexpr size_t kSelectorAt = 18;
+constexpr size_t kKeyAt = 19;
+constexpr size_t kConstantAt = 20;
+constexpr size_t kWidthAt = 21;
+constexpr unsigned char kBlockSelectorMask = 0xcc;
+constexpr unsigned char kSelectorMask = 0x56;
+constexpr unsigned char kConstantMask = 0x3f;
+constexpr unsigned char kWidthMask = 0x3f;
+constexpr unsigned kConstant = 39;
+static_assert(kPacketBytes - kBlockAt == kCipherBlock);
+
+// The record: the packet, without the two characters that the text shows in clear, lies behind the first data bytes.
+constexpr size_t kDataBefore = 47;
+constexpr size_t kPacketInRecord = kPacketBytes - kLengthAt;
+constexpr size_t kFixedRecord = kDataBefore + kPacketInRecord;
+
+constexpr unsigned kLengthCursor = 4;  // where the scattering of the length enters the pattern tables
+
+size_t findBinaryDataBufferSize(size_t n) noexcept {
+  return 2 * n < 97 ? 96 : 96 + (2 * n - 96 + 31) / 32 * 32;
+}
+
+unsigned widthFor(size_t length, size_t size) noexcept {
+  unsigned width = 1;
+  while (width < 4 && 8 / width * length > size) width *= 2;
+  return width;
+}
+
+const Encoding& drawnEncoding() noexcept {
+  auto seed = static_cast<unsigned>(std::clock());
+  return encodings[static_cast<unsigned>(rand_r(&seed)) % encodingMax];
+}
+
+void scatterLength(unsigned char* packet, size_t length) noexcept {
+  Cursor cursor = kLengthCursor;
+  bitScatter(static_cast<unsigned char>(length), packet + kLengthAt, cursor, 4);
+  bitScatter(static_cast<unsigned char>(length >> 8U), packet + kLengthAt + 2, cursor, 2);
+  bitScatter(static_cast<unsigned char>(length >> 16U), packet + kLengthAt + 6, cursor, 2);
+}
+
+size_t gatheredLength(const unsigned char* packet) noexcept {
+  Cursor cursor = kLengthCursor;
+  size_t length = bitGather(packet + kLengthAt, cursor, 4);
+  length |= size_t{bitGather(packet + kLengthAt + 2, cursor, 2)} << 8U;
+  return length | size_t{bitGather(packet + kLengthAt + 6, cursor, 2)} << 16U;
+}
+
+void write(unsigned char* packet, size_t at, unsigned value, unsigned char mask) noexcept {
+  packet[at] = expandOnBitPattern(value, packet[at], mask, 0);
+}
+
+// Masks the data into the packet and the data area of a record.
+void mask(const unsigned char* data, size_t length, unsigned selector, unsigned char* packet, unsigned char* area,
+          size_t size) noexcept {
+  setBackground(packet + kLengthAt, kPacketInRecord);
+  setBackground(area, size);
+  const unsigned width = widthFor(length, size);
+  Cursor cursor = 0;
+  for (size_t i = 0; i < length; ++i) bitScatter(data[i], area + 8 / width * i, cursor, width);
+  write(packet, kWidthAt, width, kWidthMask);
+  write(packet, kConstantAt, kConstant, kConstantMask);
+  write(packet, kSelectorAt, selector, kSelectorMask);
+  encryptData(area, size, selector, packet[kKeyAt]);
+  write(packet, kBlockSelectorAt, selector, kBlockSelectorMask);
+  encryptData(packet + kBlockAt, kCipherBlock, selector, packet[kBlockKeyAt]);
+  scatterLength(packet, length);
+}
+
+int wrapped(const unsigned char* record, size_t bytes, const Encoding& encoding, char** out) noexcept {
+  const PlainOwner<char> text(binaryBlobToString(record, static_cast<int>(bytes), encoding.alphabet));
+  if (!text) return LDAPPW_NO_MEMORY;
+  const size_t characters = std::strlen(text.get());
+  char* result = static_cast<char*>(std::malloc(characters + 5));
+  if (result == nullptr) return LDAPPW_NO_MEMORY;
+  result[0] = '>';
+  result[1] = '1';
+  result[2] = encoding.identifier[0];
+  std::memcpy(result + 3, text.get(), characters);
+  result[3 + characters] = '<';
+  result[4 + characters] = '\0';
+  *out = result;
+  return LDAPPW_SUCCESS;
+}
+
+int encode(const unsigned char* data, size_t length, char** out) noexcept {
+  const auto selector = static_cast<unsigned>(encryptionType);
+  if (!isSelector(selector)) return LDAPPW_NOT_SUPPORTED;
+  const Encoding& encoding = drawnEncoding();
+  SecretArray<kPacketBytes> packet;
+  packet.data()[0] = '1';
+  packet.data()[kIdentifierAt] = static_cast<unsigned char>(encoding.identifier[0]);
+  const size_t size = findBinaryDataBufferSize(length);
+  const SecretOwner<unsigned char> record(static_cast<unsigned char*>(std::malloc(size + kPacketInRecord)));
+  if (!record) return LDAPPW_NO_MEMORY;
+  unsigned char* area = record.get() + kPacketInRecord;
+  mask(data, length, selector, packet.data(), area, size);
+  std::memmove(record.get(), area, kDataBefore);
+  std::memcpy(record.get() + kDataBefore, packet.data() + kLengthAt, kPacketInRecord);
+  return wrapped(record.get(), size + kPacketInRecord, encoding, out);
+}
+
+// What a decoder makes: bytes with a NUL behind them, and how many it says they are.
+struct Decoded {
+  unsigned char* data = nullptr;
+  size_t length = 0;
+};
+
+int gathered(const unsigned char* area, size_t areaBytes, size_t length, unsigned width, Decoded& out) noexcept {
+  if (length > areaBytes / (8 / width)) return LDAPPW_NOT_SUPPORTED;
+  out.data = callocBytes<unsigned char>(length + 1);
+  if (out.data == nullptr) return LDAPPW_NO_MEMORY;
+  out.length = length;
+  Cursor cursor = 0;
+  for (size_t i = 0; i < length; ++i) out.data[i] = bitGather(area + 8 / width * i, cursor, width);
+  return LDAPPW_SUCCESS;
+}
+
+// Undoes mask on a record, which it uses as its work area.
+int unmask(unsigned char* record, size_t bytes, Decoded& out) noexcept {
+  if (bytes < kFixedRecord || (bytes - kPacketInRecord) % kCipherBlock != 0) return LDAPPW_NOT_SUPPORTED;
+  SecretArray<kPacketBytes> packetBytes;
+  unsigned char* packet = packetBytes.data();
+  std::memcpy(packet + kLengthAt, record + kDataBefore, kPacketInRecord);
+  std::memmove(record + kPacketInRecord, record, kDataBefore);
+  unsigned char* area = record + kPacketInRecord;
+  const size_t areaBytes = bytes - kPacketInRecord;
+
+  const unsigned blockSelector = collapseOnBitPattern(packet[kBlockSelectorAt], kBlockSelectorMask);
+  if (!isSelector(blockSelector)) return LDAPPW_NOT_SUPPORTED;
+  decryptData(packet + kBlockAt, kCipherBlock, blockSelector, packet[kBlockKeyAt]);
+  const unsigned selector = collapseOnBitPattern(packet[kSelectorAt], kSelectorMask);
+  const unsigned width = collapseOnBitPattern(packet[kWidthAt], kWidthMask);
+  if (!isSelector(selector) || !isWidth(width)) return LDAPPW_NOT_SUPPORTED;
+  decryptData(area, areaBytes, selector, packet[kKeyAt]);
+  return gathered(area, areaBytes, gatheredLength(packet), width, out);
+}
+
+const char* alphabetOf(char identifier) noexcept {
+  for (const Encoding* entry = encodings; entry->alphabet != nullptr; ++entry) {
+    if (entry->identifier[0] == identifier) return entry->alphabet;
+  }
+  return nullptr;
+}
+
+// The form ">1" + identifier + record + "<"; what comes in begins with the identifier.
+int decodeMasked(const char* text, Decoded& out) noexcept {
+  const char* alphabet = *text == '\0' ? nullptr : alphabetOf(*text);
+  if (alphabet == nullptr) return LDAPPW_SUCCESS;
+  unsigned bytes = 0;
+  const SecretOwner<unsigned char> record(stringToBinaryBlob(text + 1, &bytes, alphabet));
+  return record ? unmask(record.get(), bytes, out) : LDAPPW_NO_MEMORY;
+}
+
+int _noencode_decode_binary(const char* text, Decoded& out) noexcept {
+  unsigned bytes = 0;
+  out.data = base64ToBinaryBlob(text, &bytes);
+  out.length = bytes;
+  return out.data != nullptr ? LDAPPW_SUCCESS : LDAPPW_NO_MEMORY;
+}
+
+// The older form ">0" + base64 of simpleCrypt output + "<".
+int decodeSimple(const char* text, Decoded& out) noexcept {
+  const int rc = _noencode_decode_binary(text, out);
+  if (rc == LDAPPW_SUCCESS) simpleCryptInPlace(out.data, out.length);
+  return rc;
+}
+
+// Clear text stands for itself; the NUL counts, as the encoder of texts masks it too.
+int copied(const char* text, size_t length, Decoded& out) noexcept {
+  out.data = static_cast<unsigned char*>(std::malloc(length + 1));
+  if (out.data == nullptr) return LDAPPW_NO_MEMORY;
+  std::memcpy(out.data, text, length + 1);
+  out.length = length + 1;
+  return LDAPPW_SUCCESS;
+}
+
+int decode(char* text, Decoded& out) noexcept {
+  const size_t length = std::strlen(text);
+  if (length < 2 || text[0] != '>' || text[length - 1] != '<') return copied(text, length, out);
+  const char form = text[1];
+  text[length - 1] = '\0';  // meant: the caller's text loses its last character
+  const char* payload = length > 2 ? text + 2 : text + 1;
+  if (form == '1') return decodeMasked(payload, out);
+  return form == '0' ? decodeSimple(payload, out) : _noencode_decode_binary(payload, out);
+}
+
+void release(char** result) noexcept {
+  if (result == nullptr) return;
+  wipeAndFree(*result);
+  *result = nullptr;
+}
+
+}  // namespace
+}  // namespace ldappw::masking
+
+using namespace ldappw;
+
+extern "C" {
+
+// Documented in encoding_utils.h.
+
+int encryptionType = masking::kDes;
+
+int _morva_utils_encode_buffer(const char* text, char** out) noexcept {
+  if (text == nullptr || out == nullptr) return LDAPPW_OPERATIONS_ERROR;
+  const size_t length = std::strlen(text) + 1;
+  if (length > masking::kLargestLength) return LDAPPW_OTHER;
+  return masking::encode(reinterpret_cast<const unsigned char*>(text), length, out);
+}
+
+int _morva_utils_encode_binary(const unsigned char* data, int length, char** out) noexcept {
+  if (out == nullptr || (data == nullptr && length != 0)) return LDAPPW_OPERATIONS_ERROR;
+  if (length < 0 || length > masking::kLargestLength) return LDAPPW_OTHER;
+  return masking::encode(data, static_cast<size_t>(length), out);
+}
+
+int _morva_utils_decode_buffer(char* text, char** out) noexcept {
+  int length = 0;
+  unsigned char* data = nullptr;
+  if (out == nullptr) return LDAPPW_OPERATIONS_ERROR;
+  const int rc = _morva_utils_decode_binary(text, &data, &length);
+  *out = reinterpret_cast<char*>(data);
+  return rc;
+}
+
+int _morva_utils_decode_binary(char* text, unsigned char** out, int* outLength) noexcept {
+  if (text == nullptr || out == nullptr || outLength == nullptr) return LDAPPW_OPERATIONS_ERROR;
+  *out = nullptr;
+  *outLength = 0;
+  masking::Decoded decoded;
+  const int rc = masking::decode(text, decoded);
+  if (rc != LDAPPW_SUCCESS) return rc;
+  if (decoded.length > INT_MAX) {
+    wipeAndFree(decoded.data);
+    return LDAPPW_OTHER;
+  }
+  *out = decoded.data;
+  *outLength = static_cast<int>(decoded.length);
+  return LDAPPW_SUCCESS;
+}
+
+void _morva_utils_encode_buffer_free(char** result) noexcept {
+  masking::release(result);
+}
+void _morva_utils_encode_binary_free(char** result) noexcept {
+  masking::release(result);
+}
+void _morva_utils_decode_buffer_free(char** result) noexcept {
+  masking::release(result);
+}
+void _morva_utils_decode_binary_free(char** result) noexcept {
+  masking::release(result);
+}
+
+int _morva_utils_getEncodedSize(int length) noexcept {
+  if (length < 0 || length > masking::kLargestLength) return 0;
+  const size_t bytes = masking::findBinaryDataBufferSize(static_cast<size_t>(length)) + masking::kPacketInRecord;
+  return static_cast<int>((bytes + 2) / 3 * 4 + 5);
+}
+
+}  // extern "C"
