@@ -15,8 +15,8 @@
  *  6. Operations may be called from many threads at once unless stated otherwise. No exception leaves the library.
  *  7. Buffers of the library's own that held clear text, keys or key schedules are wiped before they are released; what
  *     was handed to the caller is the caller's to wipe.
- *  8. Exported variables are the library's own, never the host's of the same name. A source that includes these headers
- *     reaches them with GCC 12 or later and with clang (position-independent code).
+ *  8. Exported variables are the library's own, never the host's of the same name. Programs reach them through these
+ *     headers when they are compiled position-independent (-fPIE or -fPIC, the default of most systems).
  */
 #ifndef LDAPPW_ENCODING_UTILS_H
 #define LDAPPW_ENCODING_UTILS_H
@@ -24,14 +24,12 @@
 #include <stddef.h>
 #include <stdint.h>
 
-#if defined(__has_attribute)
-#if __has_attribute(nodirect_extern_access)
-/* Without this a program would get a copy of the variable of its own, and the library would never see its changes. */
-#define LDAPPW_DATA extern __attribute__((visibility("default"), nodirect_extern_access))
-#endif
-#endif
-#ifndef LDAPPW_DATA
+/* A program that refers to a variable directly gets a copy of its own, and the library would never see it change. A weak
+ * reference goes through the global offset table instead, in code compiled position-independent. */
+#ifdef LDAPPW_BUILDING
 #define LDAPPW_DATA extern __attribute__((visibility("default")))
+#else
+#define LDAPPW_DATA extern __attribute__((visibility("default"), weak))
 #endif
 #define LDAPPW_API __attribute__((visibility("default")))
 /* The exported name of an operation whose C name would meet another declaration of a system header. */

@@ -46,7 +46,8 @@ Text leading(const Text& text) noexcept {
 }
 
 int compareTexts(const Text& a, const Text& b) noexcept {
-  return a.length == b.length ? compareBytes(a.data, b.data, a.length) : kNotCompared;
+  if (a.length != b.length) return kNotCompared;
+  return equalBytes(a.data, b.data, a.length) ? 0 : compareBytes(a.data, b.data, a.length);
 }
 
 // The two salt characters of a {crypt} value, terminated whatever the value's length.
@@ -58,13 +59,27 @@ struct CryptSalt {
   char characters[3] = {};
 };
 
-// Formats a clear text in the scheme, and with the salt, of the value that it is compared with. 0 for failure.
-size_t formatLike(const Text& clear, int scheme, const Text& value, AesKeyData* keyData, char* work) noexcept {
-  CryptSalt salt(value);
-  char* saltText = scheme == FORMAT_CRYPT ? salt.characters : nullptr;
-  return static_cast<size_t>(format_password(scheme, saltText, keyData, clear.data, static_cast<int>(clear.length),
-                                             work, static_cast<int>(kWorkSize)));
-}
+// Room for a formatted value. format_password clears it, so it starts as it is, and only what was formatted is wiped.
+class WorkBuffer {
+ public:
+  WorkBuffer() = default;
+  ~WorkBuffer() { wipe(bytes_, length_); }
+  WorkBuffer(const WorkBuffer&) = delete;
+  WorkBuffer& operator=(const WorkBuffer&) = delete;
+
+  // Formats a clear text in the scheme, and with the salt, of the value that it is compared with.
+  Text formatLike(const Text& clear, int scheme, const Text& value, AesKeyData* keyData) noexcept {
+    CryptSalt salt(value);
+    char* saltText = scheme == FORMAT_CRYPT ? salt.characters : nullptr;
+    length_ = static_cast<size_t>(
+        format_password(scheme, saltText, keyData, clear.data, static_cast<int>(clear.length), bytes_, sizeof bytes_));
+    return {bytes_, length_};
+  }
+
+ private:
+  char bytes_[kWorkSize];
+  size_t length_ = 0;
+};
 
 int notComparable(const Comparison&) noexcept {
   return kNotCompared;
@@ -97,26 +112,25 @@ int verifySaltedUnexchanged(const Comparison& c) noexcept {
 }
 
 int compareFormattedStored(const Comparison& c) noexcept {
-  SecretArray<kWorkSize> work;
-  const size_t length = formatLike(c.stored, c.presentedScheme, c.presented, c.keyData, work.text());
-  return compareTexts({work.text(), length}, c.presented);
+  WorkBuffer work;
+  return compareTexts(work.formatLike(c.stored, c.presentedScheme, c.presented, c.keyData), c.presented);
 }
 
 // Tags compare without regard to case, payloads exactly. The tags differ when a missing key made another scheme of it.
 int compareFormattedPresented(const Comparison& c) noexcept {
-  SecretArray<kWorkSize> work;
-  const size_t length = formatLike(c.presented, c.storedScheme, c.stored, c.keyData, work.text());
-  if (length != c.stored.length) return kNotCompared;
+  WorkBuffer work;
+  const Text made = work.formatLike(c.presented, c.storedScheme, c.stored, c.keyData);
+  if (made.length != c.stored.length) return kNotCompared;
   const size_t tagBytes = findScheme(c.storedScheme)->tagBytes;
-  if (!beginsWith(work.text(), c.stored.data, tagBytes)) return kNotCompared;
-  return compareTexts(behind({work.text(), length}, tagBytes), behind(c.stored, tagBytes));
+  if (!beginsWith(made.data, c.stored.data, tagBytes)) return kNotCompared;
+  return compareTexts(behind(made, tagBytes), behind(c.stored, tagBytes));
 }
 
 // Two {SHA} values: one that carries a raw digest matches its base64 form.
 int compareDigests(const Comparison& c) noexcept {
-  SecretArray<kWorkSize> work;
-  const size_t length = formatLike(c.presented, FORMAT_SHA, c.presented, g_DirKeyData, work.text());
-  return length != 0 ? compareTexts({work.text(), length}, c.stored) : compareTexts(c.presented, c.stored);
+  WorkBuffer work;
+  const Text made = work.formatLike(c.presented, FORMAT_SHA, c.presented, g_DirKeyData);
+  return compareTexts(made.length != 0 ? made : c.presented, c.stored);
 }
 
 // The fixed number of characters that are taken of a masked value, terminated.

@@ -39,27 +39,25 @@ bool isStandard(const char* alphabet) noexcept {
   return std::strncmp(alphabet, kStandard, kSymbols + 1) == 0;
 }
 
-void getStringFourBytesFromBinary3(const unsigned char* in, char* out, size_t remaining,
-                                   const char* alphabet) noexcept {
+inline void encodeWholeGroup(const unsigned char* in, char* out, const char* alphabet) noexcept {
+  const unsigned bits = unsigned{in[0]} << 16U | unsigned{in[1]} << 8U | in[2];
+  out[0] = alphabet[bits >> 18U];
+  out[1] = alphabet[(bits >> 12U) & 63U];
+  out[2] = alphabet[(bits >> 6U) & 63U];
+  out[3] = alphabet[bits & 63U];
+}
+
+// The group of the last one or two bytes.
+void encodeShortGroup(const unsigned char* in, char* out, size_t remaining, const char* alphabet) noexcept {
+  const unsigned second = remaining == 2 ? in[1] : 0;
   out[0] = alphabet[in[0] >> 2U];
-  if (remaining == 1) {
-    out[1] = alphabet[(in[0] & 3U) << 4U];
-    out[2] = kPad;
-    out[3] = kPad;
-    return;
-  }
-  out[1] = alphabet[(in[0] & 3U) << 4U | in[1] >> 4U];
-  if (remaining == 2) {
-    out[2] = alphabet[(in[1] & 15U) << 2U];
-    out[3] = kPad;
-    return;
-  }
-  out[2] = alphabet[(in[1] & 15U) << 2U | in[2] >> 6U];
-  out[3] = alphabet[in[2] & 63U];
+  out[1] = alphabet[(in[0] & 3U) << 4U | second >> 4U];
+  out[2] = remaining == 2 ? alphabet[(second & 15U) << 2U] : kPad;
+  out[3] = kPad;
 }
 
 // Decodes one group and returns the number of bytes that it gives.
-unsigned getBinary3BytesFromString4(const char* in, unsigned char* out, const PlaceTable& table) noexcept {
+unsigned decodeGroup(const char* in, unsigned char* out, const PlaceTable& table) noexcept {
   static constexpr unsigned char kBytesByFirstPad[5] = {0, 1, 1, 2, 3};
   unsigned index[4];
   unsigned firstPad = 4;
@@ -101,7 +99,7 @@ size_t decodeGroups(const char* text, size_t length, unsigned char* out, const P
   for (at *= 4; at < length; at += 4, out += 3) {
     char group[4] = {};  // what a short last group lacks counts as the terminator
     std::memcpy(group, text + at, length - at < 4 ? length - at : 4);
-    bytes += getBinary3BytesFromString4(group, out, table);
+    bytes += decodeGroup(group, out, table);
   }
   return bytes;
 }
@@ -125,7 +123,12 @@ char* binaryBlobToString(const unsigned char* data, int length, const char* alph
   char* text = static_cast<char*>(std::malloc(bytes / 3 * 4 + 5));
   if (text == nullptr) return nullptr;
   char* out = text;
-  for (size_t i = 0; i < bytes; i += 3, out += 4) getStringFourBytesFromBinary3(data + i, out, bytes - i, alphabet);
+  size_t at = 0;
+  for (; at + 3 <= bytes; at += 3, out += 4) encodeWholeGroup(data + at, out, alphabet);
+  if (at < bytes) {
+    encodeShortGroup(data + at, out, bytes - at, alphabet);
+    out += 4;
+  }
   *out = '\0';
   return text;
 }

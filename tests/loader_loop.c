@@ -1,0 +1,32 @@
+/* SPDX-License-Identifier: Apache-2.0 */
+/* Opens and closes the library many times without linking it, before and after the provider's first use. */
+#include <dlfcn.h>
+#include <stdio.h>
+#include <string.h>
+
+typedef int (*Format)(int, char*, void*, const char*, int, char*, int);
+
+int main(int argc, char** argv) {
+  enum { kWithoutProvider = 2, kWithProvider = 9 }; /* {SHA} and {SSHA} */
+  for (int i = 0; argc == 2 && i < 40; ++i) {
+    void* library = dlopen(argv[1], RTLD_NOW | RTLD_LOCAL);
+    Format format = NULL;
+    char value[128];
+    if (library == NULL) {
+      fprintf(stderr, "%s\n", dlerror());
+      return 1;
+    }
+    void* symbol = dlsym(library, "format_password");
+    memcpy(&format, &symbol, sizeof symbol);
+    const int scheme = i % 2 == 0 ? kWithoutProvider : kWithProvider;
+    if (format == NULL || format(scheme, NULL, NULL, "abc", 3, value, sizeof value) == 0) {
+      fprintf(stderr, "round %d: nothing was formatted\n", i);
+      return 1;
+    }
+    if (dlclose(library) != 0 || dlopen(argv[1], RTLD_NOW | RTLD_NOLOAD) != NULL) {
+      fprintf(stderr, "round %d: the library stays\n", i);
+      return 1;
+    }
+  }
+  return argc == 2 ? 0 : 2;
+}

@@ -1,0 +1,69 @@
+// SPDX-License-Identifier: Apache-2.0
+// OpenSSL as the other opinion, and the handling of bytes around it.
+#pragma once
+
+#include <gtest/gtest.h>
+#include <openssl/evp.h>
+
+#include <memory>
+#include <random>
+#include <string>
+
+namespace test {
+
+inline const unsigned char* bytesOf(const std::string& text) {
+  return reinterpret_cast<const unsigned char*>(text.data());
+}
+inline unsigned char* bytesOf(std::string& text) {
+  return reinterpret_cast<unsigned char*>(text.data());
+}
+
+// Takes a text from the product and releases it.
+inline std::string taken(char* text) {
+  const std::string copy = text != nullptr ? text : "(null)";
+  std::free(text);
+  return copy;
+}
+
+inline std::string randomBytes(std::mt19937& random, size_t size) {
+  std::string bytes(size, '\0');
+  for (char& byte : bytes) byte = static_cast<char>(random());
+  return bytes;
+}
+
+struct CipherJob {
+  const char* name;
+  std::string key;
+  std::string iv;
+  bool encrypts;
+  bool padded;
+};
+
+inline std::string opensslCipher(const CipherJob& job, const std::string& data) {
+  const std::unique_ptr<EVP_CIPHER, void (*)(EVP_CIPHER*)> cipher(EVP_CIPHER_fetch(nullptr, job.name, nullptr),
+                                                                  EVP_CIPHER_free);
+  const std::unique_ptr<EVP_CIPHER_CTX, void (*)(EVP_CIPHER_CTX*)> context(EVP_CIPHER_CTX_new(), EVP_CIPHER_CTX_free);
+  std::string out(data.size() + EVP_MAX_BLOCK_LENGTH, '\0');
+  int written = 0;
+  int last = 0;
+  EVP_CipherInit_ex(context.get(), cipher.get(), nullptr, bytesOf(job.key), bytesOf(job.iv), job.encrypts ? 1 : 0);
+  EVP_CIPHER_CTX_set_padding(context.get(), job.padded ? 1 : 0);
+  EVP_CipherUpdate(context.get(), bytesOf(out), &written, bytesOf(data), static_cast<int>(data.size()));
+  EXPECT_EQ(EVP_CipherFinal_ex(context.get(), bytesOf(out) + written, &last), 1);
+  out.resize(static_cast<size_t>(written + last));
+  return out;
+}
+
+// Triple DES; with three equal keys it is single DES.
+inline std::string opensslDes(const std::string& key, const std::string& data, bool encrypts) {
+  return opensslCipher({"DES-EDE3-ECB", key.size() == 8 ? key + key + key : key, "", encrypts, false}, data);
+}
+
+inline std::string opensslBase64(const std::string& data) {
+  std::string text((data.size() + 2) / 3 * 4 + 1, '\0');
+  EVP_EncodeBlock(bytesOf(text), bytesOf(data), static_cast<int>(data.size()));
+  text.pop_back();
+  return text;
+}
+
+}  // namespace test

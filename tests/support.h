@@ -1,0 +1,177 @@
+// SPDX-License-Identifier: Apache-2.0
+// What the suites share: a recorder for the trace, failing allocations, guarded memory, replaced provider entries.
+#pragma once
+
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <mutex>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "aes_keys.h"
+#include "ldtr.h"
+
+namespace test {
+
+struct Record {
+  int kind;
+  int severity;
+  unsigned id, level, mask;
+  int rc;
+  std::string text;
+};
+
+// Records the trace while it lives.
+class TraceCapture {
+ public:
+  static constexpr unsigned kEverything = 0x4011000;
+  static constexpr unsigned kLinesOnly = LDTR_EVENT_DEBUG;
+
+  explicit TraceCapture(unsigned events = kEverything) : before_(trcEvents) {
+    ldtr_set_sink(&TraceCapture::record, this);
+    trcEvents = events;
+  }
+  ~TraceCapture() {
+    trcEvents = before_;
+    ldtr_set_sink(nullptr, nullptr);
+  }
+  std::vector<Record> records() const {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    return records_;
+  }
+  // The lines of the error shape, whatever their class, and any other line but those of entering and leaving.
+  std::vector<std::string> messages() const {
+    std::vector<std::string> result;
+    for (const Record& r : records()) {
+      const bool usual =
+          r.text.find(": Entering.") != std::string::npos || r.text.find(": Leaving.") != std::string::npos;
+      if (r.kind == LDTR_LINE && !usual) result.push_back(r.text);
+    }
+    return result;
+  }
+
+ private:
+  static void record(const ldtr_record* r, void* user) {
+    auto* self = static_cast<TraceCapture*>(user);
+    const std::lock_guard<std::mutex> lock(self->mutex_);
+    self->records_.push_back(
+        {r->kind, r->severity, r->id, r->level, r->mask, r->rc, r->text != nullptr ? r->text : ""});
+  }
+  unsigned before_;
+  mutable std::mutex mutex_;
+  std::vector<Record> records_;
+};
+
+// Counts the product's allocations on this thread and fails the one with the given number (from 0; -1 for none). Calls
+// of malloc, calloc and strdup in the product's objects are routed here by the linker.
+class AllocationWatch {
+ public:
+  explicit AllocationWatch(long failing = -1);
+  ~AllocationWatch();
+  long count() const;
+};
+
+// Looks into what the product releases on this thread, just before it goes: whether the secret still lies in it.
+class ReleaseWatch {
+ public:
+  explicit ReleaseWatch(std::string secret);
+  ~ReleaseWatch();
+  ReleaseWatch(const ReleaseWatch&) = delete;
+  ReleaseWatch& operator=(const ReleaseWatch&) = delete;
+  long releases() const;
+  long withSecret() const;
+
+ private:
+  std::string secret_;
+};
+
+// Bytes that end right before a page that cannot be touched.
+class Guarded {
+ public:
+  explicit Guarded(const std::string& bytes) : page_(static_cast<size_t>(sysconf(_SC_PAGESIZE))) {
+    size_ = (bytes.size() / page_ + 2) * page_;
+    base_ = static_cast<char*>(mmap(nullptr, size_, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0));
+    mprotect(base_ + size_ - page_, page_, PROT_NONE);
+    data_ = base_ + size_ - page_ - bytes.size();
+    std::memcpy(data_, bytes.data(), bytes.size());
+  }
+  ~Guarded() { munmap(base_, size_); }
+  Guarded(const Guarded&) = delete;
+  Guarded& operator=(const Guarded&) = delete;
+  char* data() { return data_; }
+
+ private:
+  size_t page_;
+  size_t size_;
+  char* base_;
+  char* data_;
+};
+
+// Puts another value in place while it lives, such as a failing provider entry.
+template <class T>
+class Replaced {
+ public:
+  Replaced(T& slot, T value) : slot_(slot), before_(std::exchange(slot, value)) {}
+  ~Replaced() { slot_ = before_; }
+  Replaced(const Replaced&) = delete;
+  Replaced& operator=(const Replaced&) = delete;
+
+ private:
+  T& slot_;
+  T before_;
+};
+template <class T, class V>
+Replaced(T&, V) -> Replaced<T>;
+
+// A folder of its own, removed with all that is in it.
+class TempFolder {
+ public:
+  TempFolder() {
+    std::string name = (std::filesystem::temp_directory_path() / "ldappw-test-XXXXXX").string();
+    path_ = mkdtemp(name.data());
+  }
+  ~TempFolder() { std::filesystem::remove_all(path_); }
+  std::string file(const std::string& name) const { return (path_ / name).string(); }
+
+ private:
+  std::filesystem::path path_;
+};
+
+inline std::string fromHex(const std::string& hex) {
+  std::string bytes;
+  for (size_t i = 0; i + 1 < hex.size(); i += 2) {
+    bytes.push_back(static_cast<char>(std::stoi(hex.substr(i, 2), nullptr, 16)));
+  }
+  return bytes;
+}
+
+inline std::string toHex(const void* data, size_t size) {
+  static const char digits[] = "0123456789abcdef";
+  std::string hex;
+  for (size_t i = 0; i < size; ++i) {
+    const unsigned byte = static_cast<const unsigned char*>(data)[i];
+    hex += {digits[byte >> 4U], digits[byte & 15U]};
+  }
+  return hex;
+}
+
+// A record whose keys are the bytes 0, 1, 2 ... and whose texts are fixed.
+inline AesKeyData* fixedRecord() {
+  AesKeyData* record = nullptr;
+  if (initAesKeyData(&record) != 0) return nullptr;
+  for (SecBuffer& key : record->aesKeys) {
+    for (uint32_t i = 0; i < key.length; ++i) key.data[i] = static_cast<unsigned char>(i);
+  }
+  std::memcpy(record->cryptoSalt.data, "saltsaltsalt", 13);
+  record->cryptoSync.data = reinterpret_cast<unsigned char*>(strdup("c3luYw=="));
+  record->cryptoSync.length = 8;
+  setCipherNameGlobal();
+  return record;
+}
+
+}  // namespace test
