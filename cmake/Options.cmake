@@ -17,7 +17,9 @@ set(CMAKE_CXX_FLAGS_RELEASE "-O2 -DNDEBUG")
 set(CMAKE_C_FLAGS_RELEASE "-O2 -DNDEBUG")
 
 add_library(ldappw_options INTERFACE)
-target_compile_options(ldappw_options INTERFACE -Wall -Wextra -Wpedantic -Wconversion -Wshadow -Werror)
+# Files and times of any size on 32-bit targets too.
+target_compile_definitions(ldappw_options INTERFACE _FILE_OFFSET_BITS=64 _TIME_BITS=64)
+target_compile_options(ldappw_options INTERFACE -fno-plt -Wall -Wextra -Wpedantic -Wconversion -Wshadow -Werror)
 if(LDAPPW_SANITIZE)
   target_compile_options(ldappw_options INTERFACE -fsanitize=${LDAPPW_SANITIZE} -fno-sanitize-recover=all
                                                   -fno-omit-frame-pointer)

@@ -4,6 +4,7 @@
 #include <cstring>
 
 #include "aes_keys.h"
+#include "base64.h"
 #include "qel_utils.h"
 #include "trace_scope.h"
 
@@ -15,21 +16,34 @@ constexpr TraceInfo kDecrypt{"aesDecryptBuffer", operationScope(moduleId(kAesCry
 
 constexpr int kPaddingOn = 1;
 
-// The vector that the cipher asks for: as much of the source as fits, then zeros. Null when memory runs out.
-SecretOwner<unsigned char> vectorFor(void* qelCtx, const CipherContext& cipher, const SecBuffer& source) noexcept {
-  const int asked = pQEL_EVP_CIPHER_iv_length(qelCtx, cipher.algorithm());
-  const size_t bytes = asked > 0 ? static_cast<size_t>(asked) : 0;
-  SecretOwner<unsigned char> vector(callocBytes<unsigned char>(bytes));
-  const size_t given = source.data == nullptr ? 0 : source.length;
-  const size_t taken = given < bytes ? given : bytes;
-  if (vector && taken != 0) std::memcpy(vector.get(), source.data, taken);
-  return vector;
-}
+// The vector that the cipher asks for: as much of the source as fits, then zeros.
+class InitVector {
+ public:
+  InitVector(void* qelCtx, const CipherContext& cipher, const SecBuffer& source) noexcept
+      : size_(pQEL_EVP_CIPHER_iv_length(qelCtx, cipher.algorithm())), bytes_(size()) {
+    const size_t given = source.data == nullptr ? 0 : source.length;
+    const size_t taken = given < size() ? given : size();
+    if (!bytes_ || size() == 0) return;
+    std::memset(bytes_.get(), 0, size());
+    if (taken != 0) std::memcpy(bytes_.get(), source.data, taken);
+  }
+  explicit operator bool() const noexcept { return static_cast<bool>(bytes_); }
+  const unsigned char* get() noexcept { return bytes_.get(); }
 
-// Room for n bytes through the cipher, one more block and a NUL; null also when that is more than can be had.
-char* workBuffer(void* qelCtx, const CipherContext& cipher, size_t n) noexcept {
+ private:
+  static constexpr size_t kUsual = 16;
+  size_t size() const noexcept { return size_ > 0 ? static_cast<size_t>(size_) : 0; }
+  int size_;
+  SecretBytes<kUsual> bytes_;
+};
+
+// Passwords of usual length need no allocation for their raw form.
+constexpr size_t kUsualRaw = 256;
+
+// The size for n bytes through the cipher: one more block, and a NUL.
+size_t workSize(void* qelCtx, const CipherContext& cipher, size_t n) noexcept {
   const int block = pQEL_EVP_CIPHER_block_size(qelCtx, cipher.algorithm());
-  return block < 0 ? nullptr : callocBytes<char>(static_cast<size_t>(block) + n + 1);
+  return (block > 0 ? static_cast<size_t>(block) : 0) + n + 1;
 }
 
 int encipher(TracedCall& call, void* qelCtx, const CipherContext& cipher, const char* clear, int clearLength,
@@ -66,11 +80,6 @@ int decipher(TracedCall& call, void* qelCtx, const CipherContext& cipher, const 
   return LDAPPW_SUCCESS;
 }
 
-bool isBase64Text(const char* text) noexcept {
-  const size_t symbols = std::strspn(text, pBase64Find);
-  return text[symbols] == '\0';
-}
-
 }  // namespace
 }  // namespace ldappw
 
@@ -82,7 +91,7 @@ extern "C" {
 
 int aesEncryptBuffer(const char* clear, char** out, const char* cipherName, const SecBuffer* key, const SecBuffer* iv,
                      int clearLength) noexcept {
-  TracedCall call{kEncrypt, {{"clear", clear}, {"out", out}, {"cipherName", cipherName}, {"key", key}, {"iv", iv}}};
+  TracedCall call{kEncrypt, "clear", clear, "out", out, "cipherName", cipherName, "key", key, "iv", iv};
   if (clear == nullptr || out == nullptr || cipherName == nullptr || key == nullptr || iv == nullptr ||
       clearLength < 0) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
@@ -93,12 +102,11 @@ int aesEncryptBuffer(const char* clear, char** out, const char* cipherName, cons
   CipherContext cipher(qelCtx);
   if (const int rc = cipher.init(cipherName); rc != 0) return call.fail(rc, "initQelCipher() failed.");
 
-  const SecretOwner<unsigned char> vector = vectorFor(qelCtx, cipher, *iv);
+  InitVector vector(qelCtx, cipher, *iv);
   if (!vector)
     return call.failText(LDAPPW_NO_MEMORY, "Error - aesEncryptBuffer: calloc() failed.\n");  // no code: meant
-  *out = workBuffer(qelCtx, cipher, static_cast<size_t>(clearLength));
-  if (*out == nullptr) return call.fail(LDAPPW_NO_MEMORY, "calloc() returned NULL.");
-  auto* raw = reinterpret_cast<unsigned char*>(*out);
+  SecretBytes<kUsualRaw> raw(workSize(qelCtx, cipher, static_cast<size_t>(clearLength)));
+  if (!raw) return call.fail(LDAPPW_NO_MEMORY, "calloc() returned NULL.");
   if (pQEL_EVP_EncryptInit(qelCtx, cipher.get(), cipher.algorithm(), key->data, vector.get()) != 1) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "QEL_EVP_EncryptInit() failed.");
   }
@@ -106,8 +114,8 @@ int aesEncryptBuffer(const char* clear, char** out, const char* cipherName, cons
     return call.fail(LDAPPW_OPERATIONS_ERROR, "QEL_EVP_CIPHER_CTX_set_padding() failed.");
   }
   int rawLength = 0;
-  if (const int rc = encipher(call, qelCtx, cipher, clear, clearLength, raw, rawLength); rc != 0) return rc;
-  char* text = binaryBlobToBase64(raw, rawLength);
+  if (const int rc = encipher(call, qelCtx, cipher, clear, clearLength, raw.get(), rawLength); rc != 0) return rc;
+  char* text = binaryBlobToBase64(raw.get(), rawLength);
   if (text == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "binaryBlobToBase64() returned NULL.");
   result.keep(text);
   return call.leave(LDAPPW_SUCCESS);
@@ -115,25 +123,27 @@ int aesEncryptBuffer(const char* clear, char** out, const char* cipherName, cons
 
 int aesDecryptBuffer(const char* text, char** out, const char* cipherName, const SecBuffer* key, const SecBuffer* iv,
                      int* clearLength) noexcept {
-  TracedCall call{kDecrypt, {{"text", text}, {"out", out}, {"cipherName", cipherName}, {"key", key}, {"iv", iv}}};
+  TracedCall call{kDecrypt, "text", text, "out", out, "cipherName", cipherName, "key", key, "iv", iv};
   if (text == nullptr || out == nullptr || cipherName == nullptr || key == nullptr || iv == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }
-  unsigned rawLength = 0;
-  const PlainOwner<unsigned char> raw(isBase64Text(text) ? base64ToBinaryBlob(text, &rawLength) : nullptr);
-  if (!raw || rawLength > INT_MAX) {
+  const size_t textLength = std::strlen(text);
+  PlainBytes<decodedRoom(kUsualRaw)> raw(decodedRoom(textLength));
+  const DecodedText decoded = raw ? decodeText(text, textLength, pBase64, raw.get()) : DecodedText{0, false};
+  if (!decoded.isClean || textLength > INT_MAX) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "base64ToBinaryBlob() returned NULL.");
   }
+  const size_t rawLength = decoded.bytes;
+  OutGuard result{out};
   void* qelCtx = nullptr;
   if (const int rc = initQelCrypto(&qelCtx); rc != 0) return call.fail(rc, "initQelCrypto() failed.");
-  OutGuard result{out};
   CipherContext cipher(qelCtx);
   if (const int rc = cipher.init(cipherName); rc != 0) return call.fail(rc, "initQelCipher() failed.");
 
-  const SecretOwner<unsigned char> vector = vectorFor(qelCtx, cipher, *iv);
+  InitVector vector(qelCtx, cipher, *iv);
   if (!vector)
     return call.failText(LDAPPW_NO_MEMORY, "Error - aesDecryptBuffer: calloc() failed.\n");  // no code: meant
-  *out = workBuffer(qelCtx, cipher, rawLength);
+  *out = zeroedBytes<char>(workSize(qelCtx, cipher, rawLength));
   if (*out == nullptr) return call.fail(LDAPPW_NO_MEMORY, "QEL_EVP_DecryptInit() failed.");  // the wording: meant
   if (pQEL_EVP_DecryptInit(qelCtx, cipher.get(), cipher.algorithm(), key->data, vector.get()) != 1) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "QEL_EVP_DecryptInit() failed.");

@@ -98,7 +98,7 @@ int readSync(TracedCall& call, StashFile& file, SecBuffer& sync) noexcept {
   }
   wipeAndFree(sync.data);
   sync.length = length;
-  sync.data = length == UINT32_MAX ? nullptr : callocBytes<unsigned char>(size_t{length} + 1);
+  sync.data = length == UINT32_MAX ? nullptr : zeroedBytes<unsigned char>(size_t{length} + 1);
   if (sync.data == nullptr) {  // under another name: meant
     return call.failText(LDAPPW_NO_MEMORY, "Error - genKeySyncVal: calloc(cryptoSync) returned NULL. rc = %d\n",
                          static_cast<int>(LDAPPW_NO_MEMORY));
@@ -117,7 +117,7 @@ struct Generator {
 };
 
 int copySync(TracedCall& call, const SecBuffer& sync, char** out) noexcept {
-  *out = callocBytes<char>(size_t{sync.length} + 1);
+  *out = zeroedBytes<char>(size_t{sync.length} + 1);
   if (*out == nullptr) return call.fail(LDAPPW_NO_MEMORY, "calloc(cryptoSyncStr) returned NULL.");
   std::memcpy(*out, sync.data, sync.length);
   return LDAPPW_SUCCESS;
@@ -149,7 +149,7 @@ int createDirFile(TracedCall& call, const Generator& generator, const char* path
 }  // namespace
 
 int writeKeyStashFile(const char* keyStashFile, const AesKeyData* keyData) noexcept {
-  TracedCall call{kWrite, {{"keyStashFile", keyStashFile}, {"keyData", keyData}}};
+  TracedCall call{kWrite, "keyStashFile", keyStashFile, "keyData", keyData};
   if (keyStashFile == nullptr || keyData == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   StashFile file = StashFile::forWriting(keyStashFile);
   if (!file) return call.fail(LDAPPW_OPERATIONS_ERROR, "fopen() failed.");
@@ -174,7 +174,7 @@ extern "C" {
 // Documented in aes_keys.h.
 
 int readKeyStashFile(const char* keyStashFile, AesKeyData* keyData) noexcept {
-  TracedCall call{kRead, {{"keyStashFile", keyStashFile}, {"keyData", keyData}}};
+  TracedCall call{kRead, "keyStashFile", keyStashFile, "keyData", keyData};
   if (keyStashFile == nullptr || keyData == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   StashFile file = StashFile::forReading(keyStashFile);
   if (!file) return call.fail(LDAPPW_OPERATIONS_ERROR, "fopen() failed.");
@@ -190,12 +190,9 @@ int readKeyStashFile(const char* keyStashFile, AesKeyData* keyData) noexcept {
 
 int createKeyStashFiles(const char* cfgKeyStashFile, const char* dirKeyStashFile, const char* dirCryptoSeed,
                         char** cryptoSyncStr, const char* dirCryptoSalt) noexcept {
-  TracedCall call{kCreate,
-                  {{"cfgKeyStashFile", cfgKeyStashFile},
-                   {"dirKeyStashFile", dirKeyStashFile},
-                   {"dirCryptoSeed", dirCryptoSeed},
-                   {"cryptoSyncStr", cryptoSyncStr},
-                   {"dirCryptoSalt", dirCryptoSalt}}};
+  TracedCall call{kCreate,         "cfgKeyStashFile", cfgKeyStashFile, "dirKeyStashFile",
+                  dirKeyStashFile, "dirCryptoSeed",   dirCryptoSeed,   "cryptoSyncStr",
+                  cryptoSyncStr,   "dirCryptoSalt",   dirCryptoSalt};
   if (cfgKeyStashFile == nullptr || dirKeyStashFile == nullptr || dirCryptoSeed == nullptr ||
       cryptoSyncStr == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
@@ -220,7 +217,7 @@ int createKeyStashFiles(const char* cfgKeyStashFile, const char* dirKeyStashFile
 }
 
 int restoreKeyStashFile(const char* keyStashFile, const char* cryptoSeed, const char* cryptoSalt) noexcept {
-  TracedCall call{kRestore, {{"keyStashFile", keyStashFile}, {"cryptoSeed", cryptoSeed}, {"cryptoSalt", cryptoSalt}}};
+  TracedCall call{kRestore, "keyStashFile", keyStashFile, "cryptoSeed", cryptoSeed, "cryptoSalt", cryptoSalt};
   if (keyStashFile == nullptr || cryptoSeed == nullptr || cryptoSalt == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }
@@ -246,7 +243,7 @@ int restoreKeyStashFile(const char* keyStashFile, const char* cryptoSeed, const 
 }
 
 int validateCryptoString(const char* cryptoString, int type) noexcept {
-  TracedCall call{kValidate, {{"cryptoString", cryptoString}}};
+  TracedCall call{kValidate, "cryptoString", cryptoString};
   if (cryptoString == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   if (type != kSeedType && type != kSaltType) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid crypto string type.");

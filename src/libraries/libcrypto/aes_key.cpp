@@ -46,7 +46,8 @@ using WorkBuffer = SecretArray<kLargestDigest>;
 // failures alone.
 int morva_pkcs5_initial_prf(const Prf& prf, const Bytes& input, uint32_t blockIndex, unsigned char* outBuff,
                             unsigned* outLen) noexcept {
-  TracedCall call{kInitialPrf, {{"buffer", input.data}, {"outBuff", outBuff}, {"outLen", outLen}}};
+  TracedCall call{kInitialPrf, "qelCtx",   prf.qelCtx, "digestCtx", prf.digestCtx, "digest", prf.digest,
+                  "buffer",    input.data, "outBuff",  outBuff,     "outLen",      outLen};
   if (!prf.complete() || input.data == nullptr || outBuff == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }
@@ -81,13 +82,14 @@ void addBlock(unsigned char* to, const unsigned char* block) noexcept {
 
 int morva_pkcs5_F(const Prf& prf, const Bytes& seed, const Bytes& salt, uint32_t iterations, uint32_t blockIndex,
                   unsigned char* outBuff) noexcept {
-  TracedCall call{kBlock, {{"seed", seed.data}, {"salt", salt.data}, {"outBuff", outBuff}}};
+  TracedCall call{kBlock, "qelCtx",  prf.qelCtx, "digestCtx", prf.digestCtx, "digest", prf.digest,
+                  "seed", seed.data, "salt",     salt.data,   "outBuff",     outBuff};
   if (!prf.complete() || seed.data == nullptr || salt.data == nullptr || outBuff == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }
   const uint64_t inputBytes = uint64_t{salt.length} + seed.length;
-  const SecretOwner<unsigned char> input(inputBytes >= UINT32_MAX ? nullptr
-                                                                  : callocBytes<unsigned char>(inputBytes + 1));
+  SecretOwner<unsigned char> input;
+  if (inputBytes < UINT32_MAX) input.reset(zeroedBytes<unsigned char>(static_cast<size_t>(inputBytes) + 1));
   if (!input) return call.fail(LDAPPW_NO_MEMORY, "calloc() failed.");
   std::memcpy(input.get(), salt.data, salt.length);
   std::memcpy(input.get() + salt.length, seed.data, seed.length);
@@ -134,13 +136,8 @@ extern "C" {
 int morva_pbkdf2(void* qelCtx, void* digestCtx, void* digest, const unsigned char* seed, uint32_t seedLen,
                  const unsigned char* salt, uint64_t saltLen, uint32_t iterations, unsigned char* derivedKey,
                  uint64_t derivedKeyLen) noexcept {
-  TracedCall call{kPbkdf2,
-                  {{"qelCtx", qelCtx},
-                   {"digestCtx", digestCtx},
-                   {"digest", digest},
-                   {"seed", seed},
-                   {"salt", salt},
-                   {"derivedKey", derivedKey}}};
+  TracedCall call{kPbkdf2, "qelCtx", qelCtx, "digestCtx", digestCtx,    "digest",  digest,
+                  "seed",  seed,     "salt", salt,        "derivedKey", derivedKey};
   const Prf prf{qelCtx, digestCtx, digest};
   if (!prf.complete() || seed == nullptr || salt == nullptr || derivedKey == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
@@ -169,12 +166,8 @@ int morva_pbkdf2(void* qelCtx, void* digestCtx, void* digest, const unsigned cha
 
 int growKeysFromSeed(void* qelCtx, void* digestCtx, void* digest, const char* cryptoSeed,
                      AesKeyData* keyData) noexcept {
-  TracedCall call{kGrowKeys,
-                  {{"qelCtx", qelCtx},
-                   {"digestCtx", digestCtx},
-                   {"digest", digest},
-                   {"cryptoSeed", cryptoSeed},
-                   {"keyData", keyData}}};
+  TracedCall call{kGrowKeys, "qelCtx",     qelCtx,     "digestCtx", digestCtx, "digest",
+                  digest,    "cryptoSeed", cryptoSeed, "keyData",   keyData};
   if (qelCtx == nullptr || digestCtx == nullptr || digest == nullptr || cryptoSeed == nullptr || keyData == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }
@@ -190,20 +183,15 @@ int growKeysFromSeed(void* qelCtx, void* digestCtx, void* digest, const char* cr
 
 int genKeyDataVal(void* qelCtx, void* digestCtx, void* digest, const char* userCryptoSeed, const char* userCryptoSalt,
                   AesKeyData** keyData) noexcept {
-  TracedCall call{kKeyDataVal,
-                  {{"qelCtx", qelCtx},
-                   {"digestCtx", digestCtx},
-                   {"digest", digest},
-                   {"userCryptoSeed", userCryptoSeed},
-                   {"userCryptoSalt", userCryptoSalt},
-                   {"keyData", keyData}}};
+  TracedCall call{kKeyDataVal,      "qelCtx",       qelCtx,           "digestCtx",    digestCtx, "digest", digest,
+                  "userCryptoSeed", userCryptoSeed, "userCryptoSalt", userCryptoSalt, "keyData", keyData};
   if (qelCtx == nullptr || digestCtx == nullptr || digest == nullptr || keyData == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }
   RecordGuard record(keyData);
   SecretOwner<char> randomSeed;
   if (userCryptoSeed == nullptr) {
-    randomSeed.reset(callocBytes<char>(kRandomSeedSize));
+    randomSeed.reset(zeroedBytes<char>(kRandomSeedSize));
     if (!randomSeed) return call.fail(LDAPPW_NO_MEMORY, "calloc() returned NULL.");
     auto* buffer = reinterpret_cast<unsigned char*>(randomSeed.get());
     if (const int rc = morva_rand_ascii(qelCtx, buffer, kRandomSeedSize); rc != 0) {
@@ -224,8 +212,8 @@ int genKeyDataVal(void* qelCtx, void* digestCtx, void* digest, const char* userC
 }
 
 int genTmpKeyDataVal(const char* userCryptoSeed, const char* userCryptoSalt, AesKeyData** keyData) noexcept {
-  TracedCall call{kTmpKeyDataVal,
-                  {{"userCryptoSeed", userCryptoSeed}, {"userCryptoSalt", userCryptoSalt}, {"keyData", keyData}}};
+  TracedCall call{kTmpKeyDataVal, "userCryptoSeed", userCryptoSeed, "userCryptoSalt",
+                  userCryptoSalt, "keyData",        keyData};
   if (userCryptoSeed == nullptr || userCryptoSalt == nullptr || keyData == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }

@@ -161,7 +161,7 @@ LDAPPW_API int aesEncryptBuffer(const char* clear, char** out, const char* ciphe
  * aesDecryptBuffer undoes it. *out receives new bytes followed by a NUL, *clearLength (may be null) their number. A
  * text with a character outside base64 is refused with 1 before the provider is asked; a wrong key or a damaged text
  * gives 1 when the padding does not check, which one wrong key in some 250 passes. Codes as above; *out is untouched
- * when the arguments or the text are refused or initQelCrypto fails.
+ * when the arguments or the text are refused.
  */
 LDAPPW_API int aesDecryptBuffer(const char* text, char** out, const char* cipherName, const SecBuffer* key,
                                 const SecBuffer* iv, int* clearLength) LDAPPW_NOEXCEPT;

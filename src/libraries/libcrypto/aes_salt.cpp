@@ -61,7 +61,7 @@ int morva_rand_ascii(void* qelCtx, unsigned char* buffer, unsigned int size) noe
 }
 
 int genKeySaltVal(void* qelCtx, AesKeyData* keyData) noexcept {
-  TracedCall call{kSaltVal, {{"qelCtx", qelCtx}, {"keyData", keyData}}};
+  TracedCall call{kSaltVal, "qelCtx", qelCtx, "keyData", keyData};
   if (qelCtx == nullptr || keyData == nullptr || keyData->cryptoSalt.data == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }

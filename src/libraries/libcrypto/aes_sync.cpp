@@ -22,19 +22,15 @@ extern "C" {
 // Documented in aes_keys.h.
 
 int genKeySyncVal(void* qelCtx, void* digestCtx, void* digest, const char* cryptoSeed, AesKeyData* keyData) noexcept {
-  TracedCall call{kSyncVal,
-                  {{"qelCtx", qelCtx},
-                   {"digestCtx", digestCtx},
-                   {"digest", digest},
-                   {"cryptoSeed", cryptoSeed},
-                   {"keyData", keyData}}};
+  TracedCall call{kSyncVal, "qelCtx",     qelCtx,     "digestCtx", digestCtx, "digest",
+                  digest,   "cryptoSeed", cryptoSeed, "keyData",   keyData};
   if (qelCtx == nullptr || digestCtx == nullptr || digest == nullptr || cryptoSeed == nullptr || keyData == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }
   SecBuffer& sync = keyData->cryptoSync;
   wipeAndFree(sync.data);
   sync.length = static_cast<uint32_t>(std::strlen(cryptoSeed));
-  sync.data = callocBytes<unsigned char>(size_t{sync.length} + 1);
+  sync.data = zeroedBytes<unsigned char>(size_t{sync.length} + 1);
   if (sync.data == nullptr) return call.fail(LDAPPW_NO_MEMORY, "calloc(cryptoSync) returned NULL.");
   const int rc =
       morva_pbkdf2(qelCtx, digestCtx, digest, reinterpret_cast<const unsigned char*>(cryptoSeed), sync.length,

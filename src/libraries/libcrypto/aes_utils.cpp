@@ -42,7 +42,7 @@ void release(SecBuffer& buffer) noexcept {
 }
 
 bool allocate(SecBuffer& buffer, size_t bytes) noexcept {
-  buffer.data = callocBytes<unsigned char>(bytes);
+  buffer.data = zeroedBytes<unsigned char>(bytes);
   return buffer.data != nullptr;
 }
 
@@ -83,7 +83,7 @@ int loadRecord(const char* keyStashFile, AesKeyData** keyData) noexcept {
 }
 
 int setGlobal(const TraceInfo& info, const char* keyStashFile, AesKeyData*& global) noexcept {
-  TracedCall call{info, {{"keyStashFile", keyStashFile}}};
+  TracedCall call{info, "keyStashFile", keyStashFile};
   if (global != nullptr) return call.leave(LDAPPW_SUCCESS);
   AesKeyData* keyData = nullptr;
   const int rc = loadRecord(keyStashFile, &keyData);
@@ -124,7 +124,7 @@ AesKeyData* getDirKeyDataGlobal(void) noexcept {
 }
 
 int setCfgCryptoSyncGlobal(const char* cryptoSync) noexcept {
-  TracedCall call{kSetCfgSync, {{"cryptoSync", cryptoSync}}};
+  TracedCall call{kSetCfgSync, "cryptoSync", cryptoSync};
   if (cryptoSync == nullptr) return call.leave(LDAPPW_OPERATIONS_ERROR);
   if (g_CfgCryptoSync == nullptr) g_CfgCryptoSync = strdup(cryptoSync);
   return call.leave(g_CfgCryptoSync != nullptr ? LDAPPW_SUCCESS : LDAPPW_NO_MEMORY);
@@ -141,9 +141,9 @@ int setCipherNameGlobal(void) noexcept {
 }
 
 int initAesKeyData(AesKeyData** keyData) noexcept {
-  TracedCall call{kInit, {{"keyData", keyData}}};
+  TracedCall call{kInit, "keyData", keyData};
   if (keyData == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
-  *keyData = callocBytes<AesKeyData>(sizeof(AesKeyData));
+  *keyData = zeroedBytes<AesKeyData>(sizeof(AesKeyData));
   RecordGuard record(keyData);
   if (*keyData == nullptr) return call.fail(LDAPPW_NO_MEMORY, "calloc(keyData) returned NULL.");
   AesKeyData& data = **keyData;
@@ -162,11 +162,11 @@ int initAesKeyData(AesKeyData** keyData) noexcept {
 }
 
 int copyAesKeyData(const AesKeyData* keyDataOrig, AesKeyData** keyDataCopy) noexcept {
-  TracedCall call{kCopy, {{"keyDataOrig", keyDataOrig}, {"keyDataCopy", keyDataCopy}}};
+  TracedCall call{kCopy, "keyDataOrig", keyDataOrig, "keyDataCopy", keyDataCopy};
   if (keyDataOrig == nullptr || keyDataCopy == nullptr || !isComplete(*keyDataOrig)) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }
-  *keyDataCopy = callocBytes<AesKeyData>(sizeof(AesKeyData));
+  *keyDataCopy = zeroedBytes<AesKeyData>(sizeof(AesKeyData));
   RecordGuard record(keyDataCopy);
   if (*keyDataCopy == nullptr) return call.fail(LDAPPW_NO_MEMORY, "calloc(keyDataCopy) returned NULL.");
   AesKeyData& copy = **keyDataCopy;
@@ -184,7 +184,7 @@ int copyAesKeyData(const AesKeyData* keyDataOrig, AesKeyData** keyDataCopy) noex
 }
 
 int freeAesKeyData(AesKeyData* keyData) noexcept {
-  TracedCall call{kFree, {{"keyData", keyData}}};
+  TracedCall call{kFree, "keyData", keyData};
   if (keyData != nullptr) {
     for (SecBuffer& key : keyData->aesKeys) release(key);
     release(keyData->cryptoSync);
@@ -195,15 +195,14 @@ int freeAesKeyData(AesKeyData* keyData) noexcept {
 }
 
 int setAESKeyData(const char* keyStashFile, AesKeyData** keyData) noexcept {
-  TracedCall call{kSet, {{"keyStashFile", keyStashFile}, {"keyData", keyData}}};
+  TracedCall call{kSet, "keyStashFile", keyStashFile, "keyData", keyData};
   if (keyData == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   return call.leave(loadRecord(keyStashFile, keyData));
 }
 
 int checkKeyStashFile(int type, const AesKeyData* keyData, const char* cryptoSync, const char* cryptoSalt,
                       int* isMatch) noexcept {
-  TracedCall call{kCheck,
-                  {{"keyData", keyData}, {"cryptoSync", cryptoSync}, {"cryptoSalt", cryptoSalt}, {"isMatch", isMatch}}};
+  TracedCall call{kCheck, "keyData", keyData, "cryptoSync", cryptoSync, "cryptoSalt", cryptoSalt, "isMatch", isMatch};
   if (keyData == nullptr || cryptoSync == nullptr || cryptoSalt == nullptr || isMatch == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }

@@ -124,7 +124,7 @@ void des3key(uint32_t* schedules, const unsigned char* key, int decrypt) noexcep
 char* simpleCrypt(const char* data, int length) noexcept {
   if (length < 0) length = 0;
   if (length == INT_MAX || (data == nullptr && length > 0)) return nullptr;
-  char* result = callocBytes<char>(static_cast<size_t>(length) + 1);
+  char* result = zeroedBytes<char>(static_cast<size_t>(length) + 1);
   if (result == nullptr || length == 0) return result;
   std::memcpy(result, data, static_cast<size_t>(length));
   simpleCryptInPlace(reinterpret_cast<unsigned char*>(result), static_cast<size_t>(length));

@@ -24,8 +24,8 @@
 #include <stddef.h>
 #include <stdint.h>
 
-/* A program that refers to a variable directly gets a copy of its own, and the library would never see it change. A weak
- * reference goes through the global offset table instead, in code compiled position-independent. */
+/* A program that refers to a variable directly gets a copy of its own, and the library would never see it change. A
+ * weak reference goes through the global offset table instead, in code compiled position-independent. */
 #ifdef LDAPPW_BUILDING
 #define LDAPPW_DATA extern __attribute__((visibility("default")))
 #else

@@ -36,9 +36,14 @@ using PlainOwner = std::unique_ptr<T, Free>;
 template <class T>
 using SecretOwner = std::unique_ptr<T, WipeAndFree>;
 
+// Zeroed memory; null when it has run out. For small sizes malloc and a fill: glibc's calloc passes by the cache of the
+// thread.
 template <class T>
-T* callocBytes(size_t bytes) noexcept {
-  return static_cast<T*>(std::calloc(bytes == 0 ? 1 : bytes, 1));
+T* zeroedBytes(size_t bytes) noexcept {
+  constexpr size_t kSmall = 1024;
+  if (bytes > kSmall) return static_cast<T*>(std::calloc(bytes, 1));
+  void* data = std::malloc(bytes == 0 ? 1 : bytes);
+  return static_cast<T*>(data == nullptr ? nullptr : std::memset(data, 0, bytes));
 }
 
 // A zeroed array on the stack, wiped when it goes.
@@ -58,32 +63,52 @@ class SecretArray {
   unsigned char bytes_[kBytes];
 };
 
-// A terminated copy of counted text, wiped when it goes. Passwords are short: up to kInline bytes need no allocation.
-class SecretText {
+// A buffer whose size is known when it is made; up to kInline bytes need no allocation. Secrets are wiped when it goes.
+template <size_t kInline, bool kSecret>
+class Buffer {
  public:
-  SecretText(const char* text, size_t length) noexcept : length_(length) {
-    if (length_ >= kInline) heap_.reset(static_cast<char*>(std::malloc(length_ + 1)));
-    if (char* to = get(); to != nullptr) {
-      if (length_ != 0) std::memcpy(to, text, length_);
-      to[length_] = '\0';
-    }
+  explicit Buffer(size_t bytes) noexcept : bytes_(bytes) {
+    if (bytes_ > kInline) heap_.reset(static_cast<unsigned char*>(std::malloc(bytes_)));
   }
-  ~SecretText() {
-    if (!heap_ && length_ < kInline) wipe(inline_, length_);
+  ~Buffer() {
+    if (kSecret && *this) wipe(get(), bytes_);
   }
-  SecretText(const SecretText&) = delete;
-  SecretText& operator=(const SecretText&) = delete;
+  Buffer(const Buffer&) = delete;
+  Buffer& operator=(const Buffer&) = delete;
 
-  explicit operator bool() const noexcept { return length_ < kInline || heap_ != nullptr; }
-  char* get() noexcept { return length_ < kInline ? inline_ : heap_.get(); }
-  size_t length() const noexcept { return length_; }
+  explicit operator bool() const noexcept { return bytes_ <= kInline || heap_ != nullptr; }
+  unsigned char* get() noexcept { return bytes_ <= kInline ? inline_ : heap_.get(); }
+  char* text() noexcept { return reinterpret_cast<char*>(get()); }
 
  private:
-  static constexpr size_t kInline = 256;
-  size_t length_;
-  SecretOwner<char> heap_;
-  char inline_[kInline];
+  size_t bytes_;
+  PlainOwner<unsigned char> heap_;
+  unsigned char inline_[kInline];
 };
+
+template <size_t kInline>
+using SecretBytes = Buffer<kInline, true>;
+template <size_t kInline>
+using PlainBytes = Buffer<kInline, false>;
+
+// A terminated copy of counted text.
+template <bool kSecret>
+class TerminatedCopy {
+ public:
+  TerminatedCopy(const char* text, size_t length) noexcept : buffer_(length + 1) {
+    if (!buffer_) return;
+    if (length != 0) std::memcpy(buffer_.get(), text, length);
+    buffer_.get()[length] = '\0';
+  }
+  explicit operator bool() const noexcept { return static_cast<bool>(buffer_); }
+  char* get() noexcept { return buffer_.text(); }
+
+ private:
+  Buffer<256, kSecret> buffer_;  // passwords and their values are shorter
+};
+
+using SecretText = TerminatedCopy<true>;
+using PlainText = TerminatedCopy<false>;
 
 // Guards an out-argument from the point after which a failure must clear it: on every way out but keep() what it holds
 // is wiped, released and nulled.

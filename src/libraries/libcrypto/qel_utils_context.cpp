@@ -107,7 +107,7 @@ int createProviderContext(TracedCall& call) noexcept {
 }
 
 int releaseContext(const ContextKind& kind, void* qelCtx, void* context) noexcept {
-  TracedCall call{kind.release, {{"qelCtx", qelCtx}, {kind.contextArgument, context}}};
+  TracedCall call{kind.release, "qelCtx", qelCtx, kind.contextArgument, context};
   if (qelCtx == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   if (context == nullptr) return call.leave(LDAPPW_SUCCESS);
   if (const int rc = (*kind.cleanContext)(qelCtx, context); rc != 1) {
@@ -120,11 +120,9 @@ int releaseContext(const ContextKind& kind, void* qelCtx, void* context) noexcep
 }
 
 int createContext(const ContextKind& kind, void* qelCtx, void** context, const char* name, void** algorithm) noexcept {
-  TracedCall call{kind.create,
-                  {{"qelCtx", qelCtx},
-                   {kind.contextArgument, context},
-                   {kind.nameArgument, name},
-                   {kind.algorithmArgument, algorithm}}};
+  TracedCall call{kind.create, "qelCtx",          qelCtx, kind.contextArgument,
+                  context,     kind.nameArgument, name,   kind.algorithmArgument,
+                  algorithm};
   if (qelCtx == nullptr || context == nullptr || name == nullptr || algorithm == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }
@@ -153,7 +151,7 @@ extern "C" {
 void* qelCtxGlobal = nullptr;
 
 int initQelCrypto(void** qelCtx) noexcept {
-  TracedCall call{kInitCrypto, {{"qelCtx", qelCtx}}};
+  TracedCall call{kInitCrypto, "qelCtx", qelCtx};
   if (qelCtx == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   void* context = currentContext();
   if (__builtin_expect(context == nullptr, 0)) {
@@ -168,7 +166,7 @@ int initQelCrypto(void** qelCtx) noexcept {
 }
 
 int freeQelCrypto(void* qelCtx) noexcept {
-  TracedCall call{kFreeCrypto, {{"qelCtx", qelCtx}}};
+  TracedCall call{kFreeCrypto, "qelCtx", qelCtx};
   if (qelCtx != nullptr && pQEL_Cleanup != nullptr) {
     QelStatus status{};
     pQEL_Cleanup(qelCtx, &status);
@@ -193,7 +191,7 @@ int freeQelDigest(void* qelCtx, void* digestCtx) noexcept {
 }
 
 int qelStatusToLdap(void* qelCtx, QelStatus* status) noexcept {
-  TracedCall call{kStatusToLdap, {{"qelCtx", qelCtx}, {"status", status}}};
+  TracedCall call{kStatusToLdap, "qelCtx", qelCtx, "status", status};
   QelStatus last{};
   if (status == nullptr) {
     if (qelCtx == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");

@@ -123,7 +123,7 @@ int rewriteAttachPath(TracedCall& call, char* attachPath) noexcept {
 }
 
 int askForAttachPath(TracedCall& call, void* operation, char** attachPath) noexcept {
-  *attachPath = callocBytes<char>(kAttachPathSize);
+  *attachPath = zeroedBytes<char>(kAttachPathSize);
   if (*attachPath == nullptr) return call.failText(LDAPPW_NO_MEMORY, "Error - loadQelCrypto: Out of Memory!.\n");
   PathOperation pathOperation = nullptr;
   std::memcpy(&pathOperation, &operation, sizeof operation);
@@ -204,7 +204,7 @@ using namespace ldappw;
 extern "C" {
 
 int loadQelCrypto(char** attachPath) noexcept {
-  TracedCall call{kLoad, {{"attachPath", attachPath}}};
+  TracedCall call{kLoad, "attachPath", attachPath};
   if (attachPath == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   *attachPath = nullptr;
 

@@ -2,6 +2,7 @@
 // The scheme tags, detection of a value's scheme, the lengths of values, and the crypt salt.
 #include <unistd.h>
 
+#include <algorithm>
 #include <climits>
 #include <cstdlib>
 #include <ctime>
@@ -58,24 +59,27 @@ constexpr TagRow kTagRows[] = {
     {AES128_BRACED, sizeof AES128_BRACED, 8, FORMAT_AES128}, {AES192_BRACED, sizeof AES192_BRACED, 8, FORMAT_AES192},
     {AES256_BRACED, sizeof AES256_BRACED, 8, FORMAT_AES256}, {VLDL_BRACED, sizeof VLDL_BRACED, 6, FORMAT_VLDL}};
 
+constexpr char folded(char c) {
+  return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
+}
+
 bool isMasked(const char* value, unsigned length) noexcept {
   if (length <= kMaskedLongerThan) return false;
-  return beginsWith(value, qVEIL_BRACED, sizeof qVEIL_BRACED) || (value[0] == '>' && value[length - 1] == '<');
+  if (value[0] == '>') return value[length - 1] == '<';
+  return value[0] == '{' && beginsWith(value, qVEIL_BRACED, sizeof qVEIL_BRACED);
 }
 
 int detected(TracedCall& call, const char* value, unsigned length) noexcept {
   if (length <= kNoMatch || value == nullptr) return FORMAT_NONE;
   if (isMasked(value, length)) return FORMAT_QVEIL;
   if (value[0] != '{') return FORMAT_NONE;
+  const char second = folded(value[1]);  // tells most tags apart
   for (const TagRow& row : kTagRows) {
-    if (length > row.longerThan && beginsWith(value, row.tag, row.tagBytes)) return row.code;
+    if (second == folded(row.tag[1]) && length > row.longerThan && beginsWith(value, row.tag, row.tagBytes))
+      return row.code;
   }
   call.line(LineClass::debug, "CheckFormat:UNKNOWN pwd encoding,assume unencrypted\n");
   return FORMAT_NONE;
-}
-
-constexpr char folded(char c) {
-  return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
 }
 
 constexpr int kCipherBlock = 16;
@@ -91,9 +95,14 @@ constexpr int kSeedModulus = 2147483647;
 
 }  // namespace
 
+int valueLength(const Scheme& scheme, int clearLength) noexcept {
+  return scheme.fixedLength != kMeasured ? scheme.fixedLength : aesValueLength(clearLength, scheme.tagBytes);
+}
+
 bool beginsWith(const char* value, const char* tag, size_t tagBytes) noexcept {
+  if (std::equal(tag, tag + tagBytes, value)) return true;  // the usual spelling
   for (size_t i = 0; i < tagBytes; ++i) {
-    if (value[i] != tag[i] && folded(value[i]) != folded(tag[i])) return false;
+    if (folded(value[i]) != folded(tag[i])) return false;
   }
   return true;
 }
@@ -113,9 +122,7 @@ int check_format(const char* value, unsigned int length) noexcept {
 
 int formatted_password_length(int scheme, int clearLength) noexcept {
   if (scheme == FORMAT_NONE) return clearLength;
-  if (const Scheme* row = findScheme(scheme)) {
-    return row->fixedLength != kMeasured ? row->fixedLength : aesValueLength(clearLength, row->tagBytes);
-  }
+  if (const Scheme* row = findScheme(scheme)) return valueLength(*row, clearLength);
   globalLine(LineClass::debug, "Error - formatted_password_length: Format-UNKNOWN pwd encoding %d\n", scheme);
   return -1;
 }

@@ -4,6 +4,7 @@
 
 #include <cstring>
 
+#include "base64.h"
 #include "crypt_state.h"
 #include "owners.h"
 #include "password_schemes.h"
@@ -78,8 +79,11 @@ size_t makeSha(TracedCall& call, const Scheme& scheme, const FormatRequest& requ
   } else if (!digestClear(request, digest)) {
     return 0;
   }
-  const PlainOwner<char> text(binaryBlobToBase64(digestBytes, static_cast<int>(kDigestBytes)));
-  return text ? copyPayload(text.get(), payload) : 0;
+  if (!isWholeAlphabet(pBase64)) return 0;
+  char text[encodedRoom(kDigestBytes)];
+  const size_t length = encodeBytes(digestBytes, kDigestBytes, pBase64, text);
+  std::memcpy(payload, text, length);  // without the NUL, for which there may be no room
+  return length;
 }
 
 size_t makeMd5(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
@@ -150,7 +154,7 @@ int copyClear(const FormatRequest& request, char* out, size_t outSize) noexcept 
 // Writes the value into the cleared buffer.
 int formatValue(TracedCall& call, const Scheme& scheme, const FormatRequest& request, char* out,
                 size_t outSize) noexcept {
-  const int least = formatted_password_length(scheme.code, static_cast<int>(request.clearBytes));
+  const int least = valueLength(scheme, static_cast<int>(request.clearBytes));
   if (least < 0 || outSize < static_cast<size_t>(least)) return 0;
   if (scheme.code == FORMAT_CRYPT && request.salt == nullptr) return 0;
   std::memcpy(out, scheme.tag, scheme.tagBytes);

@@ -42,6 +42,9 @@ struct Scheme {
   PayloadMaker make;
 };
 
+// The length of the value that a scheme makes of so many bytes, -1 for one that no int can tell.
+int valueLength(const Scheme& scheme, int clearLength) noexcept;
+
 // The row of a scheme that can be made, or null.
 const Scheme* findScheme(int code) noexcept;
 

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Checking presented passwords against stored values, and turning reversible values back into clear text.
+#include <algorithm>
 #include <cstring>
 
 #include "owners.h"
@@ -77,6 +78,12 @@ class WorkBuffer {
   }
 
  private:
+  // What does not fit beside the value cannot match it, so there is no need to clear more.
+  static int roomFor(const Text& value) noexcept {
+    constexpr size_t kLeast = 64;  // the longest value of a fixed-length digest, and its NUL
+    return static_cast<int>(std::min(kWorkSize, std::max(kLeast, value.length + 1)));
+  }
+
   char bytes_[kWorkSize];
   size_t length_ = 0;
 };
@@ -96,7 +103,7 @@ int compareLeading(const Comparison& c) noexcept {
 int saltedVerify(const Text& clear, const Text& value) noexcept {
   const Text payloadText = behind(value, sizeof SSHA_BRACED);
   SecretText password(clear.data, clear.length);
-  SecretText payload(payloadText.data, payloadText.length);
+  PlainText payload(payloadText.data, payloadText.length);
   if (!password || !payload) return kNotCompared;
   return saltedHashVerify(password.get(), payload.get(), kSaltedDigest);
 }
@@ -181,16 +188,18 @@ struct Rule {
   int (*compare)(const Comparison&);
 };
 
+// The usual pairs, with a clear presented password, come first.
 constexpr Rule kRules[] = {
+    {FORMAT_SSHA, FORMAT_NONE, verifySalted},
+    {FORMAT_NONE, FORMAT_NONE, compareLeading},
     {FORMAT_QVEIL, kAny, compareUnmasked},
+    {FORMAT_VLDL, FORMAT_NONE, notComparable},
+    {kAny, FORMAT_NONE, compareFormattedPresented},
     {kAny, FORMAT_QVEIL, compareUnmasked},
     {FORMAT_SHA, FORMAT_SHA, compareDigests},
     {kAny, kSameAsStored, compareLeading},
     {FORMAT_NONE, FORMAT_SSHA, verifySaltedUnexchanged},
     {FORMAT_NONE, kAny, compareFormattedStored},
-    {FORMAT_VLDL, FORMAT_NONE, notComparable},
-    {FORMAT_SSHA, FORMAT_NONE, verifySalted},
-    {kAny, FORMAT_NONE, compareFormattedPresented},
     {kAny, kAny, compareWhole},
 };
 

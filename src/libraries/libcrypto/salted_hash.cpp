@@ -1,7 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 // Salted digests through the crypto provider: the payload of {SSHA} values.
+#include <climits>
 #include <cstring>
 
+#include "base64.h"
 #include "password_schemes.h"
 #include "qel_utils.h"
 #include "trace_scope.h"
@@ -11,6 +13,10 @@ namespace {
 
 constexpr TraceInfo kEncrypt{"saltedHashEncrypt", operationScope(moduleId(kSaltedHash, 1)), LineClass::debug};
 constexpr TraceInfo kVerify{"saltedHashVerify", operationScope(moduleId(kSaltedHash, 2)), LineClass::debug};
+
+// What needs no allocation; a {SSHA} value is well within it.
+constexpr size_t kUsualDigest = 64;
+constexpr size_t kUsualText = 128;
 
 // Digests clear text and salt into out.
 int digestSalted(TracedCall& call, void* qelCtx, const DigestContext& digest, const char* clear,
@@ -40,7 +46,7 @@ extern "C" {
 // Documented in password_schemes.h.
 
 int saltedHashEncrypt(const char* clear, char** out, const char* digestName) noexcept {
-  TracedCall call{kEncrypt, {{"clear", clear}, {"out", out}, {"digestName", digestName}}};
+  TracedCall call{kEncrypt, "clear", clear, "out", out, "digestName", digestName};
   if (clear == nullptr || out == nullptr || digestName == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }
@@ -53,7 +59,7 @@ int saltedHashEncrypt(const char* clear, char** out, const char* digestName) noe
   const int size = pQEL_EVP_MD_size(qelCtx, digest.algorithm());
   if (size <= 0) return call.fail(LDAPPW_OPERATIONS_ERROR, "QEL_EVP_MD_size() failed.");
   const auto bytes = static_cast<unsigned>(size);
-  *out = callocBytes<char>(size_t{2} * bytes);
+  *out = zeroedBytes<char>(size_t{2} * bytes);
   if (*out == nullptr) return call.fail(LDAPPW_NO_MEMORY, "calloc() returned NULL.");
   auto* raw = reinterpret_cast<unsigned char*>(*out);
   unsigned char* salt = raw + bytes;
@@ -68,13 +74,16 @@ int saltedHashEncrypt(const char* clear, char** out, const char* digestName) noe
 }
 
 int saltedHashVerify(const char* clear, const char* stored, const char* digestName) noexcept {
-  TracedCall call{kVerify, {{"clear", clear}, {"stored", stored}, {"digestName", digestName}}};
+  TracedCall call{kVerify, "clear", clear, "stored", stored, "digestName", digestName};
   if (clear == nullptr || stored == nullptr || digestName == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }
-  unsigned decodedBytes = 0;
-  const PlainOwner<unsigned char> decoded(base64ToBinaryBlob(stored, &decodedBytes));
-  if (!decoded) return call.fail(LDAPPW_OPERATIONS_ERROR, "base64ToBinaryBlob() returned NULL.");
+  const size_t storedLength = std::strlen(stored);
+  PlainBytes<decodedRoom(kUsualText)> decoded(decodedRoom(storedLength));
+  if (!decoded || storedLength > INT_MAX) {
+    return call.fail(LDAPPW_OPERATIONS_ERROR, "base64ToBinaryBlob() returned NULL.");
+  }
+  const auto decodedBytes = static_cast<unsigned>(decodeText(stored, storedLength, pBase64, decoded.get()).bytes);
   void* qelCtx = nullptr;
   if (const int rc = initQelCrypto(&qelCtx); rc != 0) return call.fail(rc, "initQelCrypto() failed.");
   DigestContext digest(qelCtx);
@@ -84,7 +93,7 @@ int saltedHashVerify(const char* clear, const char* stored, const char* digestNa
   if (size <= 0) return call.fail(LDAPPW_OPERATIONS_ERROR, "QEL_EVP_MD_size() failed.");
   const auto bytes = static_cast<unsigned>(size);
   if (decodedBytes < bytes) return call.fail(LDAPPW_OPERATIONS_ERROR, "Stored value shorter than the digest.");
-  const SecretOwner<unsigned char> fresh(callocBytes<unsigned char>(bytes));
+  SecretBytes<kUsualDigest> fresh(bytes);
   if (!fresh) return call.fail(LDAPPW_NO_MEMORY, "calloc() returned NULL.");
   const unsigned char* salt = decoded.get() + bytes;
   if (const int rc = digestSalted(call, qelCtx, digest, clear, salt, decodedBytes - bytes, fresh.get()); rc != 0) {

@@ -6,19 +6,17 @@
 
 namespace ldappw {
 
-void TracedCall::writeEntering(std::initializer_list<TraceArgument> arguments) noexcept {
-  char list[512] = "";  // the longest list has ten arguments of at most 40 characters
+void TracedCall::writeEntering(const void* const* pairs, size_t count) noexcept {
+  char list[512] = "";  // the longest list has six arguments of at most 40 characters
   size_t used = 0;
-  const char* separator = " ";
-  for (const TraceArgument& argument : arguments) {
+  for (size_t i = 0; i < count && used < sizeof list; ++i) {
+    const char* name = static_cast<const char*>(pairs[2 * i]);
     const int written =
-        std::snprintf(list + used, sizeof list - used, "%s%s = %p", separator, argument.name, argument.value);
+        std::snprintf(list + used, sizeof list - used, "%s %s = %p", i == 0 ? "" : ",", name, pairs[2 * i + 1]);
     used += static_cast<size_t>(written);
-    if (used >= sizeof list) break;
-    separator = ", ";
   }
-  const char* name = info_.enteringAs != nullptr ? info_.enteringAs : info_.name;
-  ldtr_formater_local(&info_.scope, LDTR_DEBUG, "%s: Entering.%s\n", name, list);
+  const char* function = info_.enteringAs != nullptr ? info_.enteringAs : info_.name;
+  ldtr_formater_local(&info_.scope, LDTR_DEBUG, "%s: Entering.%s\n", function, list);
 }
 
 void TracedCall::writeLeaving() noexcept {

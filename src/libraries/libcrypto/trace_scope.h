@@ -3,7 +3,7 @@
 // a failing step is one return. Lines that depart from the usual shape are given whole through failText.
 #pragma once
 
-#include <initializer_list>
+#include <cstddef>
 
 #include "encoding_utils.h"
 #include "ldtr.h"
@@ -56,16 +56,17 @@ enum Module : unsigned {
   kUnsaltedHash
 };
 
-struct TraceArgument {
-  const char* name;
-  const void* value;
-};
-
 class TracedCall {
  public:
-  explicit TracedCall(const TraceInfo& info, std::initializer_list<TraceArgument> arguments = {}) noexcept
-      : info_(info), scope_(info.scope) {
-    if (__builtin_expect(scope_.debugOn(), 0) && info_.lines == Lines::usual) writeEntering(arguments);
+  // After the function come the pointer arguments to show, each as its name and its value. They are put together only
+  // when there is a line to write.
+  template <class... NamesAndValues>
+  explicit TracedCall(const TraceInfo& info, NamesAndValues... pairs) noexcept : info_(info), scope_(info.scope) {
+    static_assert(sizeof...(pairs) % 2 == 0, "names and values");
+    if (__builtin_expect(scope_.debugOn(), 0) && info_.lines == Lines::usual) {
+      const void* const list[] = {static_cast<const void*>(pairs)..., nullptr};
+      writeEntering(list, sizeof...(pairs) / 2);
+    }
   }
   ~TracedCall() {
     if (__builtin_expect(scope_.debugOn(), 0) && info_.lines != Lines::none) writeLeaving();
@@ -103,7 +104,7 @@ class TracedCall {
   }
 
  private:
-  void writeEntering(std::initializer_list<TraceArgument> arguments) noexcept;
+  void writeEntering(const void* const* pairs, size_t count) noexcept;
   void writeLeaving() noexcept;
   void writeFailure(const char* what, int shown) noexcept;
 

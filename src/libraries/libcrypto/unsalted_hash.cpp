@@ -40,7 +40,7 @@ int unsaltedHashEncrypt(const char* digestName, const char* clear, char** out) n
   }
   OutGuard result{out};
   const int size = pQEL_EVP_MD_size(qelCtx, digest.algorithm());
-  *out = size < 0 ? nullptr : callocBytes<char>(static_cast<size_t>(size));
+  *out = size < 0 ? nullptr : zeroedBytes<char>(static_cast<size_t>(size));
   if (*out == nullptr) return call.failText(LDAPPW_NO_MEMORY, "Error - unsaltedHashEncrypt : calloc() failed\n");
   auto* raw = reinterpret_cast<unsigned char*>(*out);
   if (pQEL_EVP_DigestUpdate(qelCtx, digest.get(), clear, static_cast<unsigned>(std::strlen(clear))) == 0) {

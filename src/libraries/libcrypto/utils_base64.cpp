@@ -5,6 +5,7 @@
 #include <cstdio>
 #include <cstring>
 
+#include "base64.h"
 #include "encoding_utils.h"
 #include "owners.h"
 
@@ -36,15 +37,17 @@ constexpr PlaceTable placesOf(const char* alphabet, size_t length) {
 constexpr PlaceTable kStandardPlaces = placesOf(kStandard, kSymbols);
 
 bool isStandard(const char* alphabet) noexcept {
-  return std::strncmp(alphabet, kStandard, kSymbols + 1) == 0;
+  return alphabet == kStandard || std::strncmp(alphabet, kStandard, kSymbols + 1) == 0;
 }
 
 inline void encodeWholeGroup(const unsigned char* in, char* out, const char* alphabet) noexcept {
-  const unsigned bits = unsigned{in[0]} << 16U | unsigned{in[1]} << 8U | in[2];
-  out[0] = alphabet[bits >> 18U];
-  out[1] = alphabet[(bits >> 12U) & 63U];
-  out[2] = alphabet[(bits >> 6U) & 63U];
-  out[3] = alphabet[bits & 63U];
+  const unsigned first = in[0];
+  const unsigned second = in[1];
+  const unsigned third = in[2];
+  out[0] = alphabet[first >> 2U];
+  out[1] = alphabet[(first & 3U) << 4U | second >> 4U];
+  out[2] = alphabet[(second & 15U) << 2U | third >> 6U];
+  out[3] = alphabet[third & 63U];
 }
 
 // The group of the last one or two bytes.
@@ -57,12 +60,13 @@ void encodeShortGroup(const unsigned char* in, char* out, size_t remaining, cons
 }
 
 // Decodes one group and returns the number of bytes that it gives.
-unsigned decodeGroup(const char* in, unsigned char* out, const PlaceTable& table) noexcept {
+unsigned decodeGroup(const char* in, unsigned char* out, const PlaceTable& table, bool& isClean) noexcept {
   static constexpr unsigned char kBytesByFirstPad[5] = {0, 1, 1, 2, 3};
   unsigned index[4];
   unsigned firstPad = 4;
   for (unsigned i = 4; i-- > 0;) {
     index[i] = table.places[static_cast<unsigned char>(in[i])];
+    isClean &= index[i] <= kPadIndex;
     if (index[i] == kPadIndex) {
       index[i] = 0;
       firstPad = i;
@@ -84,27 +88,50 @@ size_t decodeCleanGroups(const char* text, size_t groups, unsigned char* out, co
     const unsigned c = table.places[static_cast<unsigned char>(text[2])];
     const unsigned d = table.places[static_cast<unsigned char>(text[3])];
     if ((a | b | c | d) >= kSymbols) break;
-    const unsigned bits = a << 18U | b << 12U | c << 6U | d;
-    out[0] = static_cast<unsigned char>(bits >> 16U);
-    out[1] = static_cast<unsigned char>(bits >> 8U);
-    out[2] = static_cast<unsigned char>(bits);
+    // Big-endian, in one store: the fourth byte is the next group's, or the terminator's.
+    const uint32_t bytes = __builtin_bswap32(a << 26U | b << 20U | c << 14U | d << 8U);
+    std::memcpy(out, &bytes, sizeof bytes);
   }
   return group;
 }
 
-size_t decodeGroups(const char* text, size_t length, unsigned char* out, const PlaceTable& table) noexcept {
-  size_t at = decodeCleanGroups(text, length / 4, out, table);
-  size_t bytes = at * 3;
-  out += bytes;
-  for (at *= 4; at < length; at += 4, out += 3) {
+DecodedText decodeGroups(const char* text, size_t length, unsigned char* out, const PlaceTable& table) noexcept {
+  const size_t clean = decodeCleanGroups(text, length / 4, out, table);
+  DecodedText result{clean * 3, true};
+  out += clean * 3;
+  size_t at = clean * 4;
+  for (; at + 4 <= length; at += 4, out += 3) result.bytes += decodeGroup(text + at, out, table, result.isClean);
+  if (at < length) {
     char group[4] = {};  // what a short last group lacks counts as the terminator
-    std::memcpy(group, text + at, length - at < 4 ? length - at : 4);
-    bytes += decodeGroup(group, out, table);
+    std::memcpy(group, text + at, length - at);
+    result.bytes += decodeGroup(group, out, table, result.isClean);
   }
-  return bytes;
+  return result;
 }
 
 }  // namespace
+
+DecodedText decodeText(const char* text, size_t length, const char* alphabet, unsigned char* out) noexcept {
+  if (isStandard(alphabet)) return decodeGroups(text, length, out, kStandardPlaces);
+  return decodeGroups(text, length, out, placesOf(alphabet, std::strlen(alphabet)));
+}
+
+size_t encodeBytes(const unsigned char* data, size_t bytes, const char* alphabet, char* out) noexcept {
+  const char* const begin = out;
+  size_t at = 0;
+  for (; at + 3 <= bytes; at += 3, out += 4) encodeWholeGroup(data + at, out, alphabet);
+  if (at < bytes) {
+    encodeShortGroup(data + at, out, bytes - at, alphabet);
+    out += 4;
+  }
+  *out = '\0';
+  return static_cast<size_t>(out - begin);
+}
+
+bool isWholeAlphabet(const char* alphabet) noexcept {
+  return std::memchr(alphabet, '\0', kSymbols) == nullptr;
+}
+
 }  // namespace ldappw
 
 using namespace ldappw;
@@ -117,19 +144,10 @@ const char* pBase64 = kStandard;
 const char* pBase64Find = kStandardWithPad;
 
 char* binaryBlobToString(const unsigned char* data, int length, const char* alphabet) noexcept {
-  if (alphabet == nullptr || (data == nullptr && length > 0)) return nullptr;
-  if (std::memchr(alphabet, '\0', kSymbols) != nullptr) return nullptr;
+  if (alphabet == nullptr || (data == nullptr && length > 0) || !isWholeAlphabet(alphabet)) return nullptr;
   const size_t bytes = length > 0 ? static_cast<size_t>(length) : 0;
-  char* text = static_cast<char*>(std::malloc(bytes / 3 * 4 + 5));
-  if (text == nullptr) return nullptr;
-  char* out = text;
-  size_t at = 0;
-  for (; at + 3 <= bytes; at += 3, out += 4) encodeWholeGroup(data + at, out, alphabet);
-  if (at < bytes) {
-    encodeShortGroup(data + at, out, bytes - at, alphabet);
-    out += 4;
-  }
-  *out = '\0';
+  char* text = static_cast<char*>(std::malloc(encodedRoom(bytes)));
+  if (text != nullptr) encodeBytes(data, bytes, alphabet, text);
   return text;
 }
 
@@ -140,14 +158,10 @@ char* binaryBlobToBase64(const unsigned char* data, int length) noexcept {
 unsigned char* stringToBinaryBlob(const char* text, unsigned int* outLength, const char* alphabet) noexcept {
   if (text == nullptr || outLength == nullptr || alphabet == nullptr) return nullptr;
   const size_t length = std::strlen(text);
-  const size_t size = length / 4 * 3 + 4;
+  const size_t size = decodedRoom(length);
   if (size > UINT_MAX) return nullptr;
-  auto* data = callocBytes<unsigned char>(size);
-  if (data == nullptr) return nullptr;
-  const size_t bytes = isStandard(alphabet)
-                           ? decodeGroups(text, length, data, kStandardPlaces)
-                           : decodeGroups(text, length, data, placesOf(alphabet, std::strlen(alphabet)));
-  *outLength = static_cast<unsigned int>(bytes);
+  auto* data = zeroedBytes<unsigned char>(size);
+  if (data != nullptr) *outLength = static_cast<unsigned int>(decodeText(text, length, alphabet, data).bytes);
   return data;
 }
 

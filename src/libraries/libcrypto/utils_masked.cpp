@@ -134,7 +134,7 @@ struct Decoded {
 
 int gathered(const unsigned char* area, size_t areaBytes, size_t length, unsigned width, Decoded& out) noexcept {
   if (length > areaBytes / (8 / width)) return LDAPPW_NOT_SUPPORTED;
-  out.data = callocBytes<unsigned char>(length + 1);
+  out.data = zeroedBytes<unsigned char>(length + 1);
   if (out.data == nullptr) return LDAPPW_NO_MEMORY;
   out.length = length;
   Cursor cursor = 0;
