@@ -1,0 +1,77 @@
+// SPDX-License-Identifier: Apache-2.0
+// Byte-exact splitting of LDIF text (RFC 2849): an input into batches of whole records, a batch into logical lines.
+// The LDAP library's record reader is no help here: it joins folded lines and drops comments and carriage returns, and
+// what is not changed has to come out as it came in.
+#ifndef LDAPPW_TOOLS_LDIF_LINES_H
+#define LDAPPW_TOOLS_LDIF_LINES_H
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+#include "secret.h"
+
+namespace tool {
+
+// One line with its continuation lines, as it stands in the input.
+struct LogicalLine {
+  std::string_view raw;       // line ends included
+  std::string_view first;     // the first physical line without its end
+  std::string_view firstEnd;  // "\n", "\r\n", or less at the end of the input
+  std::string_view lastEnd;   // of the last physical line
+  std::size_t physicalLines = 0;
+  bool folded() const noexcept { return physicalLines > 1; }
+  bool blank() const noexcept { return first.empty(); }
+};
+
+// Walks over the logical lines of a text. A blank line stands alone; a continuation line without a line before it is a
+// logical line of its own.
+class LineCursor {
+ public:
+  explicit LineCursor(std::string_view text) noexcept : rest_(text) {}
+  bool next(LogicalLine& line) noexcept;
+
+ private:
+  std::string_view rest_;
+};
+
+// The text of a logical line with the folding undone and without its line end.
+void unfold(const LogicalLine& line, Secret& out);
+
+// Appends text folded at 76 columns, with the given line end between the parts and none after the last.
+void foldInto(std::string_view text, std::string_view lineEnd, Secret& out);
+
+// Records that follow each other in the input, up to and including a blank line (or the end of the input).
+struct Batch {
+  std::uint64_t number = 0;
+  std::uint64_t firstLine = 1;
+  Secret text;
+};
+
+// Cuts what a descriptor delivers into batches. Used by one thread at a time; the descriptor stays the caller's.
+class RecordReader {
+ public:
+  static constexpr std::size_t kBatchBytes = std::size_t{256} << 10;
+  // A record larger than this is refused: memory must not follow a file that has no records in it.
+  static constexpr std::size_t kMaxRecordBytes = std::size_t{256} << 20;
+
+  RecordReader(int fd, std::string name) : fd_(fd), name_(std::move(name)) {}
+
+  // False at the end of the input. Throws Failure: kIoError, or kBadValue for a record that is too large.
+  bool next(Batch& batch);
+
+ private:
+  bool fill(Secret& text);
+
+  int fd_;
+  std::string name_;
+  Secret ahead_;  // read already, but of the next batch
+  std::uint64_t batches_ = 0;
+  std::uint64_t lines_ = 0;
+  bool ended_ = false;
+};
+
+}  // namespace tool
+
+#endif
