@@ -23,3 +23,4 @@ set(CMAKE_PREFIX_PATH ${ldappw_root}/usr)
 set(CMAKE_LIBRARY_PATH ${ldappw_libraries} ${ldappw_root}/lib/i386-linux-gnu)
 set(OPENSSL_ROOT_DIR ${ldappw_root}/usr)
 set(CMAKE_BUILD_RPATH ${ldappw_libraries} ${ldappw_root}/lib/i386-linux-gnu)
+set(LDAPPW_EXTRA_RPATH ${CMAKE_BUILD_RPATH})  # for what is linked as it will be installed

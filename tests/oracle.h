@@ -9,6 +9,8 @@
 #include <random>
 #include <string>
 
+#include "aes_keys.h"
+
 namespace test {
 
 inline const unsigned char* bytesOf(const std::string& text) {
@@ -16,6 +18,16 @@ inline const unsigned char* bytesOf(const std::string& text) {
 }
 inline unsigned char* bytesOf(std::string& text) {
   return reinterpret_cast<unsigned char*>(text.data());
+}
+
+inline const unsigned char* bytesOf(const char* text) {
+  return reinterpret_cast<const unsigned char*>(text);
+}
+inline unsigned char* bytesOf(char* text) {
+  return reinterpret_cast<unsigned char*>(text);
+}
+inline std::string textOf(const SecBuffer& buffer) {
+  return std::string(reinterpret_cast<const char*>(buffer.data), buffer.length);
 }
 
 // Takes a text from the product and releases it.
@@ -63,6 +75,36 @@ inline std::string opensslBase64(const std::string& data) {
   std::string text((data.size() + 2) / 3 * 4 + 1, '\0');
   EVP_EncodeBlock(bytesOf(text), bytesOf(data), static_cast<int>(data.size()));
   text.pop_back();
+  return text;
+}
+
+inline std::string opensslDecoded(const std::string& text) {
+  std::string bytes(text.size() / 4 * 3, '\0');
+  const int length = EVP_DecodeBlock(bytesOf(bytes), bytesOf(text), static_cast<int>(text.size()));
+  const size_t pads = text.size() - text.find_last_not_of('=') - 1;
+  return length < 0 ? "no base64" : bytes.substr(0, static_cast<size_t>(length) - pads);
+}
+
+inline std::string opensslDigest(const char* name, const std::string& data) {
+  unsigned char out[EVP_MAX_MD_SIZE];
+  unsigned length = 0;
+  EVP_Digest(data.data(), data.size(), out, &length, EVP_get_digestbyname(name), nullptr);
+  return {reinterpret_cast<char*>(out), length};
+}
+
+// The payload of a salted value.
+inline std::string saltedPayload(const std::string& clear, const std::string& salt, const char* name = "SHA1") {
+  return opensslBase64(opensslDigest(name, clear + salt) + salt);
+}
+
+inline std::string upToNul(const std::string& text) {
+  return text.c_str();
+}
+
+// A text of bytes other than NUL, which begins otherwise for other lengths.
+inline std::string letters(size_t length) {
+  std::string text(length, '\0');
+  for (size_t i = 0; i < length; ++i) text[i] = static_cast<char>(1 + (i * 37 + length) % 255);
   return text;
 }
 

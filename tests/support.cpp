@@ -20,6 +20,8 @@ bool fails() {
 
 }  // namespace
 
+// Visible, since the linker finds the sanitizer's runtime asking for the same names.
+#pragma GCC visibility push(default)
 extern "C" {
 void* __real_malloc(size_t size);
 void* __real_calloc(size_t count, size_t size);
@@ -44,6 +46,7 @@ void __wrap_free(void* data) {
   __real_free(data);
 }
 }
+#pragma GCC visibility pop
 
 namespace test {
 

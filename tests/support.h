@@ -8,7 +8,9 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
+#include <fstream>
 #include <mutex>
+#include <sstream>
 #include <string>
 #include <utility>
 #include <vector>
@@ -142,6 +144,15 @@ class TempFolder {
   std::filesystem::path path_;
 };
 
+inline std::string fileContent(const std::string& path) {
+  std::stringstream content;
+  content << std::ifstream(path, std::ios::binary).rdbuf();
+  return content.str();
+}
+inline void putFile(const std::string& path, const std::string& content) {
+  std::ofstream(path, std::ios::binary) << content;
+}
+
 inline std::string fromHex(const std::string& hex) {
   std::string bytes;
   for (size_t i = 0; i + 1 < hex.size(); i += 2) {
@@ -172,6 +183,22 @@ inline AesKeyData* fixedRecord() {
   record->cryptoSync.length = 8;
   setCipherNameGlobal();
   return record;
+}
+
+// A record's buffers in the order of a stash file, and those of fixedRecord.
+inline std::string contentOf(const AesKeyData& record) {
+  std::string content;
+  for (const SecBuffer* buffer = &record.cryptoSync; buffer != record.aesKeys + 3; ++buffer) {
+    content.append(reinterpret_cast<const char*>(buffer->data), buffer->length);
+  }
+  return content;
+}
+inline std::string fixedContent() {
+  std::string content = "c3luYw==saltsaltsalt";
+  for (const int length : {16, 24, 32}) {
+    for (int i = 0; i < length; ++i) content += static_cast<char>(i);
+  }
+  return content;
 }
 
 }  // namespace test

@@ -166,7 +166,8 @@ LDAPPW_API int saltedHashEncrypt(const char* clear, char** out, const char* dige
 LDAPPW_API int unsaltedHashEncrypt(const char* digestName, const char* clear, char** out) LDAPPW_NOEXCEPT;
 
 /* Checks clear against such a salted text: the first digest-size bytes are the digest, all others the salt, whatever
- * their number. Returns 0 for a match, 49 for none; 1 also for a text that holds less than a digest. Traced. */
+ * their number. Returns 0 for a match, 49 for none; 1 also for a text that is not base64 or holds less than a digest.
+ * Traced. */
 LDAPPW_API int saltedHashVerify(const char* clear, const char* stored, const char* digestName) LDAPPW_NOEXCEPT;
 
 #ifdef __cplusplus

@@ -184,11 +184,12 @@ int format_password(int scheme, char* salt, AesKeyData* keyData, const char* cle
                     int outSize) noexcept {
   TracedCall call{kFormatPassword};
   if (clear == out) return call.leave(0);
-  if (clear == nullptr || out == nullptr || clearLength < 0 || outSize < 0) return call.leave(0);
+  if (out == nullptr || outSize < 0) return call.leave(0);
+  const auto room = static_cast<size_t>(outSize);
+  std::memset(out, 0, room);  // also for what is refused
+  if (clear == nullptr || clearLength < 0) return call.leave(0);
   if (keyData == nullptr && scheme == FORMAT_AES256) scheme = FORMAT_QVEIL;  // this one alone: meant
   const FormatRequest request{clear, static_cast<size_t>(clearLength), salt, keyData};
-  const auto room = static_cast<size_t>(outSize);
-  std::memset(out, 0, room);
   if (scheme == FORMAT_NONE) return call.leave(copyClear(request, out, room));
   if (const Scheme* row = findScheme(scheme)) return call.leave(formatValue(call, *row, request, out, room));
   return call.failText(0, "Error - format_password: Format-UNKNOWN pwd encoding %d\n", scheme);

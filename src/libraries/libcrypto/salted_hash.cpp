@@ -80,10 +80,11 @@ int saltedHashVerify(const char* clear, const char* stored, const char* digestNa
   }
   const size_t storedLength = std::strlen(stored);
   PlainBytes<decodedRoom(kUsualText)> decoded(decodedRoom(storedLength));
-  if (!decoded || storedLength > INT_MAX) {
+  const DecodedText given = decoded ? decodeText(stored, storedLength, pBase64, decoded.get()) : DecodedText{0, false};
+  if (!given.isClean || storedLength > INT_MAX) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "base64ToBinaryBlob() returned NULL.");
   }
-  const auto decodedBytes = static_cast<unsigned>(decodeText(stored, storedLength, pBase64, decoded.get()).bytes);
+  const auto decodedBytes = static_cast<unsigned>(given.bytes);
   void* qelCtx = nullptr;
   if (const int rc = initQelCrypto(&qelCtx); rc != 0) return call.fail(rc, "initQelCrypto() failed.");
   DigestContext digest(qelCtx);

@@ -1,0 +1,88 @@
+// SPDX-License-Identifier: Apache-2.0
+// Failures as table rows: what is broken while a call runs, the code that it gives and the last lines that it traces.
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <functional>
+#include <string>
+#include <type_traits>
+#include <vector>
+
+#include "crypto_provider.h"
+#include "support.h"
+
+namespace test {
+
+using Lines = std::vector<std::string>;
+using Body = std::function<void()>;
+using Failure = std::function<void(const Body&)>;
+
+// Runs the body with another value in the slot: a provider entry that fails, an argument that is null.
+template <class T>
+Failure replacing(T& slot, std::common_type_t<T> value) {
+  return [&slot, value](const Body& body) {
+    const Replaced<T> guard(slot, value);
+    body();
+  };
+}
+
+inline Failure failingAllocation(long number) {
+  return [number](const Body& body) {
+    const AllocationWatch watch(number);
+    body();
+  };
+}
+
+inline Failure both(const Failure& first, const Failure& second) {
+  return [first, second](const Body& body) { first([&] { second(body); }); };
+}
+
+// No provider context, and no provider to make one of; the attempt clears the first entry.
+inline Failure withoutProvider() {
+  return both(both(replacing(qelCtxGlobal, nullptr), replacing(qelLoadGlobal, nullptr)),
+              both(replacing(qelLibraryName, "not_there.so"), replacing(pQEL_GetStatus, nullptr)));
+}
+
+struct FailureCase {
+  int rc;
+  Lines lines;
+  Failure failure;
+};
+
+// The last line is the operation's own, and of its class.
+inline void expectFailures(const std::vector<FailureCase>& rows, int severity, const std::function<int()>& call) {
+  for (const FailureCase& row : rows) {
+    SCOPED_TRACE(row.lines.back());
+    const TraceCapture trace(TraceCapture::kLinesOnly);
+    row.failure([&] { EXPECT_EQ(call(), row.rc); });
+    const Lines lines = trace.messages();
+    ASSERT_GE(lines.size(), row.lines.size());
+    EXPECT_EQ(Lines(lines.end() - static_cast<long>(row.lines.size()), lines.end()), row.lines);
+    for (const Record& r : trace.records()) {
+      if (r.text == row.lines.back() && r.severity != severity) ADD_FAILURE() << "of the wrong class";
+    }
+  }
+}
+
+// Digests that do nothing, for failures that lie behind thousands of rounds.
+inline Failure withQuickDigests() {
+  return both(replacing(pQEL_EVP_DigestInit, [](auto...) { return 1; }),
+              both(replacing(pQEL_EVP_DigestUpdate, [](auto...) { return 1; }),
+                   replacing(pQEL_EVP_DigestFinal, [](auto...) { return 1; })));
+}
+
+// The trace as one text: entries and exits as > and <, lines whole, addresses as #.
+inline std::string outlineOf(const TraceCapture& trace) {
+  std::string outline;
+  for (const Record& r : trace.records()) {
+    std::string text = r.kind == LDTR_ENTRY ? ">" : r.kind == LDTR_EXIT ? "<" : r.text;
+    for (size_t at = text.find("0x"); at != std::string::npos; at = text.find("0x", at)) {
+      text.replace(at, text.find_first_not_of("0123456789abcdef", at + 2) - at, "#");
+    }
+    outline += text;
+  }
+  return outline;
+}
+
+}  // namespace test
