@@ -20,25 +20,20 @@ using test::failingAllocation;
 using test::fromHex;
 using test::Guarded;
 using test::Lines;
+using test::opensslDigest;
 using test::Replaced;
 using test::replacing;
 using test::textOf;
 using test::TraceCapture;
 
-std::string sha1(const std::string& data) {
-  std::string digest(20, '\0');
-  EVP_Digest(data.data(), data.size(), bytesOf(digest), nullptr, EVP_sha1(), nullptr);
-  return digest;
-}
-
 std::string derived(const std::string& seed, const std::string& salt, unsigned iterations, size_t length) {
   std::string key;
   for (unsigned index = 1; key.size() < length; ++index) {
     const char number[4] = {0, 0, static_cast<char>(index >> 8), static_cast<char>(index)};
-    std::string u = sha1(salt + seed + std::string(number, 4));
+    std::string u = opensslDigest("SHA1", salt + seed + std::string(number, 4));
     std::string block = u;
     for (unsigned i = 1; i < iterations; ++i) {
-      u = sha1(u);
+      u = opensslDigest("SHA1", u);
       for (size_t k = 0; k < 20; ++k) block[k] = static_cast<char>(block[k] ^ u[k]);
     }
     key += block;
@@ -158,7 +153,8 @@ TEST_F(Derivation, AgreesWithTheModelAndTheRecordedVectors) {
     }
   }
   EXPECT_EQ(pbkdf2("", "", 2, 30), derived("", "", 2, 30));
-  EXPECT_EQ(pbkdf2("s", "t", 1, 20), sha1(std::string("ts\0\0\0\1", 6)));  // the salt first, the number big-endian
+  EXPECT_EQ(pbkdf2("s", "t", 1, 20),
+            opensslDigest("SHA1", std::string("ts\0\0\0\1", 6)));  // the salt first, the number big-endian
   EXPECT_EQ(pbkdf2("s", "t", 1, 300 * 20), derived("s", "t", 1, 300 * 20));
   for (const Lines& row : vectors("key")) {
     const std::string key = fromHex(row.at(3));

@@ -115,7 +115,8 @@ expectCode "unreadable input" 5 $?
 (ulimit -f 100 && trap '' XFSZ && ldif --to sha --in sample --out old --force)
 expectCode "file size limit" 5 $?
 for signal in TERM KILL; do
-  mkfifo slow.$signal && (cat sample && exec sleep 60) > slow.$signal &
+  mkfifo slow.$signal
+  (cat sample && exec sleep 60) > slow.$signal &
   writer=$!
   "$ldappw" ldif --to sha --in slow.$signal --out old --force 2> /dev/null &
   command=$!

@@ -6,7 +6,6 @@
 #include <sys/wait.h>
 
 #include <atomic>
-#include <fstream>
 #include <functional>
 #include <sstream>
 #include <thread>
@@ -396,10 +395,6 @@ TEST(ProviderContext, TracesTheLoadingInsideItsOwnScope) {
        ">getQelInstallLibPath: Entering.\ngetQelInstallLibPath: Leaving. rc = 0\n<"
        "loadQelCrypto:- qelAttachPath = /toolkit\nloadQelCrypto: Leaving. rc = 0\n<initQelCrypto: Leaving. rc = 0\n<"},
       {0x10000, ">>><<<"},
-      {0x4000000,
-       "initQelCrypto: Entering. qelCtx = #\nloadQelCrypto: Entering. attachPath = #\n"
-       "getQelInstallLibPath: Entering.\ngetQelInstallLibPath: Leaving. rc = 0\n"
-       "loadQelCrypto:- qelAttachPath = /toolkit\nloadQelCrypto: Leaving. rc = 0\ninitQelCrypto: Leaving. rc = 0\n"},
       {0xfbfeffff, ""}};
   for (const auto& row : rows) {
     const Stage stage("complete", nullptr);

@@ -235,21 +235,4 @@ TEST(Prompt, SwitchesEchoOffWhileItReads) {
   close(host);
 }
 
-TEST(Prompt, GivesNullWhenTheCopyCannotBeMade) {
-  int ends[2];
-  ASSERT_EQ(pipe(ends), 0);
-  close(ends[1]);
-  FILE* stream = fdopen(ends[0], "r");
-  const Replaced<FILE*> standardInput(stdin, stream);
-  testing::internal::CaptureStdout();
-  char* password = nullptr;
-  {
-    const AllocationWatch watch(0);
-    password = getPassword();
-  }
-  testing::internal::GetCapturedStdout();
-  EXPECT_EQ(password, nullptr);
-  fclose(stream);
-}
-
 }  // namespace
