@@ -114,17 +114,18 @@ ldif --to sha --in . --out old --force
 expectCode "unreadable input" 5 $?
 (ulimit -f 100 && trap '' XFSZ && ldif --to sha --in sample --out old --force)
 expectCode "file size limit" 5 $?
+mkfifo slow && exec 9<> slow # with a writer that stays, the input does not end
 for signal in TERM KILL; do
-  mkfifo slow.$signal
-  (cat sample && exec sleep 60) > slow.$signal &
+  cat sample >&9 &
   writer=$!
-  "$ldappw" ldif --to sha --in slow.$signal --out old --force 2> /dev/null &
+  "$ldappw" ldif --to sha --in slow --out old --force 2> /dev/null 9>&- &
   command=$!
   for _ in {1..100}; do compgen -G '.old.*' > /dev/null && break || sleep 0.1; done
   kill -$signal $command && wait $command 2> /dev/null
   kill $writer 2> /dev/null
   [[ $signal == KILL ]] && rm -f .old.* # nothing can tidy up after that
 done
+exec 9>&-
 cmp -s old kept || bad "the old output was touched by a run that failed"
 compgen -G '.old.*' > /dev/null && bad "temporary files are left: $(ls -A)"
 ldif --to sha --in old --out old --force && cmp -s old one && [[ $(stat -c %a old) == 640 ]] || bad "the input as output"

@@ -79,8 +79,9 @@ LDAPPW_API int checkKeyStashFile(int type, const AesKeyData* keyData, const char
 LDAPPW_API int readKeyStashFile(const char* keyStashFile, AesKeyData* keyData) LDAPPW_NOEXCEPT;
 
 /*
- * createKeyStashFiles makes two stash files with mode 0600, overwriting what is there: the configuration's from a
- * random seed and salt, the directory's from dirCryptoSeed and dirCryptoSalt (null: a random salt).
+ * createKeyStashFiles writes two stash files, new ones with mode 0600 (a file that is there keeps its mode): the
+ * configuration's from a random seed and salt, the directory's from dirCryptoSeed and dirCryptoSalt (null: a random
+ * salt).
  *
  *   cryptoSyncStr  out  a new text: the sync text of the configuration record
  *

@@ -75,8 +75,8 @@ LDAPPW_API char* binaryBlobToString(const unsigned char* data, int length, const
 LDAPPW_API char* binaryBlobToBase64(const unsigned char* data, int length) LDAPPW_NOEXCEPT;
 
 /*
- * stringToBinaryBlob decodes text over the alphabet into a new buffer, followed by at least one NUL byte, and stores
- * the number of decoded bytes in *outLength; base64ToBinaryBlob does so over *pBase64.
+ * stringToBinaryBlob decodes text over the alphabet into a new buffer that ends in a NUL byte, and stores the number of
+ * decoded bytes in *outLength; base64ToBinaryBlob does so over *pBase64.
  *
  * Nothing is rejected. Each group of four characters gives 3 bytes without "=", 2 with the first "=" in the fourth
  * place, 1 with it in the second or third, none with it in the first; missing characters of a short last group count as
@@ -150,8 +150,8 @@ LDAPPW_API int _morva_utils_encode_binary(const unsigned char* data, int length,
 /*
  * Undo the masking. A text that is not wrapped in ">" and "<" is clear and comes back as a copy, its terminating NUL
  * counted in *outLength; ">0" wraps simpleCrypt output in base64, any second character but "0" and "1" wraps plain
- * base64. In each wrapped form the final "<" of the caller's text is overwritten with a NUL. The result is followed by
- * a NUL that *outLength does not count. No checksum guards a masked text: a damaged one gives other bytes, or 89.
+ * base64. In each wrapped form the final "<" of the caller's text is overwritten with a NUL, and the result ends in a
+ * NUL that *outLength does not count. No checksum guards a masked text: a damaged one gives other bytes, or 89.
  *
  * Return 0; 1 for a null argument; 89 for a record that does not hold together; 90. An unknown alphabet identifier
  * gives 0 and leaves the result null.

@@ -48,8 +48,8 @@ int start(const QEL_CTX* ctx, const QEL_CIPHER_CTX* cipherCtx, const QEL_CIPHER*
   EVP_CIPHER_CTX* openssl = context.openssl.get();
   // OpenSSL asks the cipher for its vector length whenever it is given a vector, and that takes a while.
   const unsigned char* iv = cipher->value.ivLength > 0 ? key.iv : nullptr;
-  if (EVP_CipherInit_ex(openssl, algorithmOf(call, *cipher, context.replica), nullptr, key.key, iv,
-                        encrypts ? 1 : 0) != 1) {
+  if (EVP_CipherInit_ex(openssl, algorithmOf(call, *cipher, context.replica), nullptr, key.key, iv, encrypts ? 1 : 0) !=
+      1) {
     return call.failOpenssl(QEL_REASON_CIPHER_FAILURE, "the cipher cannot be started");
   }
   if (!context.padding) EVP_CIPHER_CTX_set_padding(openssl, 0);
