@@ -575,16 +575,16 @@ Function* entry(void* library, const char* name, Function*) {
 
 // The library with work left behind in it, in this thread, in one that has exited and in one that outlives it.
 struct LibraryInUse {
-  void* library = nullptr;
+  void* handle = nullptr;
   std::promise<void> end;
   std::thread outliving;
 
-  explicit LibraryInUse(const std::string& path) : library{dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL)} {
-    if (library == nullptr) return;
-    QEL_CTX* ctx = entry(library, "QEL_Init", QEL_Init)(nullptr, nullptr);
-    auto* makeDigest = entry(library, "QEL_EVP_MD_CTX_new", QEL_EVP_MD_CTX_new);
-    auto* digestByName = entry(library, "QEL_EVP_get_digestbyname", QEL_EVP_get_digestbyname);
-    auto* init = entry(library, "QEL_EVP_DigestInit", QEL_EVP_DigestInit);
+  explicit LibraryInUse(const std::string& path) : handle{dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL)} {
+    if (handle == nullptr) return;
+    QEL_CTX* ctx = entry(handle, "QEL_Init", QEL_Init)(nullptr, nullptr);
+    auto* makeDigest = entry(handle, "QEL_EVP_MD_CTX_new", QEL_EVP_MD_CTX_new);
+    auto* digestByName = entry(handle, "QEL_EVP_get_digestbyname", QEL_EVP_get_digestbyname);
+    auto* init = entry(handle, "QEL_EVP_DigestInit", QEL_EVP_DigestInit);
     const auto work = [=] { EXPECT_EQ(1, init(ctx, makeDigest(ctx), digestByName(ctx, "SHA1"))); };
     work();
     std::thread{work}.join();
@@ -607,7 +607,7 @@ TEST(QelLibrary, LoadsAndUnloadsWithContextsLive) {
   const std::string folder = path.substr(0, path.rfind("/qellib/"));
   for (const std::string& way : {path, path, folder + "/qellib/.//libtresk7qels.so"}) {
     const LibraryInUse inUse{way};
-    void* library = inUse.library;
+    void* library = inUse.handle;
     ASSERT_NE(nullptr, library) << dlerror();
     std::istringstream names{kEntries};
     for (std::string name; names >> name;) EXPECT_NE(nullptr, dlsym(library, name.c_str())) << name;
@@ -636,7 +636,7 @@ void unloadWithoutOpenssl() {
   {
     const LibraryInUse inUse{LDAPPW_PROVIDER_PATH};
     OPENSSL_cleanup();
-    dlclose(inUse.library);
+    dlclose(inUse.handle);
   }
   _exit(3);
 }
