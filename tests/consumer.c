@@ -52,7 +52,7 @@ int main(void) {
     CHECK(matches("secret", value, keys) && !matches("Secret", value, keys));
   }
 
-  CHECK(memcmp(SHA_BRACED, "{SHA}{SSHA}{MD5}{crypt}{qVEIL}{AES128}{AES192}{AES256}{VLDL}", 61) == 0);
+  CHECK(memcmp(SHA_BRACED, "{SHA}", 5) == 0 && memcmp(VLDL_BRACED, "{VLDL}", 6) == 0);
   free(sync);
   freeAesKeyData(keys);
   unlink(stash);
