@@ -83,6 +83,12 @@ cmp -s <(unfold sample) <(unfold back) || bad "the passwords did not come back"
 ldif --to aes256 --keys C --new-keys A --in b > out
 expectCode "wrong keys" 4 $?
 cmp -s b out || bad "values were made anew with the wrong keys: $(diff b out | grep -c '^<') lines"
+cmp -s <(sed -n 's/^ldappw: line \([0-9]*\): uid=.*/\1/p' err) <(grep -ni '^userpassword' b | cut -d: -f1) ||
+  bad "the values that do not open are not listed by their lines"
+printf 'dn: a\nuserPassword: %0800d\n' 0 > in # a value of it is too long for the server's check
+ldif --to aes256 --new-keys A --in in > out
+expectCode "a value that does not verify" 3 $?
+cmp -s in out || bad "a value that does not verify was written"
 ldif --to qveil --keys B --allow-binary --in b --out q
 expectCode "longer than qveil holds" 3 $?
 kept=$(unfold q | grep -ci '^userpassword: {AES256}') long=$(grep -c 'more bytes than' err)

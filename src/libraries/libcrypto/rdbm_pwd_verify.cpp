@@ -273,7 +273,9 @@ int unformat_password(const char* value, char** clear, AesKeyData* keyData, int*
 }
 
 int morva_decodePW(char** clear, const char* value, AesKeyData* keyData) noexcept {
-  if (clear == nullptr || value == nullptr) return LDAPPW_OPERATIONS_ERROR;
+  if (clear == nullptr) return LDAPPW_OPERATIONS_ERROR;
+  *clear = nullptr;
+  if (value == nullptr) return LDAPPW_OPERATIONS_ERROR;
   const size_t length = std::strlen(value);
   char* result = nullptr;
   int rc = LDAPPW_SUCCESS;
