@@ -263,14 +263,16 @@ TEST(SaltedAndUnsalted, ReportProviderFailuresInTheirOwnWords) {
       {1, {"Error - saltedHashEncrypt: Invalid parameter. rc = 1\n"}, noName},
       {1, {"Error - saltedHashEncrypt: initQelCrypto() failed. rc = 1\n"}, withoutProvider()},
       {1, {"Error - saltedHashEncrypt: initQelDigest() failed. rc = 1\n"}, unknown},
-      {90, {"Error - saltedHashEncrypt: calloc() returned NULL. rc = 90\n"}, failingAllocation(0)},
+      {90,
+       {"Error - saltedHashEncrypt: calloc() returned NULL. rc = 90\n"},
+       both(replacing(pQEL_EVP_MD_size, [](auto...) { return 400; }), failingAllocation(0))},
       {1, {"Error - saltedHashEncrypt: QEL_RAND_bytes() failed. rc = 1\n"}, replacing(pQEL_RAND_bytes, zero)},
       {1, {"Error - saltedHashEncrypt: QEL_RAND_bytes() failed. rc = 1\n"}, replacing(pQEL_RAND_bytes, two)},
       {1, {"Error - saltedHashEncrypt: QEL_EVP_DigestInit() failed. rc = 1\n"}, initGives2},
       {1, {"Error - saltedHashEncrypt: QEL_EVP_DigestUpdate() failed. rc = 1\n"}, updateGives2},
       {1, {"Error - saltedHashEncrypt: QEL_EVP_DigestUpdate() failed. rc = 1\n"}, secondUpdate},
       {1, {"Error - saltedHashEncrypt: QEL_EVP_DigestFinal() failed. rc = 1\n"}, finalGives2},
-      {1, {"Error - saltedHashEncrypt: binaryBlobToBase64() returned NULL. rc = 1\n"}, failingAllocation(1)},
+      {1, {"Error - saltedHashEncrypt: binaryBlobToBase64() returned NULL. rc = 1\n"}, failingAllocation(0)},
   };
   const std::vector<FailureCase> verifying = {
       {1, {"Error - saltedHashVerify: Invalid parameter. rc = 1\n"}, noName},
@@ -290,10 +292,12 @@ TEST(SaltedAndUnsalted, ReportProviderFailuresInTheirOwnWords) {
   const std::vector<FailureCase> unsalted = {
       {1, {"Error - unsaltedHashEncrypt: initQelDigest() failed"}, unknown},
       {1, {"Error - unsaltedHashEncrypt: QEL_EVP_DigestInit() failed"}, replacing(pQEL_EVP_DigestInit, zero)},
-      {90, {"Error - unsaltedHashEncrypt : calloc() failed\n"}, failingAllocation(0)},
+      {90,
+       {"Error - unsaltedHashEncrypt : calloc() failed\n"},
+       both(replacing(pQEL_EVP_MD_size, [](auto...) { return 400; }), failingAllocation(0))},
       {1, {"Error - unsaltedHashEncrypt: QEL_EVP_DigestUpdate() failed"}, replacing(pQEL_EVP_DigestUpdate, zero)},
       {1, {"Error - unsaltedHashEncrypt: QEL_EVP_DigestFinal() failed"}, replacing(pQEL_EVP_DigestFinal, zero)},
-      {1, {"Error - unsaltedHashEncrypt: binaryBlobToBase64()returned NULL. rc = 1\n"}, failingAllocation(1)},
+      {1, {"Error - unsaltedHashEncrypt: binaryBlobToBase64()returned NULL. rc = 1\n"}, failingAllocation(0)},
   };
   const auto emptied = [&](int rc) { return call.out == nullptr ? rc : -1; };
   expectFailures(encrypting, LDTR_DEBUG, [&] { return emptied(call.encrypt()); });

@@ -6,6 +6,7 @@
 #include "aes_keys.h"
 #include "base64.h"
 #include "qel_utils.h"
+#include "text_target.h"
 #include "trace_scope.h"
 
 namespace ldappw {
@@ -81,24 +82,17 @@ int decipher(TracedCall& call, void* qelCtx, const CipherContext& cipher, const 
 }
 
 }  // namespace
-}  // namespace ldappw
 
-using namespace ldappw;
-
-extern "C" {
-
-// Documented in aes_keys.h.
-
-int aesEncryptBuffer(const char* clear, char** out, const char* cipherName, const SecBuffer* key, const SecBuffer* iv,
-                     int clearLength) noexcept {
-  TracedCall call{kEncrypt, "clear", clear, "out", out, "cipherName", cipherName, "key", key, "iv", iv};
-  if (clear == nullptr || out == nullptr || cipherName == nullptr || key == nullptr || iv == nullptr ||
+int aesEncryptTo(TextTarget& target, const char* clear, const char* cipherName, const SecBuffer* key,
+                 const SecBuffer* iv, int clearLength) noexcept {
+  TracedCall call{kEncrypt, "clear", clear, "out", target.slot(), "cipherName", cipherName, "key", key, "iv", iv};
+  if (clear == nullptr || target.slot() == nullptr || cipherName == nullptr || key == nullptr || iv == nullptr ||
       clearLength < 0) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   }
   void* qelCtx = nullptr;
   if (const int rc = initQelCrypto(&qelCtx); rc != 0) return call.fail(rc, "initQelCrypto() failed.");
-  OutGuard result{out};
+  target.claim();
   CipherContext cipher(qelCtx);
   if (const int rc = cipher.init(cipherName); rc != 0) return call.fail(rc, "initQelCipher() failed.");
 
@@ -115,10 +109,24 @@ int aesEncryptBuffer(const char* clear, char** out, const char* cipherName, cons
   }
   int rawLength = 0;
   if (const int rc = encipher(call, qelCtx, cipher, clear, clearLength, raw.get(), rawLength); rc != 0) return rc;
-  char* text = binaryBlobToBase64(raw.get(), rawLength);
-  if (text == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "binaryBlobToBase64() returned NULL.");
-  result.keep(text);
+  if (!target.write(raw.get(), static_cast<size_t>(rawLength))) {
+    return call.fail(LDAPPW_OPERATIONS_ERROR, "binaryBlobToBase64() returned NULL.");
+  }
   return call.leave(LDAPPW_SUCCESS);
+}
+
+}  // namespace ldappw
+
+using namespace ldappw;
+
+extern "C" {
+
+// Documented in aes_keys.h.
+
+int aesEncryptBuffer(const char* clear, char** out, const char* cipherName, const SecBuffer* key, const SecBuffer* iv,
+                     int clearLength) noexcept {
+  TextTarget target(out);
+  return aesEncryptTo(target, clear, cipherName, key, iv, clearLength);
 }
 
 int aesDecryptBuffer(const char* text, char** out, const char* cipherName, const SecBuffer* key, const SecBuffer* iv,

@@ -23,7 +23,7 @@ struct DecodedText {
 // Decodes a text into decodedRoom(length) bytes.
 DecodedText decodeText(const char* text, size_t length, const char* alphabet, unsigned char* out) noexcept;
 
-// Encodes bytes, with a NUL after them, and returns the number of characters.
+// Encodes bytes, without a NUL after them, and returns the number of characters.
 size_t encodeBytes(const unsigned char* data, size_t bytes, const char* alphabet, char* out) noexcept;
 
 // Whether an alphabet has all its 64 characters.

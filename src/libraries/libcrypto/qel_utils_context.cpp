@@ -1,11 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 // The one process-wide provider context, and cipher and digest contexts over it.
-#include <pthread.h>
-
 #include <cstddef>
 #include <cstdio>
 #include <cstdlib>
 
+#include "mutex_lock.h"
 #include "qel_utils.h"
 #include "trace_scope.h"
 
@@ -74,20 +73,12 @@ constexpr ContextKind kDigest{{"initQelDigest", operationScope(moduleId(kQelUtil
 // Serialises the creation of the provider context.
 pthread_mutex_t creationMutex = PTHREAD_MUTEX_INITIALIZER;
 
-class CreationLock {
- public:
-  CreationLock() noexcept { pthread_mutex_lock(&creationMutex); }
-  ~CreationLock() { pthread_mutex_unlock(&creationMutex); }
-  CreationLock(const CreationLock&) = delete;
-  CreationLock& operator=(const CreationLock&) = delete;
-};
-
 void* currentContext() noexcept {
   return __atomic_load_n(&qelCtxGlobal, __ATOMIC_ACQUIRE);
 }
 
 // Loads the provider and makes the context; under the lock.
-int createProviderContext(TracedCall& call) noexcept {
+[[gnu::cold]] int createProviderContext(TracedCall& call) noexcept {
   QelStatus status{};
   char* loadedPath = nullptr;
   const int rc = loadQelCrypto(&loadedPath);
@@ -155,7 +146,7 @@ int initQelCrypto(void** qelCtx) noexcept {
   if (qelCtx == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   void* context = currentContext();
   if (__builtin_expect(context == nullptr, 0)) {
-    const CreationLock lock;
+    const MutexLock lock(creationMutex);
     if (currentContext() == nullptr) {
       if (const int rc = createProviderContext(call); rc != LDAPPW_SUCCESS) return rc;
     }

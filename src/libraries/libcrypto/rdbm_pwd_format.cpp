@@ -1,14 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 // Making stored values: the scheme table and one payload maker a scheme.
-#include <pthread.h>
-
 #include <cstring>
 
-#include "base64.h"
 #include "crypt_state.h"
+#include "mutex_lock.h"
 #include "owners.h"
 #include "password_schemes.h"
 #include "rdbm_pwd_schemes.h"
+#include "text_target.h"
 
 namespace ldappw {
 namespace {
@@ -25,20 +24,6 @@ constexpr size_t kFormattedSha = 33;
 
 // _crypt works on one process-wide state; this is the library's only lock on the way of passwords.
 pthread_mutex_t cryptMutex = PTHREAD_MUTEX_INITIALIZER;
-
-class CryptLock {
- public:
-  CryptLock() noexcept { pthread_mutex_lock(&cryptMutex); }
-  ~CryptLock() { pthread_mutex_unlock(&cryptMutex); }
-  CryptLock(const CryptLock&) = delete;
-  CryptLock& operator=(const CryptLock&) = delete;
-};
-
-size_t copyPayload(const char* text, char* payload) noexcept {
-  const size_t length = std::strlen(text);
-  std::memcpy(payload, text, length);
-  return length;
-}
 
 // Bytes of the clear text from offset on, zeros where there are none.
 void takeFixed(unsigned char* to, size_t bytes, const FormatRequest& request, size_t offset) noexcept {
@@ -79,33 +64,29 @@ size_t makeSha(TracedCall& call, const Scheme& scheme, const FormatRequest& requ
   } else if (!digestClear(request, digest)) {
     return 0;
   }
-  if (!isWholeAlphabet(pBase64)) return 0;
-  char text[encodedRoom(kDigestBytes)];
-  const size_t length = encodeBytes(digestBytes, kDigestBytes, pBase64, text);
-  std::memcpy(payload, text, length);  // without the NUL, for which there may be no room
-  return length;
+  TextTarget target(payload);
+  return target.write(digestBytes, kDigestBytes) ? target.length() : 0;
+}
+
+// What the digests of the provider take: the clear text up to a first NUL.
+size_t bytesBeforeNul(const FormatRequest& request) noexcept {
+  return strnlen(request.clear, request.clearBytes);
 }
 
 size_t makeMd5(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
-  SecretText clear(request.clear, request.clearBytes);
-  char* made = nullptr;
-  if (!clear || unsaltedHashEncrypt("md5", clear.get(), &made) != 0) return 0;
-  const PlainOwner<char> text(made);
-  return copyPayload(text.get(), payload);
+  TextTarget target(payload);
+  return unsaltedHashTo(target, "md5", request.clear, bytesBeforeNul(request)) == 0 ? target.length() : 0;
 }
 
 size_t makeSsha(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
-  SecretText clear(request.clear, request.clearBytes);
-  char* made = nullptr;
-  if (!clear || saltedHashEncrypt(clear.get(), &made, "SHA1") != 0) return 0;
-  const PlainOwner<char> text(made);
-  return copyPayload(text.get(), payload);
+  TextTarget target(payload);
+  return saltedHashTo(target, request.clear, bytesBeforeNul(request), "SHA1") == 0 ? target.length() : 0;
 }
 
 size_t makeCrypt(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
   SecretArray<kCryptKeySize> key;
   takeFixed(key.data(), kCryptKeySize - 1, request, 0);
-  const CryptLock lock;
+  const MutexLock lock(cryptMutex);
   std::memcpy(payload, _crypt(key.text(), request.salt), kCryptCharacters);
   wipeCryptState();
   return kCryptCharacters;
@@ -124,13 +105,11 @@ size_t makeMasked(TracedCall&, const Scheme&, const FormatRequest& request, char
 
 size_t makeAes(TracedCall&, const Scheme& scheme, const FormatRequest& request, char* payload) noexcept {
   if (request.keyData == nullptr) return 0;
-  char* made = nullptr;
+  TextTarget target(payload);
   const int rc =
-      aesEncryptBuffer(request.clear, &made, g_CipherName[scheme.keyIndex], &request.keyData->aesKeys[scheme.keyIndex],
-                       &request.keyData->cryptoSalt, static_cast<int>(request.clearBytes));
-  if (rc != 0) return 0;
-  const PlainOwner<char> text(made);
-  return copyPayload(text.get(), payload);
+      aesEncryptTo(target, request.clear, g_CipherName[scheme.keyIndex], &request.keyData->aesKeys[scheme.keyIndex],
+                   &request.keyData->cryptoSalt, static_cast<int>(request.clearBytes));
+  return rc == 0 ? target.length() : 0;
 }
 
 constexpr int kNoKey = -1;

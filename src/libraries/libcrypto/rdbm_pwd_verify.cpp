@@ -6,6 +6,7 @@
 #include "owners.h"
 #include "password_schemes.h"
 #include "rdbm_pwd_schemes.h"
+#include "text_target.h"
 
 namespace ldappw {
 namespace {
@@ -16,7 +17,8 @@ constexpr TraceInfo kUnformatPassword = passwordOperation("unformat_password", k
 
 constexpr int kNotCompared = 99;
 constexpr size_t kWorkSize = 1024;
-constexpr size_t kLeading = 46;  // what is compared of two values of one scheme, and of unmasked texts
+constexpr size_t kFixedRoom = 192;  // more than the longest value of fixed length
+constexpr size_t kLeading = 46;     // what is compared of two values of one scheme, and of unmasked texts
 constexpr size_t kMaskedTag = sizeof qVEIL_BRACED;
 constexpr size_t kMaskedCharacters = 164;
 constexpr size_t kLongestUnmasked = 170;
@@ -72,16 +74,16 @@ class WorkBuffer {
   Text formatLike(const Text& clear, int scheme, const Text& value, AesKeyData* keyData) noexcept {
     CryptSalt salt(value);
     char* saltText = scheme == FORMAT_CRYPT ? salt.characters : nullptr;
-    length_ = static_cast<size_t>(
-        format_password(scheme, saltText, keyData, clear.data, static_cast<int>(clear.length), bytes_, sizeof bytes_));
+    length_ = static_cast<size_t>(format_password(scheme, saltText, keyData, clear.data, static_cast<int>(clear.length),
+                                                  bytes_, roomFor(scheme)));
     return {bytes_, length_};
   }
 
  private:
-  // What does not fit beside the value cannot match it, so there is no need to clear more.
-  static int roomFor(const Text& value) noexcept {
-    constexpr size_t kLeast = 64;  // the longest value of a fixed-length digest, and its NUL
-    return static_cast<int>(std::min(kWorkSize, std::max(kLeast, value.length + 1)));
+  // format_password clears its whole buffer, so it is told of no more than a value of fixed length needs.
+  static int roomFor(int scheme) noexcept {
+    const Scheme* row = findScheme(scheme);
+    return static_cast<int>(row != nullptr && row->fixedLength != kMeasured ? kFixedRoom : kWorkSize);
   }
 
   char bytes_[kWorkSize];
@@ -101,11 +103,9 @@ int compareLeading(const Comparison& c) noexcept {
 }
 
 int saltedVerify(const Text& clear, const Text& value) noexcept {
-  const Text payloadText = behind(value, sizeof SSHA_BRACED);
-  SecretText password(clear.data, clear.length);
-  PlainText payload(payloadText.data, payloadText.length);
-  if (!password || !payload) return kNotCompared;
-  return saltedHashVerify(password.get(), payload.get(), kSaltedDigest);
+  const Text payload = behind(value, sizeof SSHA_BRACED);
+  return saltedHashCheck(clear.data, strnlen(clear.data, clear.length), payload.data,
+                         strnlen(payload.data, payload.length), kSaltedDigest);
 }
 
 int verifySalted(const Comparison& c) noexcept {

@@ -81,17 +81,17 @@ class TracedCall {
   }
 
   // "Error - <name>: <what> rc = <rc>\n"
-  int fail(int rc, const char* what) noexcept { return failShowing(rc, what, rc); }
+  [[gnu::cold]] int fail(int rc, const char* what) noexcept { return failShowing(rc, what, rc); }
 
   // The same with another value shown than the one returned.
-  int failShowing(int rc, const char* what, int shown) noexcept {
+  [[gnu::cold]] int failShowing(int rc, const char* what, int shown) noexcept {
     if (__builtin_expect(scope_.debugOn(), 0)) writeFailure(what, shown);
     return leave(rc);
   }
 
   // A line that departs from the usual shape, whole.
   template <class... Values>
-  int failText(int rc, const char* format, Values... values) noexcept {
+  [[gnu::cold]] int failText(int rc, const char* format, Values... values) noexcept {
     line(info_.failures, format, values...);
     return leave(rc);
   }
@@ -104,9 +104,9 @@ class TracedCall {
   }
 
  private:
-  void writeEntering(const void* const* pairs, size_t count) noexcept;
-  void writeLeaving() noexcept;
-  void writeFailure(const char* what, int shown) noexcept;
+  [[gnu::cold]] void writeEntering(const void* const* pairs, size_t count) noexcept;
+  [[gnu::cold]] void writeLeaving() noexcept;
+  [[gnu::cold]] void writeFailure(const char* what, int shown) noexcept;
 
   const TraceInfo& info_;
   ldtr_function_local scope_;

@@ -5,6 +5,7 @@
 
 #include "password_schemes.h"
 #include "qel_utils.h"
+#include "text_target.h"
 #include "trace_scope.h"
 
 namespace ldappw {
@@ -17,18 +18,13 @@ constexpr TraceInfo kEncrypt{"unsaltedHashEncrypt",
                              nullptr,
                              "unsaltedHashEncrypt: Leaving. rc=%d\n"};
 
+constexpr size_t kUsualDigest = 64;  // what needs no allocation
+
 }  // namespace
-}  // namespace ldappw
 
-using namespace ldappw;
-
-extern "C" {
-
-// Documented in password_schemes.h.
-
-int unsaltedHashEncrypt(const char* digestName, const char* clear, char** out) noexcept {
+int unsaltedHashTo(TextTarget& target, const char* digestName, const char* clear, size_t clearBytes) noexcept {
   TracedCall call{kEncrypt};
-  if (clear == nullptr || out == nullptr) return call.leave(LDAPPW_OPERATIONS_ERROR);
+  if (clear == nullptr || target.slot() == nullptr) return call.leave(LDAPPW_OPERATIONS_ERROR);
   void* qelCtx = nullptr;
   if (const int rc = initQelCrypto(&qelCtx); rc != 0) return call.leave(rc);
   DigestContext digest(qelCtx);
@@ -38,25 +34,37 @@ int unsaltedHashEncrypt(const char* digestName, const char* clear, char** out) n
   if (pQEL_EVP_DigestInit(qelCtx, digest.get(), digest.algorithm()) == 0) {
     return call.failText(LDAPPW_OPERATIONS_ERROR, "Error - unsaltedHashEncrypt: QEL_EVP_DigestInit() failed");
   }
-  OutGuard result{out};
+  target.claim();
   const int size = pQEL_EVP_MD_size(qelCtx, digest.algorithm());
-  *out = size < 0 ? nullptr : zeroedBytes<char>(static_cast<size_t>(size));
-  if (*out == nullptr) return call.failText(LDAPPW_NO_MEMORY, "Error - unsaltedHashEncrypt : calloc() failed\n");
-  auto* raw = reinterpret_cast<unsigned char*>(*out);
-  if (pQEL_EVP_DigestUpdate(qelCtx, digest.get(), clear, static_cast<unsigned>(std::strlen(clear))) == 0) {
+  const size_t bytes = size < 0 ? 0 : static_cast<size_t>(size);
+  SecretBytes<kUsualDigest> raw(bytes);
+  if (size < 0 || !raw) return call.failText(LDAPPW_NO_MEMORY, "Error - unsaltedHashEncrypt : calloc() failed\n");
+  std::memset(raw.get(), 0, bytes);
+  if (pQEL_EVP_DigestUpdate(qelCtx, digest.get(), clear, static_cast<unsigned>(clearBytes)) == 0) {
     return call.failText(LDAPPW_OPERATIONS_ERROR, "Error - unsaltedHashEncrypt: QEL_EVP_DigestUpdate() failed");
   }
-  if (pQEL_EVP_DigestFinal(qelCtx, digest.get(), raw, nullptr) == 0) {
+  if (pQEL_EVP_DigestFinal(qelCtx, digest.get(), raw.get(), nullptr) == 0) {
     return call.failText(LDAPPW_OPERATIONS_ERROR, "Error - unsaltedHashEncrypt: QEL_EVP_DigestFinal() failed");
   }
-  char* text = binaryBlobToBase64(raw, size);
-  if (text == nullptr) {
+  if (!target.write(raw.get(), bytes)) {
     return call.failText(LDAPPW_OPERATIONS_ERROR,
                          "Error - unsaltedHashEncrypt: binaryBlobToBase64()returned NULL. rc = %d\n",
                          static_cast<int>(LDAPPW_OPERATIONS_ERROR));
   }
-  result.keep(text);
   return call.leave(LDAPPW_SUCCESS);
+}
+
+}  // namespace ldappw
+
+using namespace ldappw;
+
+extern "C" {
+
+// Documented in password_schemes.h.
+
+int unsaltedHashEncrypt(const char* digestName, const char* clear, char** out) noexcept {
+  TextTarget target(out);
+  return unsaltedHashTo(target, digestName, clear, lengthOf(clear));
 }
 
 }  // extern "C"

@@ -40,14 +40,39 @@ bool isStandard(const char* alphabet) noexcept {
   return alphabet == kStandard || std::strncmp(alphabet, kStandard, kSymbols + 1) == 0;
 }
 
+// The standard alphabet's two characters for each 12 bits.
+struct PairTable {
+  char pairs[kSymbols * kSymbols][2];
+};
+
+constexpr PairTable pairsOf(const char* alphabet) {
+  PairTable table{};
+  for (size_t i = 0; i < kSymbols * kSymbols; ++i) {
+    table.pairs[i][0] = alphabet[i / kSymbols];
+    table.pairs[i][1] = alphabet[i % kSymbols];
+  }
+  return table;
+}
+
+constexpr PairTable kStandardPairs = pairsOf(kStandard);
+
+// The 24 bits of a whole group.
+inline unsigned groupOf(const unsigned char* in) noexcept {
+  return unsigned{in[0]} << 16U | unsigned{in[1]} << 8U | in[2];
+}
+
+inline void encodeStandardGroup(const unsigned char* in, char* out) noexcept {
+  const unsigned group = groupOf(in);
+  std::memcpy(out, kStandardPairs.pairs[group >> 12U], 2);
+  std::memcpy(out + 2, kStandardPairs.pairs[group & 4095U], 2);
+}
+
 inline void encodeWholeGroup(const unsigned char* in, char* out, const char* alphabet) noexcept {
-  const unsigned first = in[0];
-  const unsigned second = in[1];
-  const unsigned third = in[2];
-  out[0] = alphabet[first >> 2U];
-  out[1] = alphabet[(first & 3U) << 4U | second >> 4U];
-  out[2] = alphabet[(second & 15U) << 2U | third >> 6U];
-  out[3] = alphabet[third & 63U];
+  const unsigned group = groupOf(in);
+  out[0] = alphabet[group >> 18U];
+  out[1] = alphabet[(group >> 12U) & 63U];
+  out[2] = alphabet[(group >> 6U) & 63U];
+  out[3] = alphabet[group & 63U];
 }
 
 // The group of the last one or two bytes.
@@ -79,27 +104,12 @@ unsigned decodeGroup(const char* in, unsigned char* out, const PlaceTable& table
   return bytes;
 }
 
-// Whole groups without a pad or a foreign character take the short way; the first other group ends it.
-size_t decodeCleanGroups(const char* text, size_t groups, unsigned char* out, const PlaceTable& table) noexcept {
-  size_t group = 0;
-  for (; group < groups; ++group, text += 4, out += 3) {
-    const unsigned a = table.places[static_cast<unsigned char>(text[0])];
-    const unsigned b = table.places[static_cast<unsigned char>(text[1])];
-    const unsigned c = table.places[static_cast<unsigned char>(text[2])];
-    const unsigned d = table.places[static_cast<unsigned char>(text[3])];
-    if ((a | b | c | d) >= kSymbols) break;
-    // Big-endian, in one store: the fourth byte is the next group's, or the terminator's.
-    const uint32_t bytes = __builtin_bswap32(a << 26U | b << 20U | c << 14U | d << 8U);
-    std::memcpy(out, &bytes, sizeof bytes);
-  }
-  return group;
-}
-
-DecodedText decodeGroups(const char* text, size_t length, unsigned char* out, const PlaceTable& table) noexcept {
-  const size_t clean = decodeCleanGroups(text, length / 4, out, table);
-  DecodedText result{clean * 3, true};
-  out += clean * 3;
-  size_t at = clean * 4;
+// Decodes what follows the groups that are done already.
+DecodedText decodeGroups(const char* text, size_t length, unsigned char* out, const PlaceTable& table,
+                         size_t done) noexcept {
+  DecodedText result{done * 3, true};
+  out += done * 3;
+  size_t at = done * 4;
   for (; at + 4 <= length; at += 4, out += 3) result.bytes += decodeGroup(text + at, out, table, result.isClean);
   if (at < length) {
     char group[4] = {};  // what a short last group lacks counts as the terminator
@@ -109,27 +119,92 @@ DecodedText decodeGroups(const char* text, size_t length, unsigned char* out, co
   return result;
 }
 
+// What each character of the standard alphabet adds to a group of 24 bits, for its four positions. The flags above
+// those tell what is no character of it, and where a pad is.
+struct GroupTable {
+  uint32_t parts[4][256];
+};
+
+constexpr uint32_t kForeign = 1U << 24U;
+constexpr uint32_t kPadAtThird = 1U << 25U;
+constexpr uint32_t kPadAtFourth = 1U << 26U;
+
+constexpr GroupTable partsOf(const PlaceTable& table) {
+  GroupTable groups{};
+  for (unsigned position = 0; position < 4; ++position) {
+    for (unsigned c = 0; c < 256; ++c) {
+      const uint32_t place = table.places[c];
+      groups.parts[position][c] = place < kSymbols ? place << (6 * (3 - position)) : kForeign;
+    }
+  }
+  groups.parts[2][static_cast<unsigned char>(kPad)] = kPadAtThird;
+  groups.parts[3][static_cast<unsigned char>(kPad)] = kPadAtFourth;
+  return groups;
+}
+
+constexpr GroupTable kStandardGroups = partsOf(kStandardPlaces);
+
+inline uint32_t groupAt(const char* text) noexcept {
+  const auto* in = reinterpret_cast<const unsigned char*>(text);
+  const auto& parts = kStandardGroups.parts;
+  return parts[0][in[0]] | parts[1][in[1]] | parts[2][in[2]] | parts[3][in[3]];
+}
+
+// Big-endian, in one store: the fourth byte is the next group's, or the terminator's.
+inline void storeGroup(uint32_t group, unsigned char* out) noexcept {
+  const uint32_t bytes = __builtin_bswap32(group << 8U);
+  std::memcpy(out, &bytes, sizeof bytes);
+}
+
+// Texts of the standard alphabet: whole groups and a last one with its pads take the short way, all else the long one.
+DecodedText decodeStandard(const char* text, size_t length, unsigned char* out) noexcept {
+  const size_t groups = length / 4;
+  size_t done = 0;
+  uint32_t group = 0;
+  for (; done < groups; ++done) {
+    group = groupAt(text + done * 4);
+    if (group >= kForeign) break;
+    storeGroup(group, out + done * 3);
+  }
+  if (done * 4 == length) return {done * 3, true};
+  if ((done + 1) * 4 == length && (group & ~0xffffffU) == kPadAtFourth) {
+    storeGroup(group & 0xffff00U, out + done * 3);
+    return {done * 3 + 2, true};
+  }
+  if ((done + 1) * 4 == length && (group & ~0xffffffU) == (kPadAtThird | kPadAtFourth)) {
+    storeGroup(group & 0xff0000U, out + done * 3);
+    return {done * 3 + 1, true};
+  }
+  return decodeGroups(text, length, out, kStandardPlaces, done);
+}
+
 }  // namespace
 
 DecodedText decodeText(const char* text, size_t length, const char* alphabet, unsigned char* out) noexcept {
-  if (isStandard(alphabet)) return decodeGroups(text, length, out, kStandardPlaces);
-  return decodeGroups(text, length, out, placesOf(alphabet, std::strlen(alphabet)));
+  if (!isStandard(alphabet)) return decodeGroups(text, length, out, placesOf(alphabet, std::strlen(alphabet)), 0);
+  return decodeStandard(text, length, out);
 }
 
 size_t encodeBytes(const unsigned char* data, size_t bytes, const char* alphabet, char* out) noexcept {
   const char* const begin = out;
+  const bool standard = isStandard(alphabet);
   size_t at = 0;
-  for (; at + 3 <= bytes; at += 3, out += 4) encodeWholeGroup(data + at, out, alphabet);
+  for (; at + 3 <= bytes; at += 3, out += 4) {
+    if (standard) {
+      encodeStandardGroup(data + at, out);
+    } else {
+      encodeWholeGroup(data + at, out, alphabet);
+    }
+  }
   if (at < bytes) {
     encodeShortGroup(data + at, out, bytes - at, alphabet);
     out += 4;
   }
-  *out = '\0';
   return static_cast<size_t>(out - begin);
 }
 
 bool isWholeAlphabet(const char* alphabet) noexcept {
-  return std::memchr(alphabet, '\0', kSymbols) == nullptr;
+  return isStandard(alphabet) || std::memchr(alphabet, '\0', kSymbols) == nullptr;
 }
 
 }  // namespace ldappw
@@ -147,7 +222,7 @@ char* binaryBlobToString(const unsigned char* data, int length, const char* alph
   if (alphabet == nullptr || (data == nullptr && length > 0) || !isWholeAlphabet(alphabet)) return nullptr;
   const size_t bytes = length > 0 ? static_cast<size_t>(length) : 0;
   char* text = static_cast<char*>(std::malloc(encodedRoom(bytes)));
-  if (text != nullptr) encodeBytes(data, bytes, alphabet, text);
+  if (text != nullptr) text[encodeBytes(data, bytes, alphabet, text)] = '\0';
   return text;
 }
 

@@ -31,11 +31,11 @@ inline int compareBytes(const void* left, const void* right, size_t bytes) noexc
 inline bool equalBytes(const void* left, const void* right, size_t bytes) noexcept {
   const auto* a = static_cast<const unsigned char*>(left);
   const auto* b = static_cast<const unsigned char*>(right);
-  uint64_t differences = 0;
+  uint32_t differences = 0;
   size_t i = 0;
-  for (; i + sizeof(uint64_t) <= bytes; i += sizeof(uint64_t)) {
-    uint64_t wordA = 0;
-    uint64_t wordB = 0;
+  for (; i + sizeof(uint32_t) <= bytes; i += sizeof(uint32_t)) {  // the width in which digests are written
+    uint32_t wordA = 0;
+    uint32_t wordB = 0;
     std::memcpy(&wordA, a + i, sizeof wordA);
     std::memcpy(&wordB, b + i, sizeof wordB);
     differences |= wordA ^ wordB;

@@ -14,8 +14,10 @@
 #if defined(__GNUC__)
 #define LDTR_API __attribute__((visibility("default")))
 #define LDTR_PRINTF(formatAt, valuesAt) __attribute__((format(printf, formatAt, valuesAt)))
+#define LDTR_COLD __attribute__((cold))
 #else
 #define LDTR_API
+#define LDTR_COLD
 #define LDTR_PRINTF(formatAt, valuesAt)
 #endif
 
@@ -52,8 +54,8 @@ LDTR_API void ldtr_set_sink(void (*sink)(const struct ldtr_record*, void* user),
 /* Hands one record to the sink, whatever trcEvents says. */
 LDTR_API void ldtr_write(const struct ldtr_record* record);
 
-LDTR_API void ldtr_write_entry(const struct ldtr_scope* scope);
-LDTR_API void ldtr_write_exit(const struct ldtr_scope* scope, int rc);
+LDTR_COLD LDTR_API void ldtr_write_entry(const struct ldtr_scope* scope);
+LDTR_COLD LDTR_API void ldtr_write_exit(const struct ldtr_scope* scope, int rc);
 
 /* Writes one printf-style line of the class severity, inside a scope or without one. The caller tests the debug bit. */
 LDTR_API void ldtr_formater_local(const struct ldtr_scope* scope, int severity, const char* format, ...)

@@ -86,7 +86,7 @@ SlotOf<Kind>* fetchSlot(const Call& call, ProviderContext& provider, const Folde
 }
 
 template <typename Kind>
-SlotOf<Kind>* findName(const Call& call, ProviderContext& provider, const char* name) noexcept {
+[[gnu::cold]] SlotOf<Kind>* findName(const Call& call, ProviderContext& provider, const char* name) noexcept {
   if (name == nullptr) {
     call.failNull("the algorithm name is null");
     return nullptr;

@@ -13,8 +13,8 @@ CipherPool::Slot* findCipher(const Call& call, const char* name) noexcept;
 
 // OpenSSL's algorithm for a replica that is not there yet; the first one when it cannot be had. The slot belongs to the
 // provider context of the call.
-EVP_MD* addReplica(const Call& call, DigestPool::Slot& slot, unsigned replica) noexcept;
-EVP_CIPHER* addReplica(const Call& call, CipherPool::Slot& slot, unsigned replica) noexcept;
+[[gnu::cold]] EVP_MD* addReplica(const Call& call, DigestPool::Slot& slot, unsigned replica) noexcept;
+[[gnu::cold]] EVP_CIPHER* addReplica(const Call& call, CipherPool::Slot& slot, unsigned replica) noexcept;
 
 // OpenSSL's algorithm for contexts of this replica.
 template <typename Slot>

@@ -60,7 +60,7 @@ int start(const QEL_CTX* ctx, const QEL_CIPHER_CTX* cipherCtx, const QEL_CIPHER*
 }
 
 // Whether a context may be used after its final step, which is OpenSSL's to judge when the checks are not strict.
-bool mayGoOn(const Call& call, const CipherContext& context) noexcept {
+[[gnu::cold]] bool mayGoOn(const Call& call, const CipherContext& context) noexcept {
   const ProviderPool::Slot* slot = context.phase == Phase::kStopped ? call.open() : nullptr;
   return slot != nullptr && !slot->value.context->strict.load(std::memory_order_relaxed);
 }

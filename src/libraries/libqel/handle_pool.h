@@ -121,7 +121,7 @@ class HandlePool {
     return static_cast<std::uintptr_t>((place * kHandleKinds + Kind) * kGolden >> 32);
   }
 
-  Slot* takeShared() noexcept {
+  [[gnu::cold]] Slot* takeShared() noexcept {
     std::lock_guard<std::mutex> lock{mutex_};
     if (free_ == nullptr && !grow()) return nullptr;
     Slot* slot = free_;
@@ -129,7 +129,7 @@ class HandlePool {
     return slot;
   }
 
-  void giveShared(Slot& slot) noexcept {
+  [[gnu::cold]] void giveShared(Slot& slot) noexcept {
     std::lock_guard<std::mutex> lock{mutex_};
     slot.next = free_;
     free_ = &slot;

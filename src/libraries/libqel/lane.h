@@ -42,7 +42,7 @@ struct alignas(kCacheLine) Lane {
 
 extern pthread_key_t laneKey;
 
-Lane* enterLane() noexcept;
+[[gnu::cold]] Lane* enterLane() noexcept;
 
 // The calling thread's lane, or null when there is no memory for one: everything works without, only slower, and
 // failures are not remembered.

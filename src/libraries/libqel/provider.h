@@ -144,8 +144,9 @@ Handle* handleOf(std::uintptr_t value) noexcept {
 
 // The failures of a Call. They take its parts one by one, so that a call that succeeds stays in registers. An invalid
 // provider context is the failure, whatever is wrong with the handle of an object.
-int failCall(std::uintptr_t context, QelStatus* status, QelReason reason, const char* text) noexcept;
-int failCallHandle(std::uintptr_t context, QelStatus* status, std::uintptr_t handle, const char* text) noexcept;
+[[gnu::cold]] int failCall(std::uintptr_t context, QelStatus* status, QelReason reason, const char* text) noexcept;
+[[gnu::cold]] int failCallHandle(std::uintptr_t context, QelStatus* status, std::uintptr_t handle,
+                                 const char* text) noexcept;
 
 class Call {
  public:
@@ -176,17 +177,19 @@ class Call {
   }
 
   // Record a failure and return 0, the second one with OpenSSL's reason.
-  int fail(QelReason reason, const char* text) const noexcept { return failCall(handle_, status_, reason, text); }
-  int failOpenssl(QelReason reason, const char* text) const noexcept {
+  [[gnu::cold]] int fail(QelReason reason, const char* text) const noexcept {
+    return failCall(handle_, status_, reason, text);
+  }
+  [[gnu::cold]] int failOpenssl(QelReason reason, const char* text) const noexcept {
     recordFailure(handle_, status_, reason, Source::kOpenssl, text);
     return 0;
   }
-  int failNull(const char* text) const noexcept { return fail(QEL_REASON_NULL_ARGUMENT, text); }
+  [[gnu::cold]] int failNull(const char* text) const noexcept { return fail(QEL_REASON_NULL_ARGUMENT, text); }
 
   static constexpr const char* kForeignContext = "not a live provider context";
 
  private:
-  int failHandle(std::uintptr_t handle, const char* text) const noexcept {
+  [[gnu::cold]] int failHandle(std::uintptr_t handle, const char* text) const noexcept {
     return failCallHandle(handle_, status_, handle, text);
   }
 
