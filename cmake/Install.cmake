@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
-# What an installed tree needs beside the targets: the package files of CMake and pkg-config, and the Debian packages. The
-# tree may be moved as a whole.
+# What an installed tree needs beside the targets: the package files of CMake and pkg-config. The tree may be moved as a
+# whole.
 include(CMakePackageConfigHelpers)
 set(ldappw_package_dir ${CMAKE_INSTALL_LIBDIR}/cmake/ldappw)
 configure_package_config_file(cmake/ldappwConfig.cmake.in ${CMAKE_BINARY_DIR}/ldappwConfig.cmake

@@ -1,0 +1,40 @@
+# SPDX-License-Identifier: Apache-2.0
+# Runs in cpack between the installation into the packages' folders and their packing: adds the documents that every
+# package has, strips the programs, compresses what is to be compressed, and computes what the programs depend on.
+set(root ${CPACK_TEMPORARY_INSTALL_DIRECTORY})
+
+function(run)
+  execute_process(COMMAND ${ARGN} COMMAND_ERROR_IS_FATAL ANY)
+endfunction()
+
+foreach(component IN LISTS CPACK_COMPONENTS_ALL)
+  string(TOUPPER ${component} upper)
+  set(package ${CPACK_DEBIAN_${upper}_PACKAGE_NAME})
+  set(documents ${root}/${component}/usr/share/doc/${package})
+  file(COPY ${CPACK_LDAPPW_DEBIAN}/copyright DESTINATION ${documents})
+  configure_file(${CPACK_LDAPPW_DEBIAN}/changelog ${documents}/changelog.Debian COPYONLY)
+  file(GLOB pages ${root}/${component}/usr/share/man/*/*.[1-9])
+  run(gzip -9n ${documents}/changelog.Debian ${pages})
+endforeach()
+run(chmod -R u=rwX,go=rX ${root})
+file(GLOB libraries ${root}/libs/usr/lib/*/*.so.* ${root}/libs/usr/lib/*/qel/qellib/*.so)
+run(chmod a-x ${libraries})
+run(strip --strip-unneeded -R .comment -R .note ${libraries} ${root}/tool/usr/bin/ldappw)
+
+# The search reads debian/control of the folder that it runs in.
+file(WRITE ${root}/../search/debian/control "Source: ldappw\n\nPackage: ldappw\nArchitecture: any\n")
+list(TRANSFORM CPACK_LDAPPW_LIBRARIES PREPEND -l OUTPUT_VARIABLE folders)
+function(set_depends component programs)
+  string(TOUPPER ${component} upper)
+  execute_process(COMMAND dpkg-shlibdeps -O ${folders} -L${CPACK_LDAPPW_DEBIAN}/shlibs
+                          -x${CPACK_DEBIAN_${upper}_PACKAGE_NAME} ${programs}
+                  WORKING_DIRECTORY ${root}/../search OUTPUT_VARIABLE depends OUTPUT_STRIP_TRAILING_WHITESPACE
+                  COMMAND_ERROR_IS_FATAL ANY)
+  string(REGEX REPLACE "^shlibs:Depends=" "" depends "${depends}")
+  set(CPACK_DEBIAN_${upper}_PACKAGE_DEPENDS "${depends}" PARENT_SCOPE)
+endfunction()
+set_depends(libs "${libraries}")
+set_depends(tool ${root}/tool/usr/bin/ldappw)
+
+# The same sources give the same packages, byte for byte.
+run(find ${root} -exec touch --no-dereference --date=@$ENV{SOURCE_DATE_EPOCH} {} +)

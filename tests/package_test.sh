@@ -1,0 +1,69 @@
+#!/usr/bin/env bash
+# SPDX-License-Identifier: Apache-2.0
+# Unpacks the Debian packages into an empty root and uses them there: package_test.sh PACKAGES-FOLDER. The root has
+# nothing else, so the system's own libraries are used, and LD_LIBRARY_PATH stands for the loader's standard folder.
+set -euo pipefail
+here=$(cd "$(dirname "$0")" && pwd)
+packages=$(cd "$1" && pwd)
+work=$(mktemp -d)
+trap 'rm -rf "$work"' EXIT
+root="$work/root"
+
+fail() { echo "package_test: $*" >&2; exit 1; }
+field() { dpkg-deb -f "$(echo "$packages/$1"_*.deb)" "$2"; }
+
+for package in libldappw1 libldappw-dev ldappw; do
+  archive=$(echo "$packages/$package"_*.deb)
+  dpkg-deb --ctrl-tarfile "$archive" | tar -xf - --one-top-level="$work/control/$package"
+  dpkg-deb --fsys-tarfile "$archive" | tar -tf - | grep -v '/$' | sort >"$work/$package.files"
+  dpkg -x "$archive" "$root"
+done
+[ -z "$(sort "$work"/*.files | uniq -d)" ] || fail "two packages have the same file"
+
+# ---- what the package manager is told ----
+version=$(field libldappw1 Version)
+[ "$(field libldappw-dev Depends)" = "libldappw1 (= $version)" ] || fail "the headers may meet another library"
+grep -qw libldappw1 <<<"$(field ldappw Depends)" || fail "the command does not ask for its library"
+grep -qw libssl3 <<<"$(field libldappw1 Depends)" || fail "the library does not ask for what its provider links"
+for library in "$root"/usr/lib/*/*.so.*; do
+  name=$(objdump -p "$library" | awk '$1 == "SONAME" { print $2 }')
+  grep -q "^${name%.so.*} ${name##*.so.} libldappw1 " "$work/control/libldappw1/shlibs" || fail "no shlibs line of $name"
+done
+grep -q ldconfig "$work/control/libldappw1/triggers" || fail "the loader's cache would not be renewed"
+
+# ---- the files ----
+libdir=$(dirname "$(echo "$root"/usr/lib/*/libldappw.so.1)")
+tool="$root/usr/bin/ldappw"
+for program in "$tool" "$libdir"/*.so.* "$libdir"/qel/qellib/*.so; do
+  ! readelf -d "$program" | grep -E 'R(UN)?PATH' || fail "$program searches a folder of its own"
+  readelf -d "$program" | grep -qE 'BIND_NOW|Flags: NOW' || fail "$program is bound late"
+  ! readelf -S "$program" | grep -qE '\.symtab|\.debug' || fail "$program is not stripped"
+done
+for page in "$root"/usr/share/man/*/*.gz; do
+  gzip -dc "$page" | mandoc -T lint -W error >/dev/null || fail "$page is no manual page"
+done
+
+# ---- the command ----
+export LD_LIBRARY_PATH=$libdir
+seed=aSeedThatNobodyKnows
+echo "$seed" | "$tool" keys create --config "$work/cfg" --directory "$work/dir" >/dev/null
+for scheme in sha ssha md5 crypt qveil aes256; do
+  keys=()
+  [ "$scheme" != aes256 ] || keys=(--keys "$work/dir")
+  value=$(echo horse | "$tool" format --scheme "$scheme" "${keys[@]}")
+  echo horse | "$tool" verify "${keys[@]}" "$value" >/dev/null || fail "$scheme: $value is refused"
+  ! echo house | "$tool" verify "${keys[@]}" "$value" >/dev/null || fail "$scheme: another one is accepted"
+done
+[ "$(echo abc | "$tool" format --scheme md5)" = '{MD5}kAFQmDzST7DWlj99KOF/cg==' ] || fail "md5 of abc"
+
+# ---- an outside program, against the development package ----
+export PKG_CONFIG_SYSROOT_DIR=$root PKG_CONFIG_LIBDIR=$libdir/pkgconfig
+# shellcheck disable=SC2046 # the flags are words
+cc -D_GNU_SOURCE "$here/consumer.c" -o "$work/outside" $(pkg-config --cflags --libs ldappw)
+"$work/outside"
+cmake -S "$here/install" -B "$work/cmake" -DCMAKE_PREFIX_PATH="$root/usr" >"$work/log"
+cmake --build "$work/cmake" >>"$work/log"
+"$work/cmake/outside"
+
+lintian --allow-root --fail-on error "$packages"/*.deb
+echo "package_test: the packages of version $version are in order"
