@@ -1,7 +1,8 @@
 /* SPDX-License-Identifier: Apache-2.0 */
 /*
- * A provider that only tells, in the file STANDIN_LOG, what was called with what. Its directory is STANDIN_PATH, and it
- * gives no context while STANDIN_FAILS is set. STANDIN_NO_PATH and STANDIN_NO_SEED leave an entry out.
+ * A small provider for tests, without OpenSSL. In the file STANDIN_LOG it tells what was called with what while it is
+ * loaded; its directory is STANDIN_PATH, and it gives no context while STANDIN_FAILS is set. STANDIN_NO_PATH and
+ * STANDIN_NO_SEED leave an entry out. Its digests and ciphers are toys of the right sizes that protect nothing.
  */
 #include <stdarg.h>
 #include <stdio.h>
@@ -36,6 +37,9 @@ static void checkStatus(const QelStatus* status) {
 #ifndef STANDIN_NO_PATH
 ENTRY int treskqels_path(char* buffer, int size) {
   const char* path = getenv("STANDIN_PATH");
+#ifdef STANDIN_DEFAULT_PATH
+  if (path == NULL) path = STANDIN_DEFAULT_PATH;
+#endif
   return path != NULL && snprintf(buffer, (size_t)size, "%s", path) < 1024 && size == 1024;
 }
 #endif
@@ -69,17 +73,121 @@ ENTRY int QEL_Cleanup(void* ctx, QelStatus* status) {
   return 0;
 }
 
+struct algorithm {
+  const char* name;
+  int size; /* of a digest, or of a key */
+};
+
+struct context {
+  unsigned char bytes[32]; /* the digest so far, or the key */
+  size_t count;
+  int size;
+};
+
+ENTRY const void* QEL_EVP_get_digestbyname(void* ctx, const char* name) {
+  static const struct algorithm sha1 = {"SHA1", 20};
+  static const struct algorithm md5 = {"md5", 16};
+  (void)ctx;
+  return strcmp(name, sha1.name) == 0 ? &sha1 : strcmp(name, md5.name) == 0 ? &md5 : NULL;
+}
+
+ENTRY const void* QEL_EVP_get_cipherbyname(void* ctx, const char* name) {
+  static const struct algorithm ciphers[] = {{"AES-128-ECB", 16}, {"AES-192-ECB", 24}, {"AES-256-ECB", 32}};
+  (void)ctx;
+  for (int i = 0; i < 3; ++i) {
+    if (strcmp(name, ciphers[i].name) == 0) return &ciphers[i];
+  }
+  return NULL;
+}
+
+ENTRY int QEL_EVP_MD_size(void* ctx, const struct algorithm* digest) {
+  (void)ctx;
+  return digest->size;
+}
+
+ENTRY int QEL_EVP_DigestInit(void* ctx, struct context* c, const struct algorithm* digest) {
+  (void)ctx;
+  memset(c, 0, sizeof *c);
+  c->size = digest->size;
+  return 1;
+}
+
+ENTRY int QEL_EVP_DigestUpdate(void* ctx, struct context* c, const unsigned char* data, unsigned length) {
+  (void)ctx;
+  for (; length != 0; --length, ++c->count) c->bytes[c->count % (size_t)c->size] ^= (unsigned char)(*data++ + c->count);
+  return 1;
+}
+
+ENTRY int QEL_EVP_DigestFinal(void* ctx, struct context* c, unsigned char* out, unsigned* outLength) {
+  (void)ctx;
+  memcpy(out, c->bytes, (size_t)c->size);
+  if (outLength != NULL) *outLength = (unsigned)c->size;
+  return 1;
+}
+
+ENTRY int QEL_EVP_EncryptInit(void* ctx, struct context* c, const struct algorithm* cipher, const unsigned char* key) {
+  QEL_EVP_DigestInit(ctx, c, cipher);
+  memcpy(c->bytes, key, (size_t)c->size);
+  return 1;
+}
+
+ENTRY int QEL_EVP_EncryptUpdate(void* ctx, struct context* c, unsigned char* out, int* outLength,
+                                const unsigned char* in, int inLength) {
+  (void)ctx;
+  for (int i = 0; i < inLength; ++i, ++c->count) out[i] = in[i] ^ c->bytes[c->count % (size_t)c->size];
+  *outLength = inLength;
+  return 1;
+}
+
+ENTRY int QEL_EVP_EncryptFinal(void* ctx, struct context* c, unsigned char* out, int* outLength) {
+  unsigned char padding[16];
+  const int count = 16 - (int)(c->count % 16);
+  memset(padding, count, sizeof padding);
+  return QEL_EVP_EncryptUpdate(ctx, c, out, outLength, padding, count);
+}
+
+ENTRY int QEL_EVP_DecryptInit(void* ctx, struct context* c, const struct algorithm* cipher, const unsigned char* key) {
+  return QEL_EVP_EncryptInit(ctx, c, cipher, key);
+}
+
+/* Takes the whole text at once, and its padding off. */
+ENTRY int QEL_EVP_DecryptUpdate(void* ctx, struct context* c, unsigned char* out, int* outLength,
+                                const unsigned char* in, int inLength) {
+  QEL_EVP_EncryptUpdate(ctx, c, out, outLength, in, inLength);
+  if (inLength == 0 || out[inLength - 1] > inLength) return 0;
+  *outLength -= out[inLength - 1];
+  return 1;
+}
+
+ENTRY int QEL_EVP_DecryptFinal(void* ctx, struct context* c, unsigned char* out, int* outLength) {
+  (void)ctx, (void)c, (void)out;
+  *outLength = 0;
+  return 1;
+}
+
+ENTRY int QEL_RAND_bytes(void* ctx, unsigned char* buffer, int count) {
+  (void)ctx;
+  for (int i = 0; i < count; ++i) buffer[i] = (unsigned char)rand();
+  return 1;
+}
+
+static int release(void* ctx, void* context) {
+  (void)ctx;
+  free(context);
+  return 1;
+}
+
 // clang-format off
-#define UNUSED(name) ENTRY int QEL_##name(void) { return 0; }
-UNUSED(GetStatus) UNUSED(GetValue) UNUSED(EVP_get_cipherbyname) UNUSED(EVP_get_digestbyname) UNUSED(EVP_MD_CTX_new)
-UNUSED(EVP_MD_CTX_free) UNUSED(EVP_MD_CTX_init) UNUSED(EVP_MD_CTX_cleanup) UNUSED(EVP_MD_block_size) UNUSED(EVP_MD_size)
-UNUSED(EVP_DigestInit) UNUSED(EVP_DigestUpdate) UNUSED(EVP_DigestFinal) UNUSED(EVP_CIPHER_CTX_new)
-UNUSED(EVP_CIPHER_CTX_free) UNUSED(EVP_CIPHER_CTX_init) UNUSED(EVP_CIPHER_CTX_cleanup)
-UNUSED(EVP_CIPHER_CTX_set_key_length) UNUSED(EVP_CIPHER_CTX_set_padding) UNUSED(EVP_CIPHER_block_size)
-UNUSED(EVP_CIPHER_key_length) UNUSED(EVP_CIPHER_iv_length) UNUSED(EVP_EncryptInit) UNUSED(EVP_EncryptUpdate)
-UNUSED(EVP_EncryptFinal) UNUSED(EVP_DecryptInit) UNUSED(EVP_DecryptUpdate) UNUSED(EVP_DecryptFinal)
-UNUSED(EVP_CIPHER_CTX_cipher) UNUSED(RAND_bytes) UNUSED(RAND_seed)
+#define GIVES(name, value) ENTRY int QEL_##name(void) { return value; }
+#define CONTEXT(kind) \
+  ENTRY void* QEL_EVP_##kind##_CTX_new(void* ctx) { (void)ctx; return calloc(1, sizeof(struct context)); } \
+  ENTRY int QEL_EVP_##kind##_CTX_free(void* ctx, void* context) { return release(ctx, context); } \
+  GIVES(EVP_##kind##_CTX_init, 1) GIVES(EVP_##kind##_CTX_cleanup, 1)
+CONTEXT(MD) CONTEXT(CIPHER)
+GIVES(GetStatus, 0) GIVES(GetValue, 0) GIVES(EVP_MD_block_size, 64) GIVES(EVP_CIPHER_CTX_set_key_length, 1)
+GIVES(EVP_CIPHER_CTX_set_padding, 1) GIVES(EVP_CIPHER_block_size, 16) GIVES(EVP_CIPHER_key_length, 0)
+GIVES(EVP_CIPHER_iv_length, 0) GIVES(EVP_CIPHER_CTX_cipher, 0) GIVES(RAND_seed, 1)
 #ifndef STANDIN_NO_SEED
-UNUSED(GenerateRandomSeed)
+GIVES(GenerateRandomSeed, 1)
 #endif
     // clang-format on
