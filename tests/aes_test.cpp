@@ -40,9 +40,7 @@ TEST(AesBuffers, AgreeWithOpensslAndComeBack) {
     const char* vector;  // what the cipher sees of the salt
   } rows[] = {
       {"AES-128-ECB", 16, "saltsaltsalt", ""},
-      {"AES-192-ECB", 24, "saltsaltsalt", ""},
-      {"AES-256-ECB", 32, "", ""},
-      {"AES-128-CBC", 16, "saltsaltsalt", "73616c7473616c7473616c7400000000"},
+      {"AES-192-CBC", 24, "saltsaltsalt", "73616c7473616c7473616c7400000000"},
       {"AES-256-CBC", 32, "0123456789abcdefg", "30313233343536373839616263646566"},
   };
   for (const auto& row : rows) {
@@ -106,65 +104,44 @@ class AesFailures : public testing::Test {
 };
 
 constexpr auto failing = [](auto...) { return 0; };
+const test::Failure noPadding = replacing(pQEL_EVP_CIPHER_CTX_set_padding, [](auto...) { return 2; });
 
 TEST_F(AesFailures, OfEncryption) {
-  const test::Lines invalid = {"Error - aesEncryptBuffer: Invalid parameter. rc = 1\n"};
-  // clang-format off
-  const std::vector<test::FailureCase> rows = {
-      {1, invalid, replacing(clear, nullptr)},
-      {1, invalid, replacing(slot, nullptr)},
-      {1, invalid, replacing(name, nullptr)},
-      {1, invalid, replacing(key, nullptr)},
-      {1, invalid, replacing(iv, nullptr)},
-      {1, invalid, replacing(length, -1)},
-      {1, {"Error - aesEncryptBuffer: initQelCrypto() failed. rc = 1\n"}, test::withoutProvider()},
-      {1, {"Error - initQelCipher: QEL_EVP_get_cipherbyname() failed. rc = 1\n",
-           "Error - aesEncryptBuffer: initQelCipher() failed. rc = 1\n"}, replacing(name, "AES-512-ECB")},
-      {90, {"Error - aesEncryptBuffer: calloc() failed.\n"}, both(longVector, failingAllocation(0))},
-      {90, {"Error - aesEncryptBuffer: calloc() returned NULL. rc = 90\n"}, failingAllocation(0)},
-      {1, {"Error - aesEncryptBuffer: QEL_EVP_EncryptInit() failed. rc = 1\n"},
-       replacing(pQEL_EVP_EncryptInit, failing)},
-      {1, {"Error - aesEncryptBuffer: QEL_EVP_CIPHER_CTX_set_padding() failed. rc = 1\n"},
-       replacing(pQEL_EVP_CIPHER_CTX_set_padding, [](auto...) { return 2; })},
-      {1, {"Error - aesEncryptBuffer: QEL_EVP_EncryptUpdate() failed. rc = 1\n"},
-       replacing(pQEL_EVP_EncryptUpdate, failing)},
-      {1, {"Error - aesEncryptBuffer: QEL_EVP_EncryptFinal() failed. rc = 1\n"},
-       replacing(pQEL_EVP_EncryptFinal, failing)},
-      {1, {"Error - aesEncryptBuffer: binaryBlobToBase64() returned NULL. rc = 1\n"}, failingAllocation(1)},
-  };
-  // clang-format on
+  std::vector<test::FailureCase> rows =
+      test::Rows("aesEncryptBuffer")
+          .refuses({replacing(clear, nullptr), replacing(slot, nullptr), replacing(name, nullptr),
+                    replacing(key, nullptr), replacing(iv, nullptr), replacing(length, -1)})
+          .fails(1, "initQelCrypto() failed.", test::withoutProvider())
+          .fails(1, "initQelCipher() failed.", replacing(name, "AES-512-ECB"),
+                 {"Error - initQelCipher: QEL_EVP_get_cipherbyname() failed. rc = 1\n"})
+          .fails(90, "calloc() returned NULL.", failingAllocation(0))
+          .fails(1, "QEL_EVP_EncryptInit() failed.", replacing(pQEL_EVP_EncryptInit, failing))
+          .fails(1, "QEL_EVP_CIPHER_CTX_set_padding() failed.", noPadding)
+          .fails(1, "QEL_EVP_EncryptUpdate() failed.", replacing(pQEL_EVP_EncryptUpdate, failing))
+          .fails(1, "QEL_EVP_EncryptFinal() failed.", replacing(pQEL_EVP_EncryptFinal, failing))
+          .fails(1, "binaryBlobToBase64() returned NULL.", failingAllocation(1));
+  rows.push_back({90, {"Error - aesEncryptBuffer: calloc() failed.\n"}, both(longVector, failingAllocation(0))});
   test::expectFailures(rows, LDTR_DEBUG, [&] { return aesEncryptBuffer(clear, slot, name, key, iv, length); });
 }
 
 TEST_F(AesFailures, OfDecryption) {
-  const test::Lines invalid = {"Error - aesDecryptBuffer: Invalid parameter. rc = 1\n"};
-  const test::Lines notBase64 = {"Error - aesDecryptBuffer: base64ToBinaryBlob() returned NULL. rc = 1\n"};
-  const test::Lines padding = {"Error - aesDecryptBuffer: QEL_EVP_DecryptFinal() failed. rc = 1\n"};
-  // clang-format off
-  const std::vector<test::FailureCase> rows = {
-      {1, invalid, replacing(text, nullptr)},
-      {1, invalid, replacing(slot, nullptr)},
-      {1, invalid, replacing(name, nullptr)},
-      {1, invalid, replacing(key, nullptr)},
-      {1, invalid, replacing(iv, nullptr)},
-      {1, notBase64, both(replacing(text, "AAAA-AAA"), test::withoutProvider())},  // before the provider is asked
-      {1, notBase64, failingAllocation(0)},
-      {1, {"Error - aesDecryptBuffer: initQelCrypto() failed. rc = 1\n"}, test::withoutProvider()},
-      {1, {"Error - aesDecryptBuffer: initQelCipher() failed. rc = 1\n"}, replacing(name, "AES-512-ECB")},
-      {90, {"Error - aesDecryptBuffer: calloc() failed.\n"}, both(longVector, failingAllocation(1))},
-      {90, {"Error - aesDecryptBuffer: QEL_EVP_DecryptInit() failed. rc = 90\n"}, failingAllocation(1)},
-      {1, {"Error - aesDecryptBuffer: QEL_EVP_DecryptInit() failed. rc = 1\n"},
-       replacing(pQEL_EVP_DecryptInit, failing)},
-      {1, {"Error - aesDecryptBuffer: QEL_EVP_CIPHER_CTX_set_padding() failed. rc = 1\n"},
-       replacing(pQEL_EVP_CIPHER_CTX_set_padding, [](auto...) { return 2; })},
-      {1, {"Error - aesDecryptBuffer: QEL_EVP_DecryptUpdate() failed. rc = 1\n"},
-       replacing(pQEL_EVP_DecryptUpdate, failing)},
-      {1, padding, replacing(pQEL_EVP_DecryptFinal, failing)},
-      {1, padding, replacing(key, &otherKey_)},
-      {1, padding, replacing(text, "AAAAAAAAAAA=")},
-      {1, padding, replacing(text, "")},
-  };
-  // clang-format on
+  std::vector<test::FailureCase> rows =
+      test::Rows("aesDecryptBuffer")
+          .refuses({replacing(text, nullptr), replacing(slot, nullptr), replacing(name, nullptr),
+                    replacing(key, nullptr), replacing(iv, nullptr)})
+          .fails(1, "base64ToBinaryBlob() returned NULL.",
+                 both(replacing(text, "AAAA-AAA"), test::withoutProvider()))  // before the provider is asked
+          .fails(1, "base64ToBinaryBlob() returned NULL.", failingAllocation(0))
+          .fails(1, "initQelCrypto() failed.", test::withoutProvider())
+          .fails(1, "initQelCipher() failed.", replacing(name, "AES-512-ECB"))
+          .fails(90, "QEL_EVP_DecryptInit() failed.", failingAllocation(1))
+          .fails(1, "QEL_EVP_DecryptInit() failed.", replacing(pQEL_EVP_DecryptInit, failing))
+          .fails(1, "QEL_EVP_CIPHER_CTX_set_padding() failed.", noPadding)
+          .fails(1, "QEL_EVP_DecryptUpdate() failed.", replacing(pQEL_EVP_DecryptUpdate, failing))
+          .fails(1, "QEL_EVP_DecryptFinal() failed.", replacing(key, &otherKey_))
+          .fails(1, "QEL_EVP_DecryptFinal() failed.", replacing(text, "AAAAAAAAAAA="))
+          .fails(1, "QEL_EVP_DecryptFinal() failed.", replacing(text, ""));
+  rows.push_back({90, {"Error - aesDecryptBuffer: calloc() failed.\n"}, both(longVector, failingAllocation(1))});
   test::expectFailures(rows, LDTR_DEBUG, [&] { return aesDecryptBuffer(text, slot, name, key, iv, &length); });
   EXPECT_EQ(length, 300) << "written without a result";
 }

@@ -170,24 +170,18 @@ TEST_F(Derivation, ReportsArgumentsAndMemoryButNotTheProvider) {
   unsigned char* out = bytesOf(key);
   uint64_t saltLength = 0x100000004;  // its low 32 bits count
   uint64_t length = 40;
-  const Lines invalid = {"Error - morva_pbkdf2: Invalid parameter. rc = 1\n"};
-  const Lines memory = {"Error - morva_pkcs5_F: calloc() failed. rc = 90\n",
-                        "Error - morva_pbkdf2: morva_pkcs5_F() failed. rc = 90\n"};
+  const Lines memory = {"Error - morva_pkcs5_F: calloc() failed. rc = 90\n"};
   const auto call = [&] {
     return morva_pbkdf2(ctx, digestCtx, digest, seedBytes, 4, saltBytes, saltLength, 2, out, length);
   };
-  const std::vector<test::FailureCase> rows = {
-      {1, invalid, replacing(ctx, nullptr)},
-      {1, invalid, replacing(digestCtx, nullptr)},
-      {1, invalid, replacing(digest, nullptr)},
-      {1, invalid, replacing(seedBytes, nullptr)},
-      {1, invalid, replacing(saltBytes, nullptr)},
-      {1, invalid, replacing(out, nullptr)},
-      {1, {"Error - morva_pbkdf2: derivedKeyLen too long. rc = 1\n"}, replacing(length, 85899345901)},
-      {90, memory, both(replacing(length, 85899345900), failingAllocation(0))},  // gets as far as the first block
-      {90, memory, failingAllocation(1)},
-  };
-  test::expectFailures(rows, LDTR_ERROR, call);
+  test::expectFailures(
+      test::Rows("morva_pbkdf2")
+          .refuses({replacing(ctx, nullptr), replacing(digestCtx, nullptr), replacing(digest, nullptr),
+                    replacing(seedBytes, nullptr), replacing(saltBytes, nullptr), replacing(out, nullptr)})
+          .fails(1, "derivedKeyLen too long.", replacing(length, 85899345901))
+          .fails(90, "morva_pkcs5_F() failed.", both(replacing(length, 85899345900), failingAllocation(0)), memory)
+          .fails(90, "morva_pkcs5_F() failed.", failingAllocation(1), memory),
+      LDTR_ERROR, call);
   EXPECT_EQ(key, derived("abcd", "efgh", 2, 20) + std::string(20, '\0')) << "a block before the failure stays";
   const auto failing = [](auto...) { return 0; };
   both(replacing(pQEL_EVP_DigestInit, failing),
@@ -254,66 +248,48 @@ TEST_F(Derivation, WhatIsNotGivenIsRandomAndOddSaltsKeepTheirLength) {
 }
 
 TEST_F(Derivation, GenerationReportsEachStepThatFails) {
-  const Lines invalid = {"Error - genKeyDataVal: Invalid parameter. rc = 1\n"};
-  const Lines keys = {"Error - initAesKeyData: calloc(aesKeys) returned NULL. rc = 90\n",
-                      "Error - genKeyDataVal: initAesKeyData() failed. rc = 90\n"};
   const auto random = both(replacing(seed, nullptr), replacing(salt, nullptr));
   const auto atRandom = [&](long number) { return both(random, failingAllocation(number)); };
-  // clang-format off
-  const std::vector<test::FailureCase> rows = {
-      {1, invalid, replacing(ctx, nullptr)},
-      {1, invalid, replacing(digestCtx, nullptr)},
-      {1, invalid, replacing(digest, nullptr)},
-      {1, invalid, replacing(slot, nullptr)},
-      {90, {"Error - genKeyDataVal: calloc() returned NULL. rc = 90\n"}, atRandom(0)},
-      {90, {"Error - initAesKeyData: calloc(keyData) returned NULL. rc = 90\n", keys[1]}, atRandom(1)},
-      {90, {"Error - initAesKeyData: calloc(cryptoSalt) returned NULL. rc = 90\n", keys[1]}, atRandom(2)},
-      {90, keys, atRandom(3)},
-      {90, keys, atRandom(5)},
-      {90, {"Error - genKeySyncVal: calloc(cryptoSync) returned NULL. rc = 90\n",
-            "Error - genKeyDataVal: genKeySyncVal() failed. rc = 90\n"}, atRandom(6)},
-      {90, {"Error - morva_pbkdf2: morva_pkcs5_F() failed. rc = 90\n",
-            "Error - genKeySyncVal: morva_pbkdf2() failed. rc = 90\n",
-            "Error - genKeyDataVal: genKeySyncVal() failed. rc = 90\n"}, atRandom(7)},
-      {1, {"Error - genKeySyncVal: binaryBlobToBase64() returned NULL. rc = 1\n",
-           "Error - genKeyDataVal: genKeySyncVal() failed. rc = 1\n"}, atRandom(8)},
-      {90, {"Error - growKeysFromSeed: morva_pbkdf2() failed. rc = 90\n",
-            "Error - genKeyDataVal: growKeysFromSeed() failed. rc = 90\n"}, atRandom(9)},
-      {90, {"Error - genKeyDataVal: strdup() returned NULL. rc = 90\n"}, failingAllocation(5)},
-  };
-  // clang-format on
+  const auto rows = test::Rows("genKeyDataVal")
+                        .refuses({replacing(ctx, nullptr), replacing(digestCtx, nullptr), replacing(digest, nullptr),
+                                  replacing(slot, nullptr)})
+                        .fails(90, "calloc() returned NULL.", atRandom(0))
+                        .fails(90, "initAesKeyData() failed.", atRandom(1))
+                        .fails(90, "genKeySyncVal() failed.", atRandom(6),
+                               {"Error - genKeySyncVal: calloc(cryptoSync) returned NULL. rc = 90\n"})
+                        .fails(90, "genKeySyncVal() failed.", atRandom(7),
+                               {"Error - genKeySyncVal: morva_pbkdf2() failed. rc = 90\n"})
+                        .fails(1, "genKeySyncVal() failed.", atRandom(8),
+                               {"Error - genKeySyncVal: binaryBlobToBase64() returned NULL. rc = 1\n"})
+                        .fails(90, "growKeysFromSeed() failed.", atRandom(9),
+                               {"Error - growKeysFromSeed: morva_pbkdf2() failed. rc = 90\n"})
+                        .fails(90, "strdup() returned NULL.", failingAllocation(5));
   test::withQuickDigests()([&] { test::expectFailures(rows, LDTR_ERROR, [&] { return generate(); }); });
   EXPECT_EQ(record, nullptr);
 }
 
 TEST_F(Derivation, TheStepsRefuseNulls) {
   ASSERT_EQ(initAesKeyData(&record), 0);
-  for (const auto& missing : {replacing(ctx, nullptr), replacing(digestCtx, nullptr), replacing(digest, nullptr),
-                              replacing(seed, nullptr), replacing(record, nullptr)}) {
-    test::expectFailures({{1, {"Error - growKeysFromSeed: Invalid parameter. rc = 1\n"}, missing}}, LDTR_ERROR,
-                         [&] { return growKeysFromSeed(ctx, digestCtx, digest, seed, record); });
-    test::expectFailures({{1, {"Error - genKeySyncVal: Invalid parameter. rc = 1\n"}, missing}}, LDTR_ERROR,
-                         [&] { return genKeySyncVal(ctx, digestCtx, digest, seed, record); });
-  }
-  const Lines salted = {"Error - genKeySaltVal: Invalid parameter. rc = 1\n"};
-  test::expectFailures({{1, salted, replacing(ctx, nullptr)}, {1, salted, replacing(record, nullptr)}}, LDTR_ERROR,
-                       [&] { return genKeySaltVal(ctx, record); });
+  const auto missing = {replacing(ctx, nullptr), replacing(digestCtx, nullptr), replacing(digest, nullptr),
+                        replacing(seed, nullptr), replacing(record, nullptr)};
+  test::expectFailures(test::Rows("growKeysFromSeed").refuses(missing), LDTR_ERROR,
+                       [&] { return growKeysFromSeed(ctx, digestCtx, digest, seed, record); });
+  test::expectFailures(test::Rows("genKeySyncVal").refuses(missing), LDTR_ERROR,
+                       [&] { return genKeySyncVal(ctx, digestCtx, digest, seed, record); });
+  test::expectFailures(test::Rows("genKeySaltVal").refuses({replacing(ctx, nullptr), replacing(record, nullptr)}),
+                       LDTR_ERROR, [&] { return genKeySaltVal(ctx, record); });
   freeAesKeyData(record);
 }
 
 TEST_F(Derivation, TemporaryRecordsReportWhatTheyLack) {
-  const Lines invalid = {"Error - genTmpKeyDataVal: Invalid parameter. rc = 1\n"};
-  const std::vector<test::FailureCase> rows = {
-      {1, invalid, replacing(seed, nullptr)},
-      {1, invalid, both(replacing(salt, nullptr), test::withoutProvider())},  // before a context is made
-      {1, invalid, replacing(slot, nullptr)},
-      {1, {"Error - genTmpKeyDataVal: initQelCrypto() failed. rc = 1\n"}, test::withoutProvider()},
-      {1,
-       {"Error - genTmpKeyDataVal: initQelDigest() failed. rc = 1\n"},
-       replacing(pQEL_EVP_get_digestbyname, [](void*, const char*) -> const void* { return nullptr; })},
-      {90, {"Error - genTmpKeyDataVal: genKeyDataVal() failed. rc = 90\n"}, failingAllocation(6)},
-  };
-  test::expectFailures(rows, LDTR_ERROR, [&] { return genTmpKeyDataVal(seed, salt, slot); });
+  const auto noDigest = [](void*, const char*) -> const void* { return nullptr; };
+  test::expectFailures(test::Rows("genTmpKeyDataVal")
+                           .refuses({replacing(seed, nullptr), replacing(slot, nullptr),
+                                     both(replacing(salt, nullptr), test::withoutProvider())})
+                           .fails(1, "initQelCrypto() failed.", test::withoutProvider())
+                           .fails(1, "initQelDigest() failed.", replacing(pQEL_EVP_get_digestbyname, noDigest))
+                           .fails(90, "genKeyDataVal() failed.", failingAllocation(6)),
+                       LDTR_ERROR, [&] { return genTmpKeyDataVal(seed, salt, slot); });
   EXPECT_EQ(record, nullptr);
 }
 

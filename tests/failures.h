@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 
 #include <functional>
+#include <initializer_list>
 #include <string>
 #include <type_traits>
 #include <vector>
@@ -48,6 +49,28 @@ struct FailureCase {
   int rc;
   Lines lines;
   Failure failure;
+};
+
+// The rows of one operation, whose own lines have the usual shape.
+class Rows {
+ public:
+  explicit Rows(const std::string& name) : start_("Error - " + name + ": ") {}
+
+  // Arguments that are refused, each alone.
+  Rows& refuses(std::initializer_list<Failure> arguments) {
+    for (const Failure& argument : arguments) fails(1, "Invalid parameter.", argument);
+    return *this;
+  }
+  Rows& fails(int rc, const std::string& what, const Failure& failure, Lines before = {}) {
+    before.push_back(start_ + what + " rc = " + std::to_string(rc) + "\n");
+    rows_.push_back({rc, before, failure});
+    return *this;
+  }
+  operator const std::vector<FailureCase>&() const { return rows_; }
+
+ private:
+  std::string start_;
+  std::vector<FailureCase> rows_;
 };
 
 // The last line is the operation's own, and of its class.

@@ -9,6 +9,7 @@ namespace {
 
 using test::contentOf;
 using test::failingAllocation;
+using test::fixedFile;
 using test::fixedRecord;
 using test::Lines;
 using test::putFile;
@@ -19,10 +20,6 @@ using test::textOf;
 using test::TraceCapture;
 
 constexpr char kSalt[] = "saltsaltsalt";
-
-std::string fixedFile() {
-  return std::string("\x08\0\0\0", 4) + test::fixedContent();
-}
 
 // ---- Records ----
 
@@ -55,28 +52,22 @@ TEST(KeyRecords, ReportWhatTheyLack) {
   const AesKeyData* source = record;
   AesKeyData* out = nullptr;
   AesKeyData** slot = &out;
-  const Lines initKeys = {"Error - initAesKeyData: calloc(aesKeys) returned NULL. rc = 90\n"};
-  const Lines copyText = {"Error - copyAesKeyData: calloc(cryptoSalt) returned NULL. rc = 90\n"};
-  const Lines copyInvalid = {"Error - copyAesKeyData: Invalid parameter. rc = 1\n"};
-  // clang-format off
-  test::expectFailures({
-      {1, {"Error - initAesKeyData: Invalid parameter. rc = 1\n"}, replacing(slot, nullptr)},
-      {90, {"Error - initAesKeyData: calloc(keyData) returned NULL. rc = 90\n"}, failingAllocation(0)},
-      {90, {"Error - initAesKeyData: calloc(cryptoSalt) returned NULL. rc = 90\n"}, failingAllocation(1)},
-      {90, initKeys, failingAllocation(2)},
-      {90, initKeys, failingAllocation(4)},
-  }, LDTR_ERROR, [&] { return initAesKeyData(slot); });
-  test::expectFailures({
-      {1, copyInvalid, replacing(source, nullptr)},
-      {1, copyInvalid, replacing(source, empty)},  // it has no sync text
-      {1, copyInvalid, replacing(slot, nullptr)},
-      {90, {"Error - copyAesKeyData: calloc(keyDataCopy) returned NULL. rc = 90\n"}, failingAllocation(0)},
-      {90, copyText, failingAllocation(1)},
-      {90, copyText, failingAllocation(2)},
-      {90, {"Error - copyAesKeyData: calloc(aesKeys) returned NULL. rc = 90\n"}, failingAllocation(3)},
-      {90, {"Error - copyAesKeyData: calloc(aesKeys) returned NULL. rc = 90\n"}, failingAllocation(5)},
-  }, LDTR_ERROR, [&] { return copyAesKeyData(source, slot); });
-  // clang-format on
+  test::expectFailures(test::Rows("initAesKeyData")
+                           .refuses({replacing(slot, nullptr)})
+                           .fails(90, "calloc(keyData) returned NULL.", failingAllocation(0))
+                           .fails(90, "calloc(cryptoSalt) returned NULL.", failingAllocation(1))
+                           .fails(90, "calloc(aesKeys) returned NULL.", failingAllocation(2))
+                           .fails(90, "calloc(aesKeys) returned NULL.", failingAllocation(4)),
+                       LDTR_ERROR, [&] { return initAesKeyData(slot); });
+  test::expectFailures(
+      test::Rows("copyAesKeyData")
+          .refuses({replacing(source, nullptr), replacing(source, empty), replacing(slot, nullptr)})
+          .fails(90, "calloc(keyDataCopy) returned NULL.", failingAllocation(0))
+          .fails(90, "calloc(cryptoSalt) returned NULL.", failingAllocation(1))  // of the sync text too
+          .fails(90, "calloc(cryptoSalt) returned NULL.", failingAllocation(2))
+          .fails(90, "calloc(aesKeys) returned NULL.", failingAllocation(3))
+          .fails(90, "calloc(aesKeys) returned NULL.", failingAllocation(5)),
+      LDTR_ERROR, [&] { return copyAesKeyData(source, slot); });
   EXPECT_EQ(out, nullptr);
   freeAesKeyData(record);
   freeAesKeyData(empty);
@@ -105,11 +96,9 @@ TEST(KeyRecords, AreComparedBySyncTextAndSalt) {
   const char* salt = kSalt;
   int match = 7;
   int* answer = &match;
-  const Lines invalid = {"Error - checkKeyStashFile: Invalid parameter. rc = 1\n"};
-  test::expectFailures({{1, invalid, replacing(subject, nullptr)},
-                        {1, invalid, replacing(sync, nullptr)},
-                        {1, invalid, replacing(salt, nullptr)},
-                        {1, invalid, replacing(answer, nullptr)}},
+  test::expectFailures(test::Rows("checkKeyStashFile")
+                           .refuses({replacing(subject, nullptr), replacing(sync, nullptr), replacing(salt, nullptr),
+                                     replacing(answer, nullptr)}),
                        LDTR_ERROR, [&] { return checkKeyStashFile(0, subject, sync, salt, answer); });
   EXPECT_EQ(match, 7);
   freeAesKeyData(record);

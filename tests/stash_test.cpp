@@ -18,6 +18,7 @@ using test::AllocationWatch;
 using test::contentOf;
 using test::failingAllocation;
 using test::fileContent;
+using test::fixedFile;
 using test::fixedRecord;
 using test::Lines;
 using test::putFile;
@@ -26,11 +27,6 @@ using test::TempFolder;
 using test::TraceCapture;
 
 constexpr char kSalt[] = "saltsaltsalt";
-
-// The file of fixedRecord.
-std::string fixedFile() {
-  return std::string("\x08\0\0\0", 4) + test::fixedContent();
-}
 
 TEST(StashFiles, HoldTheRecordByteForByte) {
   const TempFolder folder;
@@ -114,13 +110,11 @@ TEST(StashFiles, ThatCannotBeWritten) {
   AesKeyData* const record = fixedRecord();
   const AesKeyData* subject = record;
   const char* path = cut.c_str();
-  const Lines invalid = {"Error - writeKeyStashFile: Invalid parameter. rc = 1\n"};
-  test::expectFailures(
-      {{1, invalid, replacing(path, nullptr)},
-       {1, invalid, replacing(subject, nullptr)},
-       {1, {"Error - writeKeyStashFile: fopen() failed. rc = 1\n"}, replacing(path, folderPath.c_str())},
-       {1, {"Error - writeKeyStashFile: fwrite(cryptoSync) failed. rc = 1\n"}, replacing(path, "/dev/full")}},
-      LDTR_ERROR, [&] { return writeKeyStashFile(path, subject); });
+  test::expectFailures(test::Rows("writeKeyStashFile")
+                           .refuses({replacing(path, nullptr), replacing(subject, nullptr)})
+                           .fails(1, "fopen() failed.", replacing(path, folderPath.c_str()))
+                           .fails(1, "fwrite(cryptoSync) failed.", replacing(path, "/dev/full")),
+                       LDTR_ERROR, [&] { return writeKeyStashFile(path, subject); });
   for (const auto& [limit, what] :
        {std::pair{2U, "cryptoSync"}, {11U, "cryptoSync"}, {12U, "cryptoSalt"}, {24U, "aesKeys"}, {95U, "aesKeys"}}) {
     const std::string line = "Error - writeKeyStashFile: fwrite(" + std::string(what) + ") failed. rc = 1\n";
@@ -173,24 +167,16 @@ TEST_F(StashFileMaking, PairsAreCreatedAndRebuiltTheSame) {
 }
 
 TEST_F(StashFileMaking, CreationReportsEachStepThatFails) {
-  const Lines invalid = {"Error - createKeyStashFiles: Invalid parameter. rc = 1\n"};
-  // clang-format off
-  const std::vector<test::FailureCase> rows = {
-      {1, invalid, replacing(cfg, nullptr)},
-      {1, invalid, replacing(dir, nullptr)},
-      {1, invalid, replacing(seed, nullptr)},
-      {1, invalid, replacing(slot, nullptr)},
-      {19, {"Error - validateCryptoString: Crypto string too short, length = 5, rc = 19\n",
-            "Error - createKeyStashFiles: validateCryptoString(dir) failed. rc = 19\n"}, replacing(seed, "short")},
-      {19, {"Error - createKeyStashFiles: Invalid parameter. rc = 19\n"}, replacing(salt, "short")},
-      {1, {"Error - createKeyStashFiles: initQelCrypto() failed. rc = 1\n"}, test::withoutProvider()},
-      {1, {"Error - createKeyStashFiles: initQelDigest() failed. rc = 1\n"}, noDigest_},
-      {1, {"Error - writeKeyStashFile: fopen() failed. rc = 1\n",
-           "Error - createKeyStashFiles: writeKeyStashFile(cfg) failed. rc = 1\n"}, replacing(cfg, nowhere_.c_str())},
-      {1, {"Error - writeKeyStashFile: fwrite(cryptoSync) failed. rc = 1\n",
-           "Error - createKeyStashFiles: writeKeyStashFile(dir) failed. rc = 1\n"}, replacing(dir, "/dev/full")},
-  };
-  // clang-format on
+  const auto rows = test::Rows("createKeyStashFiles")
+                        .refuses({replacing(cfg, nullptr), replacing(dir, nullptr), replacing(seed, nullptr),
+                                  replacing(slot, nullptr)})
+                        .fails(19, "validateCryptoString(dir) failed.", replacing(seed, "short"),
+                               {"Error - validateCryptoString: Crypto string too short, length = 5, rc = 19\n"})
+                        .fails(19, "Invalid parameter.", replacing(salt, "short"))
+                        .fails(1, "initQelCrypto() failed.", test::withoutProvider())
+                        .fails(1, "initQelDigest() failed.", noDigest_)
+                        .fails(1, "writeKeyStashFile(cfg) failed.", replacing(cfg, nowhere_.c_str()))
+                        .fails(1, "writeKeyStashFile(dir) failed.", replacing(dir, "/dev/full"));
   test::withQuickDigests()(
       [&] { test::expectFailures(rows, LDTR_ERROR, [&] { return createKeyStashFiles(cfg, dir, seed, slot, salt); }); });
   EXPECT_EQ(sync, nullptr);
@@ -221,21 +207,15 @@ TEST_F(StashFileMaking, CreationReportsEveryAllocationThatFails) {
 }
 
 TEST_F(StashFileMaking, RebuildingReportsEachStepThatFails) {
-  const Lines invalid = {"Error - restoreKeyStashFile: Invalid parameter. rc = 1\n"};
-  // clang-format off
-  const std::vector<test::FailureCase> rows = {
-      {1, invalid, replacing(dir, nullptr)},
-      {1, invalid, replacing(seed, nullptr)},
-      {1, invalid, replacing(salt, nullptr)},
-      {19, {"Error - restoreKeyStashFile: validateCryptoString(seed) failed. rc = 19\n"}, replacing(seed, "short")},
-      {19, {"Error - restoreKeyStashFile: validateCryptoString(salt) failed. rc = 19\n"}, replacing(salt, "short")},
-      {1, {"Error - restoreKeyStashFile: initQelCrypto() failed. rc = 1\n"}, test::withoutProvider()},
-      {1, {"Error - restoreKeyStashFile: initQelDigest() failed. rc = 1\n"}, noDigest_},
-      {90, {"Error - restoreKeyStashFile: genKeyDataVal(dir) failed. rc = 90\n"}, failingAllocation(0)},
-      {1, {"Error - restoreKeyStashFile: writeKeyStashFile() failed. rc = 1\n"}, replacing(dir, nowhere_.c_str())},
-  };
-  // clang-format on
-  test::expectFailures(rows, LDTR_ERROR, [&] { return restoreKeyStashFile(dir, seed, salt); });
+  test::expectFailures(test::Rows("restoreKeyStashFile")
+                           .refuses({replacing(dir, nullptr), replacing(seed, nullptr), replacing(salt, nullptr)})
+                           .fails(19, "validateCryptoString(seed) failed.", replacing(seed, "short"))
+                           .fails(19, "validateCryptoString(salt) failed.", replacing(salt, "short"))
+                           .fails(1, "initQelCrypto() failed.", test::withoutProvider())
+                           .fails(1, "initQelDigest() failed.", noDigest_)
+                           .fails(90, "genKeyDataVal(dir) failed.", failingAllocation(0))
+                           .fails(1, "writeKeyStashFile() failed.", replacing(dir, nowhere_.c_str())),
+                       LDTR_ERROR, [&] { return restoreKeyStashFile(dir, seed, salt); });
   const TraceCapture trace;
   EXPECT_EQ(restoreKeyStashFile(dir, nullptr, nullptr), 1);
   EXPECT_EQ(test::outlineOf(trace),

@@ -200,5 +200,8 @@ inline std::string fixedContent() {
   }
   return content;
 }
+inline std::string fixedFile() {
+  return std::string("\x08\0\0\0", 4) + fixedContent();
+}
 
 }  // namespace test
