@@ -35,6 +35,19 @@ inline Failure failingAllocation(long number) {
   };
 }
 
+// Runs an operation with each of its allocations failing in turn, and last with none.
+inline void sweepAllocations(int good, int bad, const std::function<int()>& run) {
+  bool failed = true;
+  for (long n = 0; failed && n < 50; ++n) {
+    SCOPED_TRACE("allocation " + std::to_string(n));
+    const AllocationWatch watch(n);
+    const int result = run();
+    failed = watch.count() > n;
+    EXPECT_EQ(result, failed ? bad : good);
+  }
+  EXPECT_FALSE(failed) << "never came to an end";
+}
+
 inline Failure both(const Failure& first, const Failure& second) {
   return [first, second](const Body& body) { first([&] { second(body); }); };
 }

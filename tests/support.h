@@ -2,6 +2,7 @@
 // What the suites share: a recorder for the trace, failing allocations, guarded memory, replaced provider entries.
 #pragma once
 
+#include <pthread.h>
 #include <sys/mman.h>
 #include <unistd.h>
 
@@ -9,6 +10,7 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <mutex>
 #include <sstream>
 #include <string>
@@ -91,6 +93,24 @@ class ReleaseWatch {
  private:
   std::string secret_;
 };
+
+// Whether the secret lies on the stack of a thread that has run the function.
+inline bool leftOnStack(std::function<void()> run, const std::string& secret) {
+  std::string stack(size_t{1} << 20U, '\0');
+  pthread_attr_t attributes;
+  pthread_attr_init(&attributes);
+  pthread_attr_setstack(&attributes, stack.data(), stack.size());
+  const auto start = [](void* body) -> void* {
+    char depth[32768];  // the end of the thread uses what is above
+    __asm__ volatile("" : : "r"(depth) : "memory");
+    return (*static_cast<std::function<void()>*>(body))(), nullptr;
+  };
+  pthread_t thread;
+  if (pthread_create(&thread, &attributes, start, &run) != 0) std::abort();
+  pthread_join(thread, nullptr);
+  pthread_attr_destroy(&attributes);
+  return stack.find(secret) != std::string::npos;
+}
 
 // Bytes that end right before a page that cannot be touched.
 class Guarded {
