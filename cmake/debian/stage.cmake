@@ -2,6 +2,7 @@
 # Runs in cpack between the installation into the packages' folders and their packing: adds the documents that every
 # package has, strips the programs, compresses what is to be compressed, and computes what the programs depend on.
 set(root ${CPACK_TEMPORARY_INSTALL_DIRECTORY})
+set(search ${root}/../search)
 
 function(run)
   execute_process(COMMAND ${ARGN} COMMAND_ERROR_IS_FATAL ANY)
@@ -22,13 +23,24 @@ run(chmod a-x ${libraries})
 run(strip --strip-unneeded -R .comment -R .note ${libraries} ${root}/tool/usr/bin/ldappw)
 
 # The search reads debian/control of the folder that it runs in.
-file(WRITE ${root}/../search/debian/control "Source: ldappw\n\nPackage: ldappw\nArchitecture: any\n")
-list(TRANSFORM CPACK_LDAPPW_LIBRARIES PREPEND -l OUTPUT_VARIABLE folders)
+file(WRITE ${search}/debian/control "Source: ldappw\n\nPackage: ldappw\nArchitecture: any\n")
+list(TRANSFORM CPACK_LDAPPW_LIBRARIES PREPEND -l OUTPUT_VARIABLE options)
+set(lines ${CPACK_LDAPPW_DEBIAN}/shlibs)
+if(CPACK_LDAPPW_FOREIGN)
+  # The packages of another architecture are not installed here, but their names and versions are those of this one's.
+  # An empty record of packages keeps the 32-bit parts of this one out of the search.
+  file(WRITE ${search}/installed/status "")
+  list(APPEND options --admindir=${search}/installed)
+  file(GLOB installed /var/lib/dpkg/info/lib*:*.shlibs)
+  list(APPEND lines ${installed})
+endif()
+execute_process(COMMAND cat ${lines} OUTPUT_FILE ${search}/shlibs COMMAND_ERROR_IS_FATAL ANY)
+
 function(set_depends component programs)
   string(TOUPPER ${component} upper)
-  execute_process(COMMAND dpkg-shlibdeps -O ${folders} -L${CPACK_LDAPPW_DEBIAN}/shlibs
+  execute_process(COMMAND dpkg-shlibdeps -O ${options} -L${search}/shlibs
                           -x${CPACK_DEBIAN_${upper}_PACKAGE_NAME} ${programs}
-                  WORKING_DIRECTORY ${root}/../search OUTPUT_VARIABLE depends OUTPUT_STRIP_TRAILING_WHITESPACE
+                  WORKING_DIRECTORY ${search} OUTPUT_VARIABLE depends OUTPUT_STRIP_TRAILING_WHITESPACE
                   COMMAND_ERROR_IS_FATAL ANY)
   string(REGEX REPLACE "^shlibs:Depends=" "" depends "${depends}")
   set(CPACK_DEBIAN_${upper}_PACKAGE_DEPENDS "${depends}" PARENT_SCOPE)
