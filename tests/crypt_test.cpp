@@ -44,7 +44,6 @@ TEST(UnixCrypt, TakesAnyByteAsSalt) {
   } rows[] = {{"x\0"s, "xx", "xG"}, {"\0"s, "\0\0"s, "GG"},   {"!~\0"s, "!~", "n1"},
               {"[:"s, "[:", "U3"},  {"\xff@", "\xff@", "F9"}, {"ab$1$", "ab", "ab"}};
   for (const auto& row : rows) {
-    SCOPED_TRACE(toHex(row.salt.data(), row.salt.size()));
     Guarded key("8 letter");  // not terminated: more is never looked at
     Guarded salt(row.salt);
     ldappw_crypt_data state;
@@ -141,6 +140,10 @@ const Failure longDigest = replacing(pQEL_EVP_MD_size, [](auto...) { return 400;
 TEST(SaltedHash, ReportsProviderFailures) {
   void* context = nullptr;
   ASSERT_EQ(initQelCrypto(&context), 0);
+  static int released = 0;
+  static const auto realFree = pQEL_EVP_MD_CTX_free;
+  const Replaced counted(
+      pQEL_EVP_MD_CTX_free, +[](void* ctx, void* c) { return ++released, realFree(ctx, c); });
   const std::string longSalt = saltedPayload("secret", letters(500));
   const char* stored = longSalt.c_str();
   const auto two = [](auto...) { return 2; };  // no success
@@ -173,6 +176,7 @@ TEST(SaltedHash, ReportsProviderFailures) {
                [] { return emptied(saltedHashEncrypt(clear, &out, name)); });
     expectLine("Error - saltedHashVerify: ", row.verifying, [&] { return saltedHashVerify(clear, stored, name); });
   }
+  EXPECT_EQ(released, 14);  // once in each failure from the lookup of the digest on
 }
 
 TEST(UnsaltedHash, ReportsProviderFailuresInItsOwnWords) {

@@ -48,9 +48,7 @@ TEST(Base64, DecodesOddTextsByTheirPlaces) {
       {"=/AA", 0, "030000", kStandard},                      // the first byte is written, the count is 0
       {"QQ==QUI=QUJD", 6, "410000414200414243", kStandard},  // a pad within the text leaves a gap behind its group
       {"Z", 1, "64", kStandard},                             // what a short group lacks counts as "="
-      {"Zm9vYm", 4, "666f6f62", kStandard},                  //
       {"A-AA", 3, "001000", kStandard},                      // a foreign character is 65, whose bits spill over
-      {"AAA-", 3, "000041", kStandard},                      //
       {"\xff\xfe\n A", 4, "04104100", kStandard},            //
       {"AA--", 1, "00", kStandard + "-"},                    // the 65th place is that of the pad, whatever stands there
       {"AAA=", 3, "000041", kStandard + "-"},                // and the pad comes after it

@@ -260,7 +260,6 @@ TEST(VerifyPassword, TreatsTheOddPairsAsPromised) {
       {"a raw digest presented", "{SHA}" + opensslDigest("SHA1", "secret"), sha, 0, 0, keys()},
       {"crypt with half a salt", "secret", "{crypt}a", 99, 0, keys()},
       {"AES-256 without a key", "secret", format(133, "secret"), 99, 0, nullptr},
-      {"masked texts are cut", text46 + "x", format(128, text46 + "yz"), 0, 0, keys()},
       {"an unknown alphabet stands for itself", noAlphabet, noAlphabet, 0, 1, keys()},
       {"what cannot be unmasked matches nothing", tooShort, tooShort, 99, 1, keys()},
       {"less than a digest", "secret", "{SSHA}" + opensslBase64(std::string(19, 'x')), 1, 0, keys()},
@@ -362,7 +361,6 @@ TEST(Secrets, AreGoneFromMemoryThatIsReleased) {
   std::free(strdup((kSecret + "unwiped").c_str()));
   ASSERT_EQ(watch.withSecret(), 1) << "the watch sees nothing";
   for (const Body& use : secretUses()) use();
-  EXPECT_GT(watch.releases(), 10);
   EXPECT_EQ(watch.withSecret(), 1);
 }
 
