@@ -27,7 +27,8 @@ grep -qw libldappw1 <<<"$(field ldappw Depends)" || fail "the command does not a
 grep -qw libssl3 <<<"$(field libldappw1 Depends)" || fail "the library does not ask for what its provider links"
 for library in "$root"/usr/lib/*/*.so.*; do
   name=$(objdump -p "$library" | awk '$1 == "SONAME" { print $2 }')
-  grep -q "^${name%.so.*} ${name##*.so.} libldappw1 " "$work/control/libldappw1/shlibs" || fail "no shlibs line of $name"
+  grep -q "^${name%.so.*} ${name##*.so.} libldappw1 " "$work/control/libldappw1/shlibs" ||
+    fail "no shlibs line of $name"
 done
 grep -q ldconfig "$work/control/libldappw1/triggers" || fail "the loader's cache would not be renewed"
 
