@@ -72,6 +72,14 @@ inline Failure withQuickDigests() {
                    replacing(pQEL_EVP_DigestFinal, [](auto...) { return 1; })));
 }
 
+// That the lines of the error shape, and they alone, are of the error class.
+inline void expectErrorClasses(const TraceCapture& trace) {
+  for (const Record& r : trace.records()) {
+    const bool isError = r.text.rfind("Error - ", 0) == 0;
+    EXPECT_EQ(r.severity, isError ? LDTR_ERROR : LDTR_DEBUG) << r.text;
+  }
+}
+
 // The trace as one text: entries and exits as > and <, lines whole, addresses as #.
 inline std::string outlineOf(const TraceCapture& trace) {
   std::string outline;
