@@ -7,7 +7,8 @@
 #include <pty.h>
 #include <termios.h>
 
-#include <sstream>
+#include <algorithm>
+#include <regex>
 #include <thread>
 
 #include "dsutil.h"
@@ -17,7 +18,6 @@
 
 namespace {
 
-using test::AllocationWatch;
 using test::Replaced;
 using test::taken;
 
@@ -37,62 +37,45 @@ TEST(Loader, OpensResolvesAndCloses) {
   EXPECT_EQ(defFlags, 0x102);
   void** cell = ldapLoadLib("libm.so.6", 0);
   ASSERT_NE(cell, nullptr);
-  EXPECT_EQ(ldapGetSymAddress(cell, "cos"), dlsym(*cell, "cos"));
   EXPECT_NE(ldapGetSymAddress(cell, "cos"), nullptr);
+  EXPECT_EQ(ldapGetSymAddress(cell, "cos"), dlsym(*cell, "cos"));
   EXPECT_EQ(ldapGetSymAddress(cell, nullptr), nullptr);
   EXPECT_EQ(ldapGetSymAddress(nullptr, "cos"), nullptr);
   EXPECT_EQ(ldapUnloadLib(cell), 0);
   EXPECT_EQ(ldapUnloadLib(nullptr), 80);
   EXPECT_EQ(ldapLoadLib(nullptr, 0), nullptr);
-}
-
-TEST(Loader, PassesTheFlagsOn) {
-  const Replaced<int> local(defFlags, RTLD_NOW | RTLD_NOLOAD);
-  const char* notLoaded = "libutil.so.1";
-  EXPECT_EQ(ldapLoadLib(notLoaded, 0), nullptr);
-  void** cell = ldapLoadLib(notLoaded, RTLD_LAZY);
+  const Replaced<int> flags(defFlags, RTLD_NOW | RTLD_NOLOAD);
+  EXPECT_EQ(ldapLoadLib("libutil.so.1", 0), nullptr);
+  cell = ldapLoadLib("libutil.so.1", RTLD_LAZY);
   ASSERT_NE(cell, nullptr);
   EXPECT_EQ(ldapUnloadLib(cell), 0);
 }
 
 TEST(Loader, TellsFailuresToTheDebugLogAlone) {
-  void** cell = nullptr;
-  const auto missing = [&] { cell = ldapLoadLib("/nowhere/lib.so", 0); };
-  EXPECT_EQ(debugOutput(1, missing),
+  void** cell = ldapLoadLib("libm.so.6", 0);
+  ASSERT_NE(cell, nullptr);
+  const auto noFile = [] { EXPECT_EQ(ldapLoadLib("/nowhere/lib.so", 0), nullptr); };
+  const auto noSymbol = [&] { EXPECT_EQ(ldapGetSymAddress(cell, "no_such_symbol"), nullptr); };
+  const auto noMemory = [] {
+    const test::AllocationWatch watch(0);
+    EXPECT_EQ(ldapLoadLib("libm.so.6", 0), nullptr);
+  };
+  EXPECT_EQ(debugOutput(1, noFile),
             "c8110000 dlopen failed for /nowhere/lib.so: /nowhere/lib.so: cannot open shared object file: No such "
             "file or directory\n");
-  EXPECT_EQ(cell, nullptr);
-  EXPECT_EQ(debugOutput(0, missing), "");
-  EXPECT_EQ(debugOutput(1,
-                        [&] {
-                          const AllocationWatch watch(0);
-                          EXPECT_EQ(ldapLoadLib("libm.so.6", 0), nullptr);
-                        }),
-            "");
-  cell = ldapLoadLib("libm.so.6", 0);
-  ASSERT_NE(cell, nullptr);
-  const auto unknown = [&] { EXPECT_EQ(ldapGetSymAddress(cell, "no_such_symbol"), nullptr); };
-  const std::string line = debugOutput(-1, unknown);
-  const std::string end = ": undefined symbol: no_such_symbol\n";
-  EXPECT_EQ(line.rfind("c8110000 dlsym failed: ", 0), 0U) << line;
-  EXPECT_EQ(line.find(end), line.size() - end.size()) << line;
-  EXPECT_EQ(debugOutput(0, unknown), "");
+  const std::regex line("c8110000 dlsym failed: .*: undefined symbol: no_such_symbol\n");
+  EXPECT_TRUE(std::regex_match(debugOutput(-1, noSymbol), line));
+  EXPECT_EQ(debugOutput(0, noFile) + debugOutput(0, noSymbol) + debugOutput(1, noMemory), "");
   ldapUnloadLib(cell);
 }
 
 // ---- The library path and cipher specifications ----
 
 // The number of overflow lines in a debug log that holds nothing else.
-int overflows(const std::string& log) {
-  std::istringstream lines(log);
-  int count = 0;
-  for (std::string line; std::getline(lines, line); ++count) {
-    EXPECT_EQ(line.rfind("c8010000 kubstr error near ", 0), 0U) << line;
-    const size_t file = line.find("utils_loader.cpp:");
-    EXPECT_NE(file, std::string::npos) << line;
-    EXPECT_GT(std::atoi(line.c_str() + file + 17), 0) << line;
-  }
-  return count;
+long overflows(const std::string& log) {
+  static const std::regex line("c8010000 kubstr error near .*utils_loader\\.cpp:[1-9][0-9]*\n");
+  EXPECT_EQ(std::regex_replace(log, line, ""), "");
+  return std::count(log.begin(), log.end(), '\n');
 }
 
 TEST(LibraryPath, HoldsTheSystemFolderAfterwards) {
@@ -100,12 +83,11 @@ TEST(LibraryPath, HoldsTheSystemFolderAfterwards) {
   const struct {
     const char* before;
     std::string after;
-    int overflows;
+    long overflows;
   } rows[] = {
       {nullptr, "/usr/lib", 0},
       {"", ":/usr/lib", 0},
       {"/opt/x", "/opt/x:/usr/lib", 0},
-      {"/opt/x:/usr/lib", "/opt/x:/usr/lib", 0},
       {"/usr/lib:/opt/x", "/usr/lib:/opt/x", 0},
       {"/opt/x:/usr/lib/", "/opt/x:/usr/lib/:/usr/lib", 0},
       {"/USR/LIB:/usr/lib64", "/USR/LIB:/usr/lib64:/usr/lib", 0},
@@ -114,40 +96,28 @@ TEST(LibraryPath, HoldsTheSystemFolderAfterwards) {
       {full.c_str() + 1, full.substr(1) + ":", 1},
       {full.c_str(), full, 2},
   };
-  const std::string before = getenv("LD_LIBRARY_PATH") != nullptr ? getenv("LD_LIBRARY_PATH") : "";
   for (const auto& row : rows) {
     SCOPED_TRACE(row.after.substr(0, 40));
     unsetenv("LD_LIBRARY_PATH");
     if (row.before != nullptr) setenv("LD_LIBRARY_PATH", row.before, 1);
-    int rc = -1;
-    EXPECT_EQ(overflows(debugOutput(1, [&] { rc = setDefLibpath(); })), row.overflows);
-    EXPECT_EQ(rc, 0);
+    EXPECT_EQ(overflows(debugOutput(1, [] { EXPECT_EQ(setDefLibpath(), 0); })), row.overflows);
+    EXPECT_EQ(getenv("LD_LIBRARY_PATH"), row.after);
+    EXPECT_EQ(debugOutput(0, [] { setDefLibpath(); }), "");  // reads what the first call's buffer holds
     EXPECT_EQ(getenv("LD_LIBRARY_PATH"), row.after);
   }
-  setenv("LD_LIBRARY_PATH", "/a", 1);
-  setDefLibpath();
-  setDefLibpath();  // the second call reads what the first one's buffer holds
-  EXPECT_STREQ(getenv("LD_LIBRARY_PATH"), "/a:/usr/lib");
-  setenv("LD_LIBRARY_PATH", (std::string(3000, 'y') + ":/usr/lib").c_str(), 1);
-  EXPECT_EQ(overflows(debugOutput(0, [] { setDefLibpath(); })), 0);
-  EXPECT_EQ(getenv("LD_LIBRARY_PATH"), std::string(2032, 'y'));
-  setenv("LD_LIBRARY_PATH", before.c_str(), 1);
 }
 
 TEST(CipherSpecs, GetTheStrongerCodeFirst) {
-  const std::string codes = "0102030405060708";
-  const std::string long58 = codes + codes + codes + "0102030405";
+  const std::string long58 = "0102030405060708010203040506070801020304050607080102030405";
   const struct {
     std::string before, after;
-    int overflows;
+    long overflows;
   } rows[] = {
       {"", "", 0},
       {"0A09", "0A09", 0},
-      {"090A", "0A090A", 0},
       {"35090A", "350A090A", 0},
       {"0905", "0905", 0},
       {"050A", "050A", 0},
-      {"0A090A", "0A090A", 0},
       {"09350A0A09", "0A09350A0A09", 0},
       {long58 + "090A", long58 + "0A090A", 0},
       {long58 + "09050A", long58 + "0A0905", 1},
@@ -165,44 +135,30 @@ TEST(CipherSpecs, GetTheStrongerCodeFirst) {
 
 // ---- The prompt ----
 
-struct Prompted {
-  std::string password;
-  std::string output;
-};
-
-Prompted prompted(int input) {
+// What the prompt makes of standard input, and what it prints.
+std::string prompted(int input) {
   FILE* stream = fdopen(input, "r");
   const Replaced<FILE*> standardInput(stdin, stream);
   testing::internal::CaptureStdout();
-  Prompted result;
-  result.password = taken(getPassword());
-  result.output = testing::internal::GetCapturedStdout();
+  const std::string password = taken(getPassword());
+  EXPECT_EQ(testing::internal::GetCapturedStdout(), "Enter password ==> \n");
   fclose(stream);
-  return result;
+  return password;
 }
 
 TEST(Prompt, ReadsALineAndDropsItsLastCharacter) {
-  const struct {
-    std::string input, password;
-  } rows[] = {
-      {"abc123\n", "abc123"},
-      {"abc123\nmore\n", "abc123"},
-      {"no newline", "no newlin"},
-      {"\n", ""},
-      {"", ""},
-      {std::string(253, 'x') + "\n", std::string(253, 'x')},
-      {std::string(254, 'x') + "\n", std::string(253, 'x')},
-      {std::string(400, 'x') + "\n", std::string(253, 'x')},
+  const std::string longest(253, 'x');
+  const std::pair<std::string, std::string> rows[] = {
+      {"abc123\nmore\n", "abc123"}, {"no newline", "no newlin"}, {"\n", ""}, {"", ""},
+      {longest + "\n", longest},    {longest + "x\n", longest},
   };
-  for (const auto& row : rows) {
-    SCOPED_TRACE(row.input);
+  for (const auto& [input, password] : rows) {
+    SCOPED_TRACE(input);
     int ends[2];
     ASSERT_EQ(pipe(ends), 0);
-    ASSERT_EQ(write(ends[1], row.input.data(), row.input.size()), static_cast<ssize_t>(row.input.size()));
+    ASSERT_EQ(write(ends[1], input.data(), input.size()), static_cast<ssize_t>(input.size()));
     close(ends[1]);
-    const Prompted result = prompted(ends[0]);
-    EXPECT_EQ(result.password, row.password);
-    EXPECT_EQ(result.output, "Enter password ==> \n");
+    EXPECT_EQ(prompted(ends[0]), password);
   }
 }
 
@@ -222,9 +178,8 @@ TEST(Prompt, SwitchesEchoOffWhileItReads) {
     } while ((now.c_lflag & (ECHO | ECHONL)) != 0);
     EXPECT_EQ(write(host, "secret\n", 7), 7);
   });
-  const Prompted result = prompted(dup(terminal));
+  EXPECT_EQ(prompted(dup(terminal)), "secret");
   typist.join();
-  EXPECT_EQ(result.password, "secret");
   termios after{};
   ASSERT_EQ(tcgetattr(terminal, &after), 0);
   EXPECT_EQ(after.c_lflag, before.c_lflag);
