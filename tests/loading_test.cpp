@@ -4,23 +4,16 @@
 #include <gtest/gtest.h>
 #include <sys/wait.h>
 
+#include <algorithm>
 #include <atomic>
 #include <thread>
 
 #include "dsutil.h"
 #include "failures.h"
+#include "oracle.h"
 
-namespace {
-
-using test::Body;
-using test::Lines;
-using test::TraceCapture;
-
-const char* installFolder = "install";  // null: cannot be told
-int failingPutEnvVar = 0;               // the number of the call that fails, from 1
-long failingAllocation = -1;
-
-}  // namespace
+static const char* installFolder = "install";  // null: cannot be told
+static int failingPutEnvVar = 0;               // the number of the call that fails, from 1
 
 // In place of those of the utility library.
 extern "C" char* getKUBInstallLibPath(void) {
@@ -31,6 +24,11 @@ extern "C" int putEnvVar(const char* name, const char* value) {
 }
 
 namespace {
+
+using test::Body;
+using test::failingAllocation;
+using test::Lines;
+using test::TraceCapture;
 
 // Runs the body in a child process, in a folder that holds the stand-ins asked for as the system's and as the shipped
 // copy, and returns what they were called with.
@@ -58,8 +56,6 @@ std::string staged(const char* system, const char* shipped, const Body& body) {
   return test::fileContent(folder.file("log"));
 }
 
-// ---- Loading ----
-
 constexpr char kHint[] = "Error - Check the supported version of TRESK in the install guide.\n";
 constexpr char kShipped[] = "loadQelCrypto: Loading shipped version of qel library.\n";
 constexpr char kNoStatus[] = "Error - loadQelCrypto: ldapGetSymAddress(pQEL_GetStatus) failed.\n";
@@ -72,107 +68,72 @@ struct Loading {
   const char *copyVariable, *attachPath;
   int state;  // 0 no library, 1 open, 2 and its first entry resolved, 3 and its last one
   Lines lines;
-  void (*breaks)() = [] {};
+  test::Failure failure = failingAllocation(-1);
 };
 
 // clang-format off
 const Loading kLoadings[] = {
     {"the system's copy", "complete", "complete", 0, "FALSE", "/toolkit", 3, {kToolkit}},
     {"attached above the shipped folder", nullptr, "complete", 0, "TRUE", "install", 3,
-     {"loadQelCrypto:- qelAttachPath = install/qel\n"}, [] { setenv("STANDIN_PATH", "install/qel", 1); }},
+     {"loadQelCrypto:- qelAttachPath = install/qel\n"}, [](const Body& body) { setenv("STANDIN_PATH", "install/qel", 1), body(); }},
     {"not quite the shipped folder", nullptr, "complete", 0, "TRUE", "install/qel/", 3,
-     {"loadQelCrypto:- qelAttachPath = install/qel/\n"}, [] { setenv("STANDIN_PATH", "install/qel/", 1); }},
+     {"loadQelCrypto:- qelAttachPath = install/qel/\n"}, [](const Body& body) { setenv("STANDIN_PATH", "install/qel/", 1), body(); }},
     {"an old system copy", "nopath", "complete", 0, "TRUE", "/toolkit", 3, {kHint, kShipped, kToolkit}},
     {"an old system copy alone", "nopath", nullptr, 1, "TRUE", nullptr, 0, {kHint, kShipped, kNoStatus}},
     {"an old shipped copy succeeds unresolved", nullptr, "nopath", 0, "TRUE", nullptr, 1,
      {"Error - loadQelCrypto: ldapGetSymAddress(pQEL_PATH) failed.\n", kHint}},
-    {"no copy", nullptr, nullptr, 1, "TRUE", nullptr, 0, {kNoStatus}},
     {"an entry lacking", "noseed", nullptr, 1, "FALSE", "/toolkit", 2,
      {kToolkit, "Error - loadQelCrypto: ldapGetSymAddress(pQEL_GenerateRandomSeed) failed.\n"}},
     {"no path", "complete", nullptr, 1, "FALSE", "", 1,
-     {"Error - loadQelCrypto: pQEL_PATH failed to get QEL library path.\n"}, [] { unsetenv("STANDIN_PATH"); }},
+     {"Error - loadQelCrypto: pQEL_PATH failed to get QEL library path.\n"}, [](const Body& body) { unsetenv("STANDIN_PATH"), body(); }},
     {"no install folder", "complete", nullptr, 1, "FALSE", "/toolkit", 1,
-     {kToolkit, "Error - loadQelCrypto: getKUBInstallLibPath failed.\n"}, [] { installFolder = nullptr; }},
+     {kToolkit, "Error - loadQelCrypto: getKUBInstallLibPath failed.\n"}, test::replacing(installFolder, nullptr)},
     {"no install folder to look in", nullptr, nullptr, 1, "TRUE", nullptr, 0,
-     {"Error - getKubInstallLibPath: getKUBInstallLibPath() failed. \n", kNoStatus}, [] { installFolder = nullptr; }},
+     {"Error - getKubInstallLibPath: getKUBInstallLibPath() failed. \n", kNoStatus}, test::replacing(installFolder, nullptr)},
     {"the second variable", nullptr, "complete", 7, "FALSE", nullptr, 0,
-     {"Error - loadQelCrypto: putEnvVar failed rc = 7\n"}, [] { failingPutEnvVar = 2; }},
+     {"Error - loadQelCrypto: putEnvVar failed rc = 7\n"}, test::replacing(failingPutEnvVar, 2)},
     {"no memory for the system path", "complete", nullptr, 1, "FALSE", nullptr, 0,
-     {" Memory allocation failed ! \n", kNoStatus}, [] { failingAllocation = 0; }},
-    {"no memory for the system cell", "complete", "complete", 0, "TRUE", "/toolkit", 3, {kToolkit},
-     [] { failingAllocation = 1; }},
+     {" Memory allocation failed ! \n", kNoStatus}, failingAllocation(0)},
     {"no memory for the attach path", "complete", nullptr, 90, "FALSE", nullptr, 1,
-     {"Error - loadQelCrypto: Out of Memory!.\n"}, [] { failingAllocation = 2; }},
+     {"Error - loadQelCrypto: Out of Memory!.\n"}, failingAllocation(2)},
     {"no memory for the shipped path", nullptr, "complete", 1, "TRUE", nullptr, 0,
-     {"Error - getKubInstallLibPath: kub_strlcat() failed. \n", kNoStatus}, [] { failingAllocation = 3; }},
+     {"Error - getKubInstallLibPath: kub_strlcat() failed. \n", kNoStatus}, failingAllocation(3)},
 };
 // clang-format on
 
-void load(const Loading& row) {
-  row.breaks();
-  char* attachPath = nullptr;
-  const TraceCapture trace(TraceCapture::kLinesOnly);
-  {
-    const test::AllocationWatch watch(failingAllocation);
-    EXPECT_EQ(loadQelCrypto(&attachPath), row.rc);
-  }
-  EXPECT_STREQ(getenv("TRESK_SHIPPED_QEL"), row.copyVariable);
-  std::string attached = row.attachPath != nullptr ? row.attachPath : "";
-  attached.resize(1024);
-  EXPECT_EQ(attachPath == nullptr, row.attachPath == nullptr);
-  EXPECT_TRUE(attachPath == nullptr || std::string(attachPath, 1024) == attached) << attachPath;
-  free(attachPath);
-  EXPECT_EQ((qelLoadGlobal != nullptr) + (pQEL_GetStatus != nullptr) + (pQEL_GenerateRandomSeed != nullptr), row.state);
-  EXPECT_EQ(trace.messages(), row.lines);
-  test::expectErrorClasses(trace);
-  unloadQelCrypto();
-}
-
 TEST(ProviderLoading, FindsACopyOrTellsWhatIsWrong) {
   for (const Loading& row : kLoadings) {
-    SCOPED_TRACE(row.name);
-    staged(row.system, row.shipped, [&] { load(row); });
-  }
-}
-
-TEST(ProviderLoading, LooksInTheSystemFolderUnlessTheModeIsLocal) {
-  for (const char* mode : {"", "1"}) {
-    staged(nullptr, nullptr, [mode] {
-      qelLibraryName = "libtresk7qels.so";
-      setenv("TRESK_LOCAL_INSTALL_MODE", mode, 1);
-      testing::internal::CaptureStderr();
-      set_ldap_debug(1);
+    staged(row.system, row.shipped, [&row] {
+      SCOPED_TRACE(row.name);
       char* attachPath = nullptr;
-      EXPECT_EQ(loadQelCrypto(&attachPath), 1);
-      std::string expected;
-      for (const std::string file :
-           {*mode == '1' ? "libtresk7qels.so" : "/usr/lib/libtresk7qels.so", "install/qel/qellib/libtresk7qels.so"}) {
-        expected += "c8110000 dlopen failed for " + file + ": " + file +
-                    ": cannot open shared object file: No such file or directory\n";
+      const TraceCapture trace(TraceCapture::kLinesOnly);
+      row.failure([&] { EXPECT_EQ(loadQelCrypto(&attachPath), row.rc); });
+      EXPECT_STREQ(getenv("TRESK_SHIPPED_QEL"), row.copyVariable);
+      EXPECT_STREQ(attachPath, row.attachPath);
+      if (attachPath != nullptr) {  // cleared to its end
+        EXPECT_EQ(std::string(attachPath, 1024).find_last_not_of('\0') + 1, std::strlen(attachPath));
       }
-      EXPECT_EQ(testing::internal::GetCapturedStderr(), expected);
+      free(attachPath);
+      const bool steps[] = {qelLoadGlobal != nullptr, pQEL_GetStatus != nullptr, pQEL_GenerateRandomSeed != nullptr};
+      EXPECT_EQ(std::count(steps, steps + 3, true), row.state);
+      EXPECT_EQ(trace.messages(), row.lines);
+      test::expectErrorClasses(trace);
+      unloadQelCrypto();
     });
   }
 }
 
-TEST(ProviderLoading, UsesAnOpenLibraryAgain) {
-  const std::string log = staged("complete", nullptr, [] {
+TEST(ProviderLoading, LooksInTheSystemFolderUnlessTheModeIsLocal) {
+  staged(nullptr, nullptr, [] {
+    setenv("TRESK_LOCAL_INSTALL_MODE", "", 1);
+    testing::internal::CaptureStderr();
+    set_ldap_debug(1);
     char* attachPath = nullptr;
-    EXPECT_EQ(loadQelCrypto(&attachPath), 0);
-    free(attachPath);
-    qelLibraryName = "not_there.so";  // not opened any more
-    void** cell = qelLoadGlobal;
-    EXPECT_EQ(loadQelCrypto(&attachPath), 0);
-    EXPECT_STREQ(attachPath, "/toolkit");
-    free(attachPath);
-    unloadQelCrypto();
-    EXPECT_EQ(qelLoadGlobal, cell);  // stays as it is, as does the table
-    EXPECT_NE(pQEL_Init, nullptr);
+    EXPECT_EQ(loadQelCrypto(&attachPath), 1);
+    const std::string log = testing::internal::GetCapturedStderr();
+    EXPECT_EQ(log.rfind("c8110000 dlopen failed for /usr/lib/./libtresk7qels.so: ", 0), 0U) << log;
   });
-  EXPECT_EQ(log, "closed\n");
 }
-
-// ---- The one context ----
 
 const std::string kCreation = "Init /toolkit\nSetValue 1 /toolkit\nSetValue 0 on\nAttach\n";
 
@@ -194,15 +155,31 @@ TEST(ProviderContext, IsOneForThreadsThatAskAtOnceAndCleanedUpAtExit) {
   EXPECT_EQ(log, kCreation + "Cleanup\nclosed\n");
 }
 
-TEST(ProviderContext, IsReleasedOnceHoweverOftenItIsUnloaded) {
+TEST(ProviderContext, IsMadeOverOneLibraryAndReleasedOnceHoweverOftenThatIsUnloaded) {
   const std::string log = staged("complete", nullptr, [] {
     void* context = nullptr;
+    char* attachPath = nullptr;
+    const TraceCapture trace;
     EXPECT_EQ(initQelCrypto(&context), 0);
+    EXPECT_EQ(test::outlineOf(trace),
+              ">initQelCrypto: Entering. qelCtx = #\n>loadQelCrypto: Entering. attachPath = #\n"
+              ">getQelInstallLibPath: Entering.\ngetQelInstallLibPath: Leaving. rc = 0\n<"
+              "loadQelCrypto:- qelAttachPath = /toolkit\nloadQelCrypto: Leaving. rc = 0\n<initQelCrypto: Leaving. "
+              "rc = 0\n<");
+    for (const test::Record& r : trace.records()) {
+      EXPECT_TRUE((r.id & 0xffff00ffU) == 0x50010000U && r.level == 43 && r.mask == 0x10000) << r.text;
+    }
+    qelLibraryName = "not_there.so";  // not opened any more
+    void** cell = qelLoadGlobal;
+    EXPECT_EQ(loadQelCrypto(&attachPath), 0);
+    EXPECT_EQ(test::taken(attachPath), "/toolkit");
     EXPECT_EQ(freeQelCrypto(nullptr), 0);
     EXPECT_EQ(freeQelCrypto(context), 0);
+    unloadQelCrypto();
+    unloadQelCrypto();
+    EXPECT_EQ(qelLoadGlobal, cell);  // stays as it is, as do the context and the table
     EXPECT_EQ(qelCtxGlobal, context);
-    unloadQelCrypto();
-    unloadQelCrypto();
+    EXPECT_NE(pQEL_Init, nullptr);
   });
   EXPECT_EQ(log, kCreation + "Cleanup\nCleanup\nclosed\n");
 }
@@ -238,22 +215,6 @@ TEST(ProviderContext, FailuresLeaveItAbsentAndMayBeRetried) {
     void* context = nullptr;
     EXPECT_EQ(initQelCrypto(&context), 1);
     EXPECT_EQ(context, nullptr);
-  });
-}
-
-TEST(ProviderContext, TracesTheLoadingInsideItsOwnScope) {
-  staged("complete", nullptr, [] {
-    void* context = nullptr;
-    const TraceCapture trace;
-    EXPECT_EQ(initQelCrypto(&context), 0);
-    EXPECT_EQ(test::outlineOf(trace),
-              ">initQelCrypto: Entering. qelCtx = #\n>loadQelCrypto: Entering. attachPath = #\n"
-              ">getQelInstallLibPath: Entering.\ngetQelInstallLibPath: Leaving. rc = 0\n<"
-              "loadQelCrypto:- qelAttachPath = /toolkit\nloadQelCrypto: Leaving. rc = 0\n<initQelCrypto: Leaving. "
-              "rc = 0\n<");
-    for (const test::Record& r : trace.records()) {
-      EXPECT_TRUE((r.id & 0xffff00ffU) == 0x50010000U && r.level == 43 && r.mask == 0x10000) << r.text;
-    }
   });
 }
 
