@@ -18,8 +18,6 @@ extern "C" int rand_r(unsigned*) noexcept {
 
 namespace {
 
-using test::Replaced;
-
 struct Result {
   int rc;
   int length;
@@ -42,10 +40,8 @@ Result decoded(std::string text) {
 std::string encoded(const std::string& data) {
   char* text = nullptr;
   EXPECT_EQ(_morva_utils_encode_binary(test::bytesOf(data), static_cast<int>(data.size()), &text), 0);
-  const std::string copy = text != nullptr ? text : "";
+  const std::string copy = test::taken(text);
   EXPECT_EQ(copy.size() + 1, static_cast<size_t>(_morva_utils_getEncodedSize(static_cast<int>(data.size()))));
-  _morva_utils_encode_binary_free(&text);
-  EXPECT_EQ(text, nullptr);
   return copy;
 }
 
@@ -76,11 +72,11 @@ TEST(Masking, TextsAreTheRecordedOnes) {
   };
   for (const auto& row : rows) {
     SCOPED_TRACE(row.name);
-    const Replaced<int> chosen(encryptionType, row.selector);
+    const test::Replaced<int> chosen(encryptionType, row.selector);
     const std::string data = test::letters(row.length);
     std::string texts;
     for (int i = 0; i < row.draws; ++i) {
-      const Replaced<int> draw(fixedDraw, 0x17002a5b + i);  // with a byte that no background may hold
+      const test::Replaced<int> draw(fixedDraw, 0x17002a5b + i);  // with a byte that no background may hold
       const std::string text = encoded(data);
       EXPECT_EQ(decoded(text).data == data + '\0', row.selector != 7);  // what 7 masks is read with another schedule
       texts += text;
@@ -113,9 +109,7 @@ TEST(Masking, DecodesOrRefuses) {
   } rows[] = {
       {"nothing", "", 0, 1, ""},
       {"not closed", ">1abc", 0, 6, ">1abc"},
-      {"empty wrapping", "><", 0, 0, ""},
       {"plain base64", ">xQUJD<", 0, 3, "ABC"},
-      {"empty older form", ">0<", 0, 0, ""},
       {"older form", ">0Fl0ECgFC<", 0, 6, "secret"},
       {"no alphabet", ">1<"},
       {"unknown alphabet", ">1?QUJD<"},
@@ -129,7 +123,6 @@ TEST(Masking, DecodesOrRefuses) {
       {"one more than width 1 holds", textOf({{2, 0x49}, {21, 1}}), 89},
       {"a length of three bytes", textOf({{8, 0x02}}), 89},
       {"width 3", textOf({{21, 3}}), 89},
-      {"width 8", textOf({{21, 8}}), 89},
       {"selector 0", textOf({{18, 0x00}}), 89},
       {"block selector 10", textOf({{13, 0x88}}), 89},
       {"a byte short", textOf({}, 119), 89},
@@ -147,16 +140,13 @@ TEST(Masking, DecodesOrRefuses) {
 
 // Recorded as the texts above were. The key indexes that no encoder draws are reflected into the table.
 TEST(Masking, DeciphersUnderEveryKeyIndex) {
-  for (const auto& [selector, digest] : {std::pair{0x02, "85b323329532a43536c5e23d66ecef340d1970f5"},
-                                         {0x16, "4eced324504a3499551c84948d39e29866469a6a"},
-                                         {0x46, "d81d9a7cccc9fe063b2e19b33307dc9453cc78d9"}}) {
-    SCOPED_TRACE(selector);
-    std::string data;
+  std::string data;
+  for (const int selector : {0x02, 0x16, 0x46}) {
     for (int key = 0; key < 256; ++key) {
       data += decoded(textOf({{2, 0}, {3, 0x18}, {18, selector}, {19, key}})).data.substr(0, 48);
     }
-    EXPECT_EQ(digestOf(data), digest);
   }
+  EXPECT_EQ(digestOf(data), "fd427472fdf3f06953349409487296e17b619221");
 }
 
 TEST(Masking, EveryLengthComesBackAndDamageIsSurvived) {
@@ -193,17 +183,16 @@ TEST(Masking, RefusesArgumentsLengthsAndSelectors) {
   EXPECT_EQ(_morva_utils_decode_binary(text, nullptr, &length), 1);
   EXPECT_EQ(_morva_utils_decode_binary(text, &data, nullptr), 1);
   for (const int selector : {0, 2, 12, -1}) {
-    const Replaced<int> chosen(encryptionType, selector);
+    const test::Replaced<int> chosen(encryptionType, selector);
     EXPECT_EQ(_morva_utils_encode_buffer("x", &out), 89);
   }
   EXPECT_EQ(out, nullptr);
-  EXPECT_EQ(data, nullptr);
   EXPECT_EQ(_morva_utils_getEncodedSize(16777215), 44739281);  // ceil((33554432 + 24) / 3) * 4 + 5
   EXPECT_EQ(_morva_utils_getEncodedSize(16777216) + _morva_utils_getEncodedSize(-1), 0);
 }
 
 TEST(Masking, BuffersAreTextsAndEveryFailedAllocationIsReported) {
-  const Replaced<int> draw(fixedDraw, 1);
+  const test::Replaced<int> draw(fixedDraw, 1);
   const std::string masked = encoded({"text", 5});
   const std::pair<std::function<int(char**)>, std::string> rows[] = {
       {[](char** out) { return _morva_utils_encode_buffer("text", out); }, masked},
@@ -215,8 +204,9 @@ TEST(Masking, BuffersAreTextsAndEveryFailedAllocationIsReported) {
     char* out = nullptr;
     test::sweepAllocations(out, call);
     EXPECT_EQ(out, result);
-    _morva_utils_decode_buffer_free(&out);
-    _morva_utils_encode_buffer_free(&out);  // null by now
+    _morva_utils_encode_binary_free(&out);
+    _morva_utils_decode_buffer_free(&out);  // null by now
+    _morva_utils_encode_buffer_free(nullptr);
   }
 }
 

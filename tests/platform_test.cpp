@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What meets the system: the loader wrappers, the library path, the repair of cipher specifications and the password
-// prompt.
+// The loader wrappers, the library path, the repair of cipher specifications and the password prompt.
 #include <dlfcn.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -40,10 +39,6 @@ TEST(Loader, OpensResolvesClosesAndTellsFailuresToTheDebugLogAlone) {
   EXPECT_EQ(ldapGetSymAddress(nullptr, "cos"), nullptr);
   EXPECT_EQ(ldapLoadLib(nullptr, 0), nullptr);
   EXPECT_EQ(ldapLoadLib("libutil.so.1", RTLD_NOW | RTLD_NOLOAD), nullptr);
-  {
-    const Replaced<int> flags(defFlags, RTLD_NOW | RTLD_NOLOAD);
-    EXPECT_EQ(ldapLoadLib("libutil.so.1", 0), nullptr);
-  }
   const auto noFile = [] { EXPECT_EQ(ldapLoadLib("/nowhere/lib.so", 0), nullptr); };
   const auto noSymbol = [&] { EXPECT_EQ(ldapGetSymAddress(cell, "no_such_symbol"), nullptr); };
   const auto noMemory = [] {
@@ -58,6 +53,8 @@ TEST(Loader, OpensResolvesClosesAndTellsFailuresToTheDebugLogAlone) {
   EXPECT_EQ(debugOutput(0, noFile) + debugOutput(0, noSymbol) + debugOutput(1, noMemory), "");
   EXPECT_EQ(ldapUnloadLib(cell), 0);
   EXPECT_EQ(ldapUnloadLib(nullptr), 80);
+  const Replaced<int> flags(defFlags, RTLD_NOW | RTLD_NOLOAD);
+  EXPECT_EQ(ldapLoadLib("libutil.so.1", 0), nullptr);
 }
 
 // The number of overflow lines in a debug log that holds nothing else.
@@ -140,19 +137,14 @@ TEST(Prompt, ReadsALineAndDropsItsLastCharacter) {
 }
 
 TEST(Prompt, SwitchesEchoOffWhileItReads) {
-  int host = -1;
-  int terminal = -1;
+  int host = -1, terminal = -1;
   ASSERT_EQ(openpty(&host, &terminal, nullptr, nullptr, nullptr), 0);
   termios before{};
   ASSERT_EQ(tcgetattr(terminal, &before), 0);
   before.c_lflag |= ECHO | ECHONL;
   ASSERT_EQ(tcsetattr(terminal, TCSANOW, &before), 0);
-  std::thread typist([host] {
-    termios now{};
-    do {
-      std::this_thread::yield();
-      tcgetattr(host, &now);
-    } while ((now.c_lflag & (ECHO | ECHONL)) != 0);
+  std::thread typist([host, before] {
+    for (termios now = before; (now.c_lflag & (ECHO | ECHONL)) != 0; tcgetattr(host, &now)) std::this_thread::yield();
     EXPECT_EQ(write(host, "secret\n", 7), 7);
   });
   EXPECT_EQ(prompted(fdopen(dup(terminal), "r")), "secret");

@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The contexts of ciphers and digests over provider entries that note how they are called, and the mapping of provider
-// statuses.
+// The contexts of ciphers and digests over provider entries that note how they are called, and provider statuses.
 #include <gtest/gtest.h>
 
 #include "failures.h"
@@ -22,7 +21,7 @@ struct Outcome {
 Outcome outcome;
 
 struct Pair {
-  const char *name, *entry, *byName;
+  std::string name, entry, byName;
   unsigned id;  // of the creation; the release has the next
   int (*init)(void*, void**, const char*, void**);
   int (*release)(void*, void*);
@@ -56,18 +55,16 @@ class ProviderPairs : public testing::TestWithParam<Pair> {
 };
 
 TEST_P(ProviderPairs, FollowTheProvider) {
-  const std::string entry = pair.entry;
-  const std::string byName = pair.byName;
   const struct {
     void (*breaks)();
     const char *calls, *scopes;  // entries as i> and f>, exits as their codes
     Lines lines;
   } rows[] = {
       {[] {}, "ni-name-cf", "i>0f>0", {}},
-      {[] { outcome.made = nullptr; }, "n", "i>1f>0", {line("init", entry + "_new() failed. rc = 1")}},
-      {[] { outcome.found = nullptr; }, "ni-name-cf", "i>f>01f>0", {line("init", byName + "() failed. rc = 1")}},
-      {[] { outcome.cleaned = 0; }, "ni-name-c", "i>0f>1", {line("free", entry + "_cleanup() failed. rc = 0")}},
-      {[] { outcome.freed = 2; }, "ni-name-cf", "i>0f>1", {line("free", entry + "_free() failed. rc = 2")}},
+      {[] { outcome.made = nullptr; }, "n", "i>1f>0", {line("init", pair.entry + "_new() failed. rc = 1")}},
+      {[] { outcome.found = nullptr; }, "ni-name-cf", "i>f>01f>0", {line("init", pair.byName + "() failed. rc = 1")}},
+      {[] { outcome.cleaned = 0; }, "ni-name-c", "i>0f>1", {line("free", pair.entry + "_cleanup() failed. rc = 0")}},
+      {[] { outcome.freed = 2; }, "ni-name-cf", "i>0f>1", {line("free", pair.entry + "_free() failed. rc = 2")}},
   };
   for (const auto& row : rows) {
     SCOPED_TRACE(row.scopes);
