@@ -1,109 +1,97 @@
 // SPDX-License-Identifier: Apache-2.0
-// The contexts of ciphers and digests over provider entries that note how they are called, and the mapping of provider
-// statuses.
+// The contexts of ciphers and digests over provider entries that note how they are called, and provider statuses.
 #include <gtest/gtest.h>
 
-#include <string>
-
-#include "crypto_provider.h"
-#include "support.h"
+#include "failures.h"
 
 namespace {
 
-using test::Replaced;
+using test::Lines;
 using test::TraceCapture;
-using Lines = std::vector<std::string>;
 
-std::string calls;
-void* newResult = nullptr;
-const void* byNameResult = nullptr;
-int cleanupResult = 1;
-int freeResult = 1;
 char provider, madeContext, algorithmObject;
+std::string calls;
 
-void* noteNew(void*) {
-  calls += "new ";
-  return newResult;
-}
-int noteInit(void*, void* context) {
-  calls += context == &madeContext ? "init " : "init? ";
-  return 0;
-}
-const void* noteByName(void*, const char* name) {
-  calls += std::string(name) + " ";
-  return byNameResult;
-}
-int noteCleanup(void*, void*) {
-  calls += "cleanup ";
-  return cleanupResult;
-}
-int noteFree(void*, void*) {
-  calls += "free ";
-  return freeResult;
-}
+// What the entries give.
+struct Outcome {
+  void* made = &madeContext;
+  const void* found = &algorithmObject;
+  int started = 0, cleaned = 1, freed = 1;
+};
+Outcome outcome;
 
 struct Pair {
-  const char* name;
+  std::string name, entry, byName;
+  unsigned id;  // of the creation; the release has the next
   int (*init)(void*, void**, const char*, void**);
   int (*release)(void*, void*);
-  const char *initInvalid, *newFailed, *byNameFailed, *freeInvalid, *cleanupFailed, *freeFailed;
-};
-
-const Pair pairs[] = {
-    {"Cipher", initQelCipher, freeQelCipher, "Error - initQelCipher: Invalid parameter. rc = 1\n",
-     "Error - initQelCipher: QEL_EVP_CIPHER_CTX_new() failed. rc = 1\n",
-     "Error - initQelCipher: QEL_EVP_get_cipherbyname() failed. rc = 1\n",
-     "Error - freeQelCipher: Invalid parameter. rc = 1\n",
-     "Error - freeQelCipher: QEL_EVP_CIPHER_CTX_cleanup() failed. rc = 0\n",
-     "Error - freeQelCipher: QEL_EVP_CIPHER_CTX_free() failed. rc = 2\n"},
-    {"Digest", initQelDigest, freeQelDigest, "Error - initQelDigest: Invalid parameter. rc = 1\n",
-     "Error - initQelDigest: QEL_EVP_MD_CTX_new() failed. rc = 1\n",
-     "Error - initQelDigest: QEL_EVP_get_digestbyname() failed. rc = 1\n",
-     "Error - freeQelDigest: Invalid parameter. rc = 1\n",
-     "Error - freeQelDigest: QEL_EVP_MD_CTX_cleanup() failed. rc = 0\n",
-     "Error - freeQelDigest: QEL_EVP_MD_CTX_free() failed. rc = 2\n"},
 };
 
 class ProviderPairs : public testing::TestWithParam<Pair> {
  protected:
-  void SetUp() override {
-    calls.clear();
-    newResult = &madeContext;
-    byNameResult = &algorithmObject;
-    cleanupResult = freeResult = 1;
-    pQEL_EVP_CIPHER_CTX_new = pQEL_EVP_MD_CTX_new = noteNew;
-    pQEL_EVP_CIPHER_CTX_init = pQEL_EVP_MD_CTX_init = noteInit;
-    pQEL_EVP_get_cipherbyname = pQEL_EVP_get_digestbyname = noteByName;
-    pQEL_EVP_CIPHER_CTX_cleanup = pQEL_EVP_MD_CTX_cleanup = noteCleanup;
-    pQEL_EVP_CIPHER_CTX_free = pQEL_EVP_MD_CTX_free = noteFree;
-    unused(GetParam().name);
+  void SetUp() override {  // the entries of the other pair are not to be called
+    const bool cipher = pair.init == initQelCipher;
+    pQEL_EVP_CIPHER_CTX_new = pQEL_EVP_MD_CTX_new = nullptr;
+    pQEL_EVP_CIPHER_CTX_init = pQEL_EVP_CIPHER_CTX_cleanup = pQEL_EVP_CIPHER_CTX_free = nullptr;
+    pQEL_EVP_MD_CTX_init = pQEL_EVP_MD_CTX_cleanup = pQEL_EVP_MD_CTX_free = nullptr;
+    pQEL_EVP_get_cipherbyname = pQEL_EVP_get_digestbyname = nullptr;
+    (cipher ? pQEL_EVP_CIPHER_CTX_new : pQEL_EVP_MD_CTX_new) = [](void*) { return calls += 'n', outcome.made; };
+    (cipher ? pQEL_EVP_CIPHER_CTX_init : pQEL_EVP_MD_CTX_init) = noting<'i', &Outcome::started>;
+    (cipher ? pQEL_EVP_CIPHER_CTX_cleanup : pQEL_EVP_MD_CTX_cleanup) = noting<'c', &Outcome::cleaned>;
+    (cipher ? pQEL_EVP_CIPHER_CTX_free : pQEL_EVP_MD_CTX_free) = noting<'f', &Outcome::freed>;
+    (cipher ? pQEL_EVP_get_cipherbyname : pQEL_EVP_get_digestbyname) = [](void*, const char* name) {
+      return calls += name, outcome.found;
+    };
   }
-  // The entries of the other pair are not to be called.
-  void unused(const std::string& used) {
-    (used == "Cipher" ? pQEL_EVP_MD_CTX_new : pQEL_EVP_CIPHER_CTX_new) = nullptr;
-    (used == "Cipher" ? pQEL_EVP_MD_CTX_init : pQEL_EVP_CIPHER_CTX_init) = nullptr;
-    (used == "Cipher" ? pQEL_EVP_get_digestbyname : pQEL_EVP_get_cipherbyname) = nullptr;
-    (used == "Cipher" ? pQEL_EVP_MD_CTX_cleanup : pQEL_EVP_CIPHER_CTX_cleanup) = nullptr;
-    (used == "Cipher" ? pQEL_EVP_MD_CTX_free : pQEL_EVP_CIPHER_CTX_free) = nullptr;
+  template <char kNote, int Outcome::*kResult>
+  static int noting(void*, void* context) {
+    return calls += context == &madeContext ? kNote : '?', outcome.*kResult;
   }
-  void* context = nullptr;
-  void* algorithm = nullptr;
+  std::string line(const char* operation, const std::string& what) const {
+    return std::string("Error - ") + operation + "Qel" + pair.name + ": " + what + "\n";
+  }
+  const Pair pair = GetParam();
+  void *context = nullptr, *algorithm = nullptr;
 };
 
-TEST_P(ProviderPairs, MakeAndRelease) {
-  const Pair& pair = GetParam();
-  const TraceCapture trace;
-  EXPECT_EQ(pair.init(&provider, &context, "name", &algorithm), 0);
-  EXPECT_EQ(context, &madeContext);
-  EXPECT_EQ(algorithm, &algorithmObject);
-  EXPECT_EQ(pair.release(&provider, context), 0);
-  EXPECT_EQ(pair.release(&provider, nullptr), 0);
-  EXPECT_EQ(calls, "new init name cleanup free ");
-  EXPECT_EQ(trace.messages(), Lines{});
+TEST_P(ProviderPairs, FollowTheProvider) {
+  const struct {
+    void (*breaks)();
+    const char *calls, *scopes;  // entries as i> and f>, exits as their codes
+    Lines lines;
+  } rows[] = {
+      {[] {}, "ni-name-cf", "i>0f>0", {}},
+      {[] { outcome.made = nullptr; }, "n", "i>1f>0", {line("init", pair.entry + "_new() failed. rc = 1")}},
+      {[] { outcome.found = nullptr; }, "ni-name-cf", "i>f>01f>0", {line("init", pair.byName + "() failed. rc = 1")}},
+      {[] { outcome.cleaned = 0; }, "ni-name-c", "i>0f>1", {line("free", pair.entry + "_cleanup() failed. rc = 0")}},
+      {[] { outcome.freed = 2; }, "ni-name-cf", "i>0f>1", {line("free", pair.entry + "_free() failed. rc = 2")}},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.scopes);
+    outcome = {};
+    row.breaks();
+    calls.clear();
+    context = algorithm = nullptr;
+    const TraceCapture trace;
+    const int created = pair.init(&provider, &context, "-name-", &algorithm);
+    EXPECT_EQ(context, created == 0 ? &madeContext : nullptr);
+    EXPECT_EQ(algorithm, created == 0 ? &algorithmObject : nullptr);
+    const int released = pair.release(&provider, context);
+    EXPECT_EQ(calls, row.calls);
+    std::string scopes;
+    for (const test::Record& r : trace.records()) {
+      if (r.kind == LDTR_ENTRY) scopes += r.id == pair.id ? "i>" : r.id == pair.id + 0x100 ? "f>" : "?>";
+      if (r.kind == LDTR_EXIT) scopes += std::to_string(r.rc);
+    }
+    EXPECT_EQ(scopes, row.scopes);
+    EXPECT_EQ(std::to_string(created) + "f>" + std::to_string(released), scopes.substr(scopes.size() - 4));
+    EXPECT_EQ(trace.messages(), row.lines);
+    test::expectErrorClasses(trace);
+  }
 }
 
 TEST_P(ProviderPairs, RefuseNulls) {
-  const Pair& pair = GetParam();
+  calls.clear();
   const TraceCapture trace;
   EXPECT_EQ(pair.init(nullptr, &context, "name", &algorithm), 1);
   EXPECT_EQ(pair.init(&provider, nullptr, "name", &algorithm), 1);
@@ -112,98 +100,44 @@ TEST_P(ProviderPairs, RefuseNulls) {
   EXPECT_EQ(pair.release(nullptr, &madeContext), 1);
   EXPECT_EQ(pair.release(nullptr, nullptr), 1);
   EXPECT_EQ(calls, "");
-  EXPECT_EQ(trace.messages(), (Lines{pair.initInvalid, pair.initInvalid, pair.initInvalid, pair.initInvalid,
-                                     pair.freeInvalid, pair.freeInvalid}));
+  Lines expected(4, line("init", "Invalid parameter. rc = 1"));
+  expected.resize(6, line("free", "Invalid parameter. rc = 1"));
+  EXPECT_EQ(trace.messages(), expected);
 }
 
-TEST_P(ProviderPairs, FailAsTheProviderDoes) {
-  const Pair& pair = GetParam();
-  const TraceCapture trace;
-  newResult = nullptr;
-  EXPECT_EQ(pair.init(&provider, &context, "name", &algorithm), 1);
-  EXPECT_EQ(calls, "new ");
-  newResult = &madeContext;
-  byNameResult = nullptr;
-  calls.clear();
-  EXPECT_EQ(pair.init(&provider, &context, "name", &algorithm), 1);
-  EXPECT_EQ(context, nullptr);
-  EXPECT_EQ(calls, "new init name cleanup free ");
-  calls.clear();
-  cleanupResult = 0;
-  EXPECT_EQ(pair.release(&provider, &madeContext), 1);
-  EXPECT_EQ(calls, "cleanup ");  // what cannot be cleaned is not released
-  cleanupResult = 1;
-  freeResult = 2;
-  EXPECT_EQ(pair.release(&provider, &madeContext), 1);
-  EXPECT_EQ(trace.messages(), (Lines{pair.newFailed, pair.byNameFailed, pair.cleanupFailed, pair.freeFailed}));
-  for (const test::Record& r : trace.records()) {
-    const bool error = r.text.rfind("Error - ", 0) == 0;
-    EXPECT_EQ(r.severity, error ? LDTR_ERROR : LDTR_DEBUG) << r.text;
-  }
-}
+INSTANTIATE_TEST_SUITE_P(Both, ProviderPairs,
+                         testing::Values(Pair{"Cipher", "QEL_EVP_CIPHER_CTX", "QEL_EVP_get_cipherbyname", 0x50010600,
+                                              initQelCipher, freeQelCipher},
+                                         Pair{"Digest", "QEL_EVP_MD_CTX", "QEL_EVP_get_digestbyname", 0x50010800,
+                                              initQelDigest, freeQelDigest}));
 
-TEST_P(ProviderPairs, TraceTheReleaseInsideAFailedCreation) {
-  const Pair& pair = GetParam();
-  byNameResult = nullptr;
-  const TraceCapture trace;
-  EXPECT_EQ(pair.init(&provider, &context, "name", &algorithm), 1);
-  std::string order;
-  for (const test::Record& r : trace.records()) {
-    order += r.kind == LDTR_ENTRY ? "> " : r.kind == LDTR_EXIT ? std::to_string(r.rc) + "< " : "";
-    if (r.kind == LDTR_LINE) order += r.text.substr(0, r.text.find_first_of(":.")) + " ";
-  }
-  const std::string name = pair.name;
-  EXPECT_EQ(order, "> initQel" + name + " Error - initQel" + name + " > freeQel" + name + " freeQel" + name +
-                       " 0< initQel" + name + " 1< ");
-}
+QelStatus known;
 
-INSTANTIATE_TEST_SUITE_P(Both, ProviderPairs, testing::ValuesIn(pairs),
-                         [](const auto& chosen) { return std::string(chosen.param.name); });
-
-// ---- Statuses ----
-
-TEST(ProviderStatus, MapsToAnLdapCodeAndShowsItself) {
-  static const struct {
+TEST(ProviderStatus, MapsToAnLdapCodeAndShowsItselfGivenOrAskedFor) {
+  const std::string longest(sizeof known.desc, 'x');
+  const struct {
     int major, minor, rc;
-    const char* output;
+    std::string description, output;
   } rows[] = {
-      {0, 15, 0, ""},
-      {3, 0, 1, "QEL Status - \nmajRC: 3\nminRC: 0\ndesc: what happened\n"},
-      {3, 14, 1, "QEL Status - \nmajRC: 3\nminRC: 14\ndesc: what happened\n"},
-      {3, 15, 90, "QEL Status - \nmajRC: 3\nminRC: 15\ndesc: what happened\n"},
-      {-1, 16, 1, "QEL Status - \nmajRC: -1\nminRC: 16\ndesc: what happened\n"},
-      {1, -1, 1, "QEL Status - \nmajRC: 1\nminRC: -1\ndesc: what happened\n"},
+      {0, 15, 0, "unseen", ""},
+      {3, 14, 1, "what happened", "QEL Status - \nmajRC: 3\nminRC: 14\ndesc: what happened\n"},
+      {-1, 16, 1, "", "QEL Status - \nmajRC: -1\nminRC: 16\ndesc: \n"},
+      {1, 15, 90, longest, "QEL Status - \nmajRC: 1\nminRC: 15\ndesc: " + longest + "\n"},
   };
-  const Replaced notAsked(
-      pQEL_GetStatus, +[](void*, QelStatus*) {
-        ADD_FAILURE() << "a given record stands as it is";
-        return 0;
-      });
-  for (const auto& row : rows) {
-    QelStatus status{row.major, row.minor, "what happened"};
-    testing::internal::CaptureStdout();
-    EXPECT_EQ(qelStatusToLdap(&provider, &status), row.rc);
-    EXPECT_EQ(testing::internal::GetCapturedStdout(), row.output);
-  }
-  QelStatus endless{1, 15, ""};
-  std::memset(endless.desc, 'x', sizeof endless.desc);
-  testing::internal::CaptureStdout();
-  EXPECT_EQ(qelStatusToLdap(nullptr, &endless), 90);
-  EXPECT_EQ(testing::internal::GetCapturedStdout(),
-            "QEL Status - \nmajRC: 1\nminRC: 15\ndesc: " + std::string(260, 'x') + "\n");
-}
-
-TEST(ProviderStatus, IsAskedOfTheContextWhenNoneIsGiven) {
-  const Replaced asked(
+  const test::Replaced asked(
       pQEL_GetStatus, +[](void* context, QelStatus* status) {
         EXPECT_EQ(context, &provider);
         EXPECT_EQ(test::toHex(status, sizeof *status), std::string(536, '0'));
-        *status = {4, 15, "no memory"};
-        return 0;
+        return *status = known, 0;
       });
-  testing::internal::CaptureStdout();
-  EXPECT_EQ(qelStatusToLdap(&provider, nullptr), 90);
-  EXPECT_EQ(testing::internal::GetCapturedStdout(), "QEL Status - \nmajRC: 4\nminRC: 15\ndesc: no memory\n");
+  for (const auto& row : rows) {
+    known = {row.major, row.minor, ""};
+    row.description.copy(known.desc, sizeof known.desc);
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(qelStatusToLdap(nullptr, &known), row.rc);
+    EXPECT_EQ(qelStatusToLdap(&provider, nullptr), row.rc);
+    EXPECT_EQ(testing::internal::GetCapturedStdout(), row.output + row.output);
+  }
   const TraceCapture trace;
   EXPECT_EQ(qelStatusToLdap(nullptr, nullptr), 1);
   EXPECT_EQ(trace.messages(), Lines{"Error - qelStatusToLdap: Invalid parameter. rc = 1\n"});
