@@ -16,7 +16,8 @@
 static const QelStatus zero;
 
 static void note(const QelStatus* status, const char* call, const char* value) {
-  FILE* file = fopen(getenv("STANDIN_LOG"), "a");
+  const char* path = getenv("STANDIN_LOG");
+  FILE* file = path == NULL ? NULL : fopen(path, "a");
   if (file == NULL) return;
   fprintf(file, "%s%s%s\n", call, value, memcmp(status, &zero, sizeof zero) != 0 ? " over a used status" : "");
   fclose(file);
