@@ -64,23 +64,23 @@ struct Loading {
   const char *system, *shipped;  // stand-ins
   int rc;
   const char *copyVariable, *attachPath;
-  int state;  // 0 no library, 1 open, 2 and its first entry resolved, 3 and its last one
+  int state;  // 0 no library, 1 open, 3 and all entries but the last resolved, 4 that too
   Lines lines;
   test::Failure failure = failingAllocation(-1);
 };
 
 // clang-format off
 const Loading kLoadings[] = {
-    {"the system's copy", "complete", "complete", 0, "FALSE", "/toolkit", 3, {kToolkit}},
-    {"attached above the shipped folder", nullptr, "complete", 0, "TRUE", "install", 3,
+    {"the system's copy", "complete", "complete", 0, "FALSE", "/toolkit", 4, {kToolkit}},
+    {"attached above the shipped folder", nullptr, "complete", 0, "TRUE", "install", 4,
      {"loadQelCrypto:- qelAttachPath = install/qel\n"}, [](const Body& body) { setenv("STANDIN_PATH", "install/qel", 1), body(); }},
-    {"not quite the shipped folder", nullptr, "complete", 0, "TRUE", "install/qel/", 3,
+    {"not quite the shipped folder", nullptr, "complete", 0, "TRUE", "install/qel/", 4,
      {"loadQelCrypto:- qelAttachPath = install/qel/\n"}, [](const Body& body) { setenv("STANDIN_PATH", "install/qel/", 1), body(); }},
-    {"an old system copy", "nopath", "complete", 0, "TRUE", "/toolkit", 3, {kHint, kShipped, kToolkit}},
+    {"an old system copy", "nopath", "complete", 0, "TRUE", "/toolkit", 4, {kHint, kShipped, kToolkit}},
     {"an old system copy alone", "nopath", nullptr, 1, "TRUE", nullptr, 0, {kHint, kShipped, kNoStatus}},
     {"an old shipped copy succeeds unresolved", nullptr, "nopath", 0, "TRUE", nullptr, 1,
      {"Error - loadQelCrypto: ldapGetSymAddress(pQEL_PATH) failed.\n", kHint}},
-    {"an entry lacking", "noseed", nullptr, 1, "FALSE", "/toolkit", 2,
+    {"an entry lacking", "noseed", nullptr, 1, "FALSE", "/toolkit", 3,
      {kToolkit, "Error - loadQelCrypto: ldapGetSymAddress(pQEL_GenerateRandomSeed) failed.\n"}},
     {"no path", "complete", nullptr, 1, "FALSE", "", 1,
      {"Error - loadQelCrypto: pQEL_PATH failed to get QEL library path.\n"}, [](const Body& body) { unsetenv("STANDIN_PATH"), body(); }},
@@ -111,8 +111,9 @@ TEST(ProviderLoading, FindsACopyOrTellsWhatIsWrong) {
       EXPECT_TRUE(attachPath == nullptr ||
                   std::string(attachPath, 1024).find_last_not_of('\0') + 1 == std::strlen(attachPath));
       free(attachPath);
-      EXPECT_EQ((qelLoadGlobal != nullptr) + (pQEL_GetStatus != nullptr) + (pQEL_GenerateRandomSeed != nullptr),
-                row.state);
+      const bool resolved[] = {pQEL_GetStatus != nullptr, pQEL_RAND_seed != nullptr,
+                               pQEL_GenerateRandomSeed != nullptr};
+      EXPECT_EQ((qelLoadGlobal != nullptr) + resolved[0] + resolved[1] + resolved[2], row.state);
       EXPECT_EQ(trace.messages(), row.lines);
       test::expectErrorClasses(trace);
       unloadQelCrypto();
