@@ -44,6 +44,10 @@ inline Failure withoutProvider() {
               both(replacing(qelLibraryName, "not_there.so"), replacing(pQEL_GetStatus, nullptr)));
 }
 
+inline Failure withoutDigests() {
+  return replacing(pQEL_EVP_get_digestbyname, [](void*, const char*) -> const void* { return nullptr; });
+}
+
 struct FailureCase {
   int rc;
   Lines lines;
@@ -64,6 +68,32 @@ inline void expectFailures(const std::vector<FailureCase>& rows, int severity, c
     }
   }
 }
+
+// A failing step, and what is told of it: whole, or without the name before it and the code behind it.
+struct FailingStep {
+  int rc;
+  std::string says;
+  Failure failure;
+};
+
+// An operation with its arguments, the name that its lines give, and their class.
+struct Operation {
+  std::string name;
+  std::function<int()> call;
+  int severity = LDTR_ERROR;
+
+  int operator()() const { return call(); }
+  void fails(const std::vector<FailingStep>& rows) const {
+    for (const FailingStep& row : rows) {
+      const std::string usual = "Error - " + name + ": " + row.says + " rc = " + std::to_string(row.rc) + "\n";
+      expectFailures({{row.rc, {row.says.back() == '\n' ? row.says : usual}, row.failure}}, severity, call);
+    }
+  }
+  template <class... Slots>
+  void refusesNulls(Slots&... slots) const {
+    fails({{1, "Invalid parameter.", replacing(slots, nullptr)}...});
+  }
+};
 
 // Digests that do nothing, for failures that lie behind thousands of rounds.
 inline Failure withQuickDigests() {

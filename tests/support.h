@@ -185,7 +185,7 @@ inline AesKeyData* fixedRecord() {
   return record;
 }
 
-// A record's buffers in the order of a stash file, and those of fixedRecord.
+// A record's buffers in the order of a stash file, those of fixedRecord, and its file.
 inline std::string contentOf(const AesKeyData& record) {
   std::string content;
   for (const SecBuffer* buffer = &record.cryptoSync; buffer != record.aesKeys + 3; ++buffer) {
@@ -199,6 +199,9 @@ inline std::string fixedContent() {
     for (int i = 0; i < length; ++i) content += static_cast<char>(i);
   }
   return content;
+}
+inline std::string fixedFile() {
+  return std::string("\x08\0\0\0", 4) + fixedContent();
 }
 
 }  // namespace test
