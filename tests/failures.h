@@ -5,7 +5,6 @@
 #include <gtest/gtest.h>
 
 #include <functional>
-#include <initializer_list>
 #include <string>
 #include <type_traits>
 #include <vector>
@@ -58,32 +57,14 @@ inline Failure withoutProvider() {
               both(replacing(qelLibraryName, "not_there.so"), replacing(pQEL_GetStatus, nullptr)));
 }
 
+inline Failure withoutDigests() {
+  return replacing(pQEL_EVP_get_digestbyname, [](void*, const char*) -> const void* { return nullptr; });
+}
+
 struct FailureCase {
   int rc;
   Lines lines;
   Failure failure;
-};
-
-// The rows of one operation, whose own lines have the usual shape.
-class Rows {
- public:
-  explicit Rows(const std::string& name) : start_("Error - " + name + ": ") {}
-
-  // Arguments that are refused, each alone.
-  Rows& refuses(std::initializer_list<Failure> arguments) {
-    for (const Failure& argument : arguments) fails(1, "Invalid parameter.", argument);
-    return *this;
-  }
-  Rows& fails(int rc, const std::string& what, const Failure& failure, Lines before = {}) {
-    before.push_back(start_ + what + " rc = " + std::to_string(rc) + "\n");
-    rows_.push_back({rc, before, failure});
-    return *this;
-  }
-  operator const std::vector<FailureCase>&() const { return rows_; }
-
- private:
-  std::string start_;
-  std::vector<FailureCase> rows_;
 };
 
 // The last line is the operation's own, and of its class.
@@ -100,6 +81,32 @@ inline void expectFailures(const std::vector<FailureCase>& rows, int severity, c
     }
   }
 }
+
+// A failing step, and what is told of it: whole, or without the name before it and the code behind it.
+struct FailingStep {
+  int rc;
+  std::string says;
+  Failure failure;
+};
+
+// An operation with its arguments, the name that its lines give, and their class.
+struct Operation {
+  std::string name;
+  std::function<int()> call;
+  int severity = LDTR_ERROR;
+
+  int operator()() const { return call(); }
+  void fails(const std::vector<FailingStep>& rows) const {
+    for (const FailingStep& row : rows) {
+      const std::string usual = "Error - " + name + ": " + row.says + " rc = " + std::to_string(row.rc) + "\n";
+      expectFailures({{row.rc, {row.says.back() == '\n' ? row.says : usual}, row.failure}}, severity, call);
+    }
+  }
+  template <class... Slots>
+  void refusesNulls(Slots&... slots) const {
+    fails({{1, "Invalid parameter.", replacing(slots, nullptr)}...});
+  }
+};
 
 // Digests that do nothing, for failures that lie behind thousands of rounds.
 inline Failure withQuickDigests() {

@@ -1,117 +1,86 @@
 // SPDX-License-Identifier: Apache-2.0
 // Key data records and the process-wide key state.
-#include <gtest/gtest.h>
-
 #include "failures.h"
 #include "oracle.h"
 
+using namespace test;
+
 namespace {
 
-using test::contentOf;
-using test::failingAllocation;
-using test::fixedFile;
-using test::fixedRecord;
-using test::Lines;
-using test::putFile;
-using test::Replaced;
-using test::replacing;
-using test::TempFolder;
-using test::textOf;
-using test::TraceCapture;
-
-constexpr char kSalt[] = "saltsaltsalt";
-
-// ---- Records ----
-
 TEST(KeyRecords, StartAsZerosAndAreCopiedWhole) {
-  AesKeyData* empty = nullptr;
+  AesKeyData *empty = nullptr, *copy = nullptr;
   ASSERT_EQ(initAesKeyData(&empty), 0);
+  EXPECT_EQ(contentOf(*empty), std::string(12 + 16 + 24 + 32, '\0'));
   EXPECT_EQ(empty->cryptoSync.data, nullptr);
-  EXPECT_EQ(empty->cryptoSync.length, 0U);
-  EXPECT_EQ(textOf(empty->cryptoSalt), std::string(12, '\0'));
-  EXPECT_EQ(empty->cryptoSalt.data[12], 0);
-  for (const size_t i : {0U, 1U, 2U}) EXPECT_EQ(textOf(empty->aesKeys[i]), std::string(16 + 8 * i, '\0'));
-  AesKeyData* record = fixedRecord();
-  AesKeyData* copy = nullptr;
+  AesKeyData* const record = fixedRecord();
   ASSERT_EQ(copyAesKeyData(record, &copy), 0);
-  EXPECT_EQ(contentOf(*copy), test::fixedContent());
+  EXPECT_EQ(contentOf(*copy), fixedContent());
   EXPECT_STREQ(reinterpret_cast<char*>(copy->cryptoSync.data), "c3luYw==");
-  EXPECT_STREQ(reinterpret_cast<char*>(copy->cryptoSalt.data), kSalt);
+  EXPECT_STREQ(reinterpret_cast<char*>(copy->cryptoSalt.data), "saltsaltsalt");
   freeAesKeyData(copy);
   record->aesKeys[1].length = 20;  // the copy's length is the key's own
   ASSERT_EQ(copyAesKeyData(record, &copy), 0);
   EXPECT_EQ(textOf(copy->aesKeys[1]), textOf(record->aesKeys[1]) + std::string(4, '\0'));
-  for (AesKeyData* each : {empty, record, copy}) EXPECT_EQ(freeAesKeyData(each), 0);
-  EXPECT_EQ(freeAesKeyData(nullptr), 0);
+  copy->cryptoSync.data[0] = copy->cryptoSalt.data[0] = 'X';
+  for (AesKeyData* each : {record, copy, std::exchange(empty, nullptr), empty}) EXPECT_EQ(freeAesKeyData(each), 0);
 }
 
 TEST(KeyRecords, ReportWhatTheyLack) {
-  AesKeyData* const record = fixedRecord();
-  AesKeyData* empty = nullptr;
-  ASSERT_EQ(initAesKeyData(&empty), 0);
+  AesKeyData *const record = fixedRecord(), *out = nullptr, **slot = &out;
   const AesKeyData* source = record;
-  AesKeyData* out = nullptr;
-  AesKeyData** slot = &out;
-  test::expectFailures(test::Rows("initAesKeyData")
-                           .refuses({replacing(slot, nullptr)})
-                           .fails(90, "calloc(keyData) returned NULL.", failingAllocation(0))
-                           .fails(90, "calloc(cryptoSalt) returned NULL.", failingAllocation(1))
-                           .fails(90, "calloc(aesKeys) returned NULL.", failingAllocation(2))
-                           .fails(90, "calloc(aesKeys) returned NULL.", failingAllocation(4)),
-                       LDTR_ERROR, [&] { return initAesKeyData(slot); });
-  test::expectFailures(
-      test::Rows("copyAesKeyData")
-          .refuses({replacing(source, nullptr), replacing(source, empty), replacing(slot, nullptr)})
-          .fails(90, "calloc(keyDataCopy) returned NULL.", failingAllocation(0))
-          .fails(90, "calloc(cryptoSalt) returned NULL.", failingAllocation(1))  // of the sync text too
-          .fails(90, "calloc(cryptoSalt) returned NULL.", failingAllocation(2))
-          .fails(90, "calloc(aesKeys) returned NULL.", failingAllocation(3))
-          .fails(90, "calloc(aesKeys) returned NULL.", failingAllocation(5)),
-      LDTR_ERROR, [&] { return copyAesKeyData(source, slot); });
+  const Operation init{"initAesKeyData", [&] { return initAesKeyData(slot); }};
+  const Operation copy{"copyAesKeyData", [&] { return copyAesKeyData(source, slot); }};
+  init.refusesNulls(slot);
+  init.fails({{90, "calloc(keyData) returned NULL.", failingAllocation(0)},
+              {90, "calloc(cryptoSalt) returned NULL.", failingAllocation(1)},
+              {90, "calloc(aesKeys) returned NULL.", failingAllocation(2)},
+              {90, "calloc(aesKeys) returned NULL.", failingAllocation(4)}});
+  copy.refusesNulls(source, slot, record->cryptoSync.data, record->cryptoSalt.data, record->aesKeys[2].data);
+  copy.fails({{90, "calloc(keyDataCopy) returned NULL.", failingAllocation(0)},
+              {90, "calloc(cryptoSalt) returned NULL.", failingAllocation(1)},
+              {90, "calloc(cryptoSalt) returned NULL.", failingAllocation(2)},
+              {90, "calloc(aesKeys) returned NULL.", failingAllocation(3)},
+              {90, "calloc(aesKeys) returned NULL.", failingAllocation(5)}});
   EXPECT_EQ(out, nullptr);
   freeAesKeyData(record);
-  freeAesKeyData(empty);
 }
 
 TEST(KeyRecords, AreComparedBySyncTextAndSalt) {
-  static const struct {
-    int type;
-    const char *sync, *salt;
-    int rc, match;
-  } rows[] = {
-      {0, "c3luYw==", kSalt, 0, 1},          {0, "c3luYw==", "wrong", 0, 1}, {0, "c3luYx==", kSalt, 0, 0},
-      {0, "c3luYw=", kSalt, 0, 0},           {0, "c3luYw===", kSalt, 0, 0},  {1, "c3luYw==", kSalt, 0, 1},
-      {1, "c3luYw==", "saltsaltsalT", 0, 0}, {1, "", kSalt, 0, 0},           {2, "c3luYw==", kSalt, 1, 0},
-  };
   AesKeyData* const record = fixedRecord();
-  for (const auto& row : rows) {
-    int match = 7;
-    const TraceCapture trace;
-    EXPECT_EQ(checkKeyStashFile(row.type, record, row.sync, row.salt, &match), row.rc);
-    EXPECT_EQ(match, row.match) << row.type << row.sync << row.salt;
-    EXPECT_EQ(trace.messages(), Lines{});
-  }
   const AesKeyData* subject = record;
-  const char* sync = "c3luYw==";
-  const char* salt = kSalt;
-  int match = 7;
-  int* answer = &match;
-  test::expectFailures(test::Rows("checkKeyStashFile")
-                           .refuses({replacing(subject, nullptr), replacing(sync, nullptr), replacing(salt, nullptr),
-                                     replacing(answer, nullptr)}),
-                       LDTR_ERROR, [&] { return checkKeyStashFile(0, subject, sync, salt, answer); });
+  const char *sync = "c3luYw==", *salt = "saltsaltsalt";
+  int match = 7, *answer = &match, type = 0;
+  const Operation check{"checkKeyStashFile", [&] { return checkKeyStashFile(type, subject, sync, salt, answer); }};
+  check.refusesNulls(subject, sync, salt, answer);
   EXPECT_EQ(match, 7);
+  const auto expectMatch = [&](int expected) { EXPECT_EQ(check() + match, expected) << type << sync << salt; };
+  for (type = 0; type < 2; ++type) {
+    expectMatch(1);
+    for (const char* wrong : {"c3luYx==", "c3luYw=", "c3luYw===", ""}) {
+      replacing(sync, wrong)([&] { expectMatch(0); });
+    }
+    replacing(salt, "saltsaltsalT")([&] { expectMatch(1 - type); });  // looked at for the second type alone
+  }
+  match = 7;
+  const TraceCapture trace;
+  EXPECT_EQ(check(), 1);  // there is no third type
+  EXPECT_EQ(match, 0);
+  EXPECT_EQ(trace.messages(), Lines{});
   freeAesKeyData(record);
 }
 
-// ---- The process-wide state ----
-
-TEST(KeyState, IsSetOnceAndOnlyByASoundFile) {
+class KeyState : public testing::Test {
+ protected:
+  void SetUp() override {
+    putFile(good, fixedFile());
+    g_CipherName[0] = nullptr;
+  }
   const TempFolder folder;
-  const std::string good = folder.file("good");
-  const std::string other = folder.file("other");
-  putFile(good, fixedFile());
-  putFile(other, fixedFile().replace(4, 1, "X"));
+  const std::string good = folder.file("good"), missing = folder.file("missing");
+  const char* path = good.c_str();
+};
+
+TEST_F(KeyState, IsSetOnceAndOnlyByASoundFile) {
   const struct {
     int (*set)(const char*);
     AesKeyData* (*get)();
@@ -119,62 +88,44 @@ TEST(KeyState, IsSetOnceAndOnlyByASoundFile) {
   } rows[] = {{setCfgKeyDataGlobal, getCfgKeyDataGlobal, g_CfgKeyData},
               {setDirKeyDataGlobal, getDirKeyDataGlobal, g_DirKeyData}};
   for (const auto& row : rows) {
-    const Replaced<const char*> names(g_CipherName[0], nullptr);
-    EXPECT_EQ(row.set(folder.file("missing").c_str()), 1);
-    EXPECT_EQ(row.set(nullptr), 1);
-    for (long failing = 0; failing < 6; ++failing) {
-      failingAllocation(failing)([&] { EXPECT_EQ(row.set(good.c_str()), 90); });
-    }
+    EXPECT_EQ(row.set(missing.c_str()), 1);
+    for (long number = 0; number < 6; ++number) failingAllocation(number)([&] { EXPECT_EQ(row.set(path), 90); });
     EXPECT_EQ(row.get(), nullptr);
     EXPECT_EQ(g_CipherName[0], nullptr);
-    EXPECT_EQ(row.set(good.c_str()), 0);
-    AesKeyData* const first = row.get();
-    ASSERT_EQ(first, row.global);
-    EXPECT_EQ(row.set(other.c_str()), 0);
-    EXPECT_EQ(row.set(nullptr), 0);
-    EXPECT_EQ(row.get(), first);
-    EXPECT_EQ(contentOf(*first), test::fixedContent());
-    EXPECT_STREQ(g_CipherName[0], "AES-128-ECB");
-    EXPECT_STREQ(g_CipherName[1], "AES-192-ECB");
-    EXPECT_STREQ(g_CipherName[2], "AES-256-ECB");
+    EXPECT_EQ(row.set(path), 0);
+    AesKeyData* const first = row.global;
+    for (const char* later : {path, missing.c_str()}) EXPECT_EQ(row.set(later), 0);
+    ASSERT_EQ(row.get(), first);
+    EXPECT_EQ(contentOf(*first), fixedContent());
+    EXPECT_EQ(Lines(g_CipherName, g_CipherName + 3), (Lines{"AES-128-ECB", "AES-192-ECB", "AES-256-ECB"}));
     freeAesKeyData(std::exchange(row.global, nullptr));
+    g_CipherName[0] = nullptr;
   }
 }
 
-TEST(KeyState, KeepsTheFirstSyncTextAndCipherNames) {
+TEST_F(KeyState, KeepsTheFirstSyncTextAndCipherNames) {
   const TraceCapture trace;
   EXPECT_EQ(setCfgCryptoSyncGlobal(nullptr), 1);
   failingAllocation(0)([] { EXPECT_EQ(setCfgCryptoSyncGlobal("first"), 90); });
-  const std::string text = "first";
-  EXPECT_EQ(setCfgCryptoSyncGlobal(text.c_str()), 0);
-  EXPECT_NE(g_CfgCryptoSync, text.c_str());
-  EXPECT_EQ(setCfgCryptoSyncGlobal("second"), 0);
+  for (std::string text : {"first", "second"}) EXPECT_EQ(setCfgCryptoSyncGlobal(text.c_str()), 0);
   EXPECT_STREQ(g_CfgCryptoSync, "first");
-  const Replaced<const char*> own(g_CipherName[0], "own");
+  g_CipherName[0] = "own";
   EXPECT_EQ(setCipherNameGlobal(), 0);
   EXPECT_STREQ(g_CipherName[0], "own");
   EXPECT_EQ(trace.messages(), Lines{});
-  for (const test::Record& r : trace.records()) EXPECT_TRUE(r.level == 33 && r.mask == 0x1000);
+  for (const Record& r : trace.records()) EXPECT_TRUE(r.level == 33 && r.mask == 0x1000);
   free(std::exchange(g_CfgCryptoSync, nullptr));
 }
 
-TEST(KeyState, OwnRecordsComeFromFilesToo) {
-  const TempFolder folder;
-  const std::string good = folder.file("good");
-  const std::string missing = folder.file("missing");
-  putFile(good, fixedFile());
-  const Replaced<const char*> names(g_CipherName[0], nullptr);
-  AesKeyData* record = nullptr;
-  AesKeyData** slot = &record;
-  const char* path = good.c_str();
-  test::expectFailures({{1, {"Error - setAESKeyData: Invalid parameter. rc = 1\n"}, replacing(slot, nullptr)},
-                        {1, {"Error - readKeyStashFile: fopen() failed. rc = 1\n"}, replacing(path, missing.c_str())},
-                        {1, {"Error - readKeyStashFile: Invalid parameter. rc = 1\n"}, replacing(path, nullptr)}},
-                       LDTR_ERROR, [&] { return setAESKeyData(path, slot); });
+TEST_F(KeyState, OwnRecordsComeFromFilesToo) {
+  AesKeyData *record = nullptr, **slot = &record;
+  const auto set = [&] { return setAESKeyData(path, slot); };
+  Operation{"setAESKeyData", set}.refusesNulls(slot);
+  Operation{"readKeyStashFile", set}.fails({{1, "fopen() failed.", replacing(path, missing.c_str())}});
   EXPECT_EQ(record, nullptr);
-  EXPECT_EQ(setAESKeyData(path, slot), 0);
+  EXPECT_EQ(set(), 0);
   EXPECT_STREQ(g_CipherName[0], "AES-128-ECB");
-  EXPECT_EQ(contentOf(*record), test::fixedContent());
+  EXPECT_EQ(contentOf(*record), fixedContent());
   freeAesKeyData(record);
 }
 

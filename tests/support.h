@@ -205,7 +205,7 @@ inline AesKeyData* fixedRecord() {
   return record;
 }
 
-// A record's buffers in the order of a stash file, and those of fixedRecord.
+// A record's buffers in the order of a stash file, those of fixedRecord, and its file.
 inline std::string contentOf(const AesKeyData& record) {
   std::string content;
   for (const SecBuffer* buffer = &record.cryptoSync; buffer != record.aesKeys + 3; ++buffer) {
