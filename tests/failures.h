@@ -115,18 +115,6 @@ inline Failure withQuickDigests() {
                    replacing(pQEL_EVP_DigestFinal, [](auto...) { return 1; })));
 }
 
-// Fails one allocation after the other until the call succeeds: each time it gives 90 and leaves *out null.
-inline void sweepAllocations(char*& out, const std::function<int(char**)>& call) {
-  long failing = 0;
-  for (int rc = 90; rc != 0; ++failing) {
-    const AllocationWatch watch(failing);
-    rc = call(&out);
-    ASSERT_EQ(rc, watch.count() > failing ? 90 : 0);
-    ASSERT_EQ(out == nullptr, rc != 0);
-  }
-  EXPECT_GT(failing, 1);
-}
-
 // That the lines of the error shape, and they alone, are of the error class.
 inline void expectErrorClasses(const TraceCapture& trace) {
   for (const Record& r : trace.records()) {

@@ -59,70 +59,54 @@ ENTRY int QEL_Cleanup(void* ctx, QelStatus* status) {
   return 0;
 }
 
-struct algorithm {
-  const char* name;
-  int size; /* of a digest, or of a key */
-};
-
 struct context {
-  unsigned char bytes[32]; /* the digest so far, or the key */
+  unsigned char bytes[20]; /* the digest so far, or a key of one byte */
   size_t count;
   int size;
 };
 
-ENTRY const void* QEL_EVP_get_digestbyname(void* ctx, const char* name) {
-  static const struct algorithm sha1 = {"SHA1", 20};
-  static const struct algorithm md5 = {"md5", 16};
-  (void)ctx;
-  return strcmp(name, sha1.name) == 0 ? &sha1 : strcmp(name, md5.name) == 0 ? &md5 : NULL;
+/* An algorithm is the number of bytes of its digest, 1 for a cipher. */
+ENTRY const int* QEL_EVP_get_digestbyname(void* ctx, const char* name) {
+  static const int sizes[] = {20, 16};
+  return ctx == NULL ? NULL : strcmp(name, "SHA1") == 0 ? &sizes[0] : strcmp(name, "md5") == 0 ? &sizes[1] : NULL;
 }
 
-ENTRY const void* QEL_EVP_get_cipherbyname(void* ctx, const char* name) {
-  static const struct algorithm ciphers[] = {{"AES-128-ECB", 16}, {"AES-192-ECB", 24}, {"AES-256-ECB", 32}};
-  (void)ctx;
-  for (int i = 0; i < 3; ++i) {
-    if (strcmp(name, ciphers[i].name) == 0) return &ciphers[i];
-  }
-  return NULL;
+ENTRY const int* QEL_EVP_get_cipherbyname(void* ctx, const char* name) {
+  static const int size = 1;
+  return ctx != NULL && strncmp(name, "AES-", 4) == 0 ? &size : NULL;
 }
 
-ENTRY int QEL_EVP_MD_size(void* ctx, const struct algorithm* digest) {
-  (void)ctx;
-  return digest->size;
+ENTRY int QEL_EVP_MD_size(void* ctx, const int* digest) {
+  return ctx == NULL ? 0 : *digest;
 }
 
-ENTRY int QEL_EVP_DigestInit(void* ctx, struct context* c, const struct algorithm* digest) {
-  (void)ctx;
-  memset(c, 0, sizeof *c);
-  c->size = digest->size;
+ENTRY int QEL_EVP_DigestInit(void* ctx, struct context* c, const int* digest) {
+  *c = (struct context){.size = QEL_EVP_MD_size(ctx, digest)};
   return 1;
 }
 
 ENTRY int QEL_EVP_DigestUpdate(void* ctx, struct context* c, const unsigned char* data, unsigned length) {
-  (void)ctx;
   for (; length != 0; --length, ++c->count) c->bytes[c->count % (size_t)c->size] ^= (unsigned char)(*data++ + c->count);
-  return 1;
+  return ctx != NULL;
 }
 
 ENTRY int QEL_EVP_DigestFinal(void* ctx, struct context* c, unsigned char* out, unsigned* outLength) {
-  (void)ctx;
   memcpy(out, c->bytes, (size_t)c->size);
   if (outLength != NULL) *outLength = (unsigned)c->size;
-  return 1;
+  return ctx != NULL;
 }
 
-ENTRY int QEL_EVP_EncryptInit(void* ctx, struct context* c, const struct algorithm* cipher, const unsigned char* key) {
+ENTRY int QEL_EVP_EncryptInit(void* ctx, struct context* c, const int* cipher, const unsigned char* key) {
   QEL_EVP_DigestInit(ctx, c, cipher);
-  memcpy(c->bytes, key, (size_t)c->size);
+  c->bytes[0] = key[0];
   return 1;
 }
 
 ENTRY int QEL_EVP_EncryptUpdate(void* ctx, struct context* c, unsigned char* out, int* outLength,
                                 const unsigned char* in, int inLength) {
-  (void)ctx;
-  for (int i = 0; i < inLength; ++i, ++c->count) out[i] = in[i] ^ c->bytes[c->count % (size_t)c->size];
+  for (int i = 0; i < inLength; ++i, ++c->count) out[i] = in[i] ^ c->bytes[0];
   *outLength = inLength;
-  return 1;
+  return ctx != NULL;
 }
 
 ENTRY int QEL_EVP_EncryptFinal(void* ctx, struct context* c, unsigned char* out, int* outLength) {
@@ -132,7 +116,7 @@ ENTRY int QEL_EVP_EncryptFinal(void* ctx, struct context* c, unsigned char* out,
   return QEL_EVP_EncryptUpdate(ctx, c, out, outLength, padding, count);
 }
 
-ENTRY int QEL_EVP_DecryptInit(void* ctx, struct context* c, const struct algorithm* cipher, const unsigned char* key) {
+ENTRY int QEL_EVP_DecryptInit(void* ctx, struct context* c, const int* cipher, const unsigned char* key) {
   return QEL_EVP_EncryptInit(ctx, c, cipher, key);
 }
 
@@ -146,21 +130,18 @@ ENTRY int QEL_EVP_DecryptUpdate(void* ctx, struct context* c, unsigned char* out
 }
 
 ENTRY int QEL_EVP_DecryptFinal(void* ctx, struct context* c, unsigned char* out, int* outLength) {
-  (void)ctx, (void)c, (void)out;
   *outLength = 0;
-  return 1;
+  return ctx != NULL && c != NULL && out != NULL;
 }
 
 ENTRY int QEL_RAND_bytes(void* ctx, unsigned char* buffer, int count) {
-  (void)ctx;
   for (int i = 0; i < count; ++i) buffer[i] = (unsigned char)rand();
-  return 1;
+  return ctx != NULL;
 }
 
 static int release(void* ctx, void* context) {
-  (void)ctx;
   free(context);
-  return 1;
+  return ctx != NULL;
 }
 
 // clang-format off
