@@ -97,7 +97,9 @@ void* currentContext() noexcept {
   return LDAPPW_SUCCESS;
 }
 
-int releaseContext(const ContextKind& kind, void* qelCtx, void* context) noexcept {
+// A copy for each kind, in which the kind's row is known.
+template <const ContextKind& kind>
+int releaseContext(void* qelCtx, void* context) noexcept {
   TracedCall call{kind.release, "qelCtx", qelCtx, kind.contextArgument, context};
   if (qelCtx == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
   if (context == nullptr) return call.leave(LDAPPW_SUCCESS);
@@ -110,7 +112,8 @@ int releaseContext(const ContextKind& kind, void* qelCtx, void* context) noexcep
   return call.leave(LDAPPW_SUCCESS);
 }
 
-int createContext(const ContextKind& kind, void* qelCtx, void** context, const char* name, void** algorithm) noexcept {
+template <const ContextKind& kind>
+int createContext(void* qelCtx, void** context, const char* name, void** algorithm) noexcept {
   TracedCall call{kind.create, "qelCtx",          qelCtx, kind.contextArgument,
                   context,     kind.nameArgument, name,   kind.algorithmArgument,
                   algorithm};
@@ -123,7 +126,7 @@ int createContext(const ContextKind& kind, void* qelCtx, void** context, const c
   *algorithm = const_cast<void*>((*kind.byName)(qelCtx, name));
   if (*algorithm == nullptr) {
     call.fail(LDAPPW_OPERATIONS_ERROR, kind.byNameFailed);
-    releaseContext(kind, qelCtx, *context);
+    releaseContext<kind>(qelCtx, *context);
     *context = nullptr;
     return LDAPPW_OPERATIONS_ERROR;
   }
@@ -166,19 +169,19 @@ int freeQelCrypto(void* qelCtx) noexcept {
 }
 
 int initQelCipher(void* qelCtx, void** cipherCtx, const char* cipherName, void** cipher) noexcept {
-  return createContext(kCipher, qelCtx, cipherCtx, cipherName, cipher);
+  return createContext<kCipher>(qelCtx, cipherCtx, cipherName, cipher);
 }
 
 int freeQelCipher(void* qelCtx, void* cipherCtx) noexcept {
-  return releaseContext(kCipher, qelCtx, cipherCtx);
+  return releaseContext<kCipher>(qelCtx, cipherCtx);
 }
 
 int initQelDigest(void* qelCtx, void** digestCtx, const char* digestName, void** digest) noexcept {
-  return createContext(kDigest, qelCtx, digestCtx, digestName, digest);
+  return createContext<kDigest>(qelCtx, digestCtx, digestName, digest);
 }
 
 int freeQelDigest(void* qelCtx, void* digestCtx) noexcept {
-  return releaseContext(kDigest, qelCtx, digestCtx);
+  return releaseContext<kDigest>(qelCtx, digestCtx);
 }
 
 int qelStatusToLdap(void* qelCtx, QelStatus* status) noexcept {

@@ -114,13 +114,14 @@ size_t makeAes(TracedCall&, const Scheme& scheme, const FormatRequest& request, 
 
 constexpr int kNoKey = -1;
 
-// The 21 of MD5 is less than the 29 characters that it writes: meant, as are the shorter rooms of the digests.
-constexpr Scheme kSchemes[] = {{FORMAT_SHA, SHA_BRACED, sizeof SHA_BRACED, 33, 20, kNoKey, makeSha},
+// The most wanted come first. The 21 of MD5 is less than the 29 characters that it writes: meant, as are the shorter
+// rooms of the digests.
+constexpr Scheme kSchemes[] = {{FORMAT_AES256, AES256_BRACED, sizeof AES256_BRACED, kMeasured, 0, 2, makeAes},
+                               {FORMAT_SSHA, SSHA_BRACED, sizeof SSHA_BRACED, 62, 40, kNoKey, makeSsha},
+                               {FORMAT_SHA, SHA_BRACED, sizeof SHA_BRACED, 33, 20, kNoKey, makeSha},
                                {FORMAT_MD5, MD5_BRACED, sizeof MD5_BRACED, 21, 16, kNoKey, makeMd5},
                                {FORMAT_CRYPT, crypt_BRACED, sizeof crypt_BRACED, 20, 13, kNoKey, makeCrypt},
-                               {FORMAT_SSHA, SSHA_BRACED, sizeof SSHA_BRACED, 62, 40, kNoKey, makeSsha},
                                {FORMAT_QVEIL, qVEIL_BRACED, sizeof qVEIL_BRACED, 171, 164, kNoKey, makeMasked},
-                               {FORMAT_AES256, AES256_BRACED, sizeof AES256_BRACED, kMeasured, 0, 2, makeAes},
                                {FORMAT_AES192, AES192_BRACED, sizeof AES192_BRACED, kMeasured, 0, 1, makeAes},
                                {FORMAT_AES128, AES128_BRACED, sizeof AES128_BRACED, kMeasured, 0, 0, makeAes}};
 
