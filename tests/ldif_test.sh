@@ -121,7 +121,7 @@ expectCode "unreadable input" 5 $?
 (ulimit -f 100 && trap '' XFSZ && ldif --to sha --in sample --out old --force)
 expectCode "file size limit" 5 $?
 mkfifo slow && exec 9<> slow # with a writer that stays, the input does not end
-for signal in TERM KILL; do
+for signal in ${LDAPPW_SIGNALS:-TERM KILL}; do
   cat sample >&9 &
   writer=$!
   "$ldappw" ldif --to sha --in slow --out old --force 2> /dev/null 9>&- &
