@@ -9,7 +9,6 @@
 
 #include "dsutil.h"
 #include "failures.h"
-#include "oracle.h"
 
 static const char* installFolder = "install";  // null: cannot be told
 static int failingPutEnvVar = 0;               // the number of the call that fails, from 1

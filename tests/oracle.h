@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// OpenSSL as the other opinion, and the handling of bytes around it.
+// OpenSSL as the other opinion, and texts to ask both about.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -9,33 +9,9 @@
 #include <random>
 #include <string>
 
-#include "aes_keys.h"
+#include "support.h"
 
 namespace test {
-
-inline const unsigned char* bytesOf(const std::string& text) {
-  return reinterpret_cast<const unsigned char*>(text.data());
-}
-inline unsigned char* bytesOf(std::string& text) {
-  return reinterpret_cast<unsigned char*>(text.data());
-}
-
-inline const unsigned char* bytesOf(const char* text) {
-  return reinterpret_cast<const unsigned char*>(text);
-}
-inline unsigned char* bytesOf(char* text) {
-  return reinterpret_cast<unsigned char*>(text);
-}
-inline std::string textOf(const SecBuffer& buffer) {
-  return std::string(reinterpret_cast<const char*>(buffer.data), buffer.length);
-}
-
-// Takes a text from the product and releases it.
-inline std::string taken(char* text) {
-  const std::string copy = text != nullptr ? text : "(null)";
-  std::free(text);
-  return copy;
-}
 
 inline std::string randomBytes(std::mt19937& random, size_t size) {
   std::string bytes(size, '\0');

@@ -173,6 +173,30 @@ inline void putFile(const std::string& path, const std::string& content) {
   std::ofstream(path, std::ios::binary) << content;
 }
 
+inline const unsigned char* bytesOf(const std::string& text) {
+  return reinterpret_cast<const unsigned char*>(text.data());
+}
+inline unsigned char* bytesOf(std::string& text) {
+  return reinterpret_cast<unsigned char*>(text.data());
+}
+
+inline const unsigned char* bytesOf(const char* text) {
+  return reinterpret_cast<const unsigned char*>(text);
+}
+inline unsigned char* bytesOf(char* text) {
+  return reinterpret_cast<unsigned char*>(text);
+}
+inline std::string textOf(const SecBuffer& buffer) {
+  return std::string(reinterpret_cast<const char*>(buffer.data), buffer.length);
+}
+
+// Takes a text from the product and releases it.
+inline std::string taken(char* text) {
+  const std::string copy = text != nullptr ? text : "(null)";
+  std::free(text);
+  return copy;
+}
+
 inline std::string fromHex(const std::string& hex) {
   std::string bytes;
   for (size_t i = 0; i + 1 < hex.size(); i += 2) {
