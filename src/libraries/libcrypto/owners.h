@@ -92,10 +92,9 @@ template <size_t kInline>
 using PlainBytes = Buffer<kInline, false>;
 
 // A terminated copy of counted text.
-template <bool kSecret>
-class TerminatedCopy {
+class SecretText {
  public:
-  TerminatedCopy(const char* text, size_t length) noexcept : buffer_(length + 1) {
+  SecretText(const char* text, size_t length) noexcept : buffer_(length + 1) {
     if (!buffer_) return;
     if (length != 0) std::memcpy(buffer_.get(), text, length);
     buffer_.get()[length] = '\0';
@@ -104,36 +103,35 @@ class TerminatedCopy {
   char* get() noexcept { return buffer_.text(); }
 
  private:
-  Buffer<256, kSecret> buffer_;  // passwords and their values are shorter
+  SecretBytes<256> buffer_;  // passwords and their values are shorter
 };
 
-using SecretText = TerminatedCopy<true>;
-using PlainText = TerminatedCopy<false>;
-
-// Guards an out-argument from the point after which a failure must clear it: on every way out but keep() what it holds
-// is wiped, released and nulled.
+// Guards an out-argument from the point after which a failure must clear it, its making or arm(): on every way out but
+// keep() what it holds is wiped, released and nulled.
 template <class T>
 class OutGuard {
  public:
-  explicit OutGuard(T** out) noexcept : out_(out) {}
+  explicit OutGuard(T** out, bool armed = true) noexcept : out_(out), armed_(armed) {}
   ~OutGuard() {
-    if (kept_) return;
+    if (!armed_) return;
     wipeAndFree(*out_);
     *out_ = nullptr;
   }
   OutGuard(const OutGuard&) = delete;
   OutGuard& operator=(const OutGuard&) = delete;
 
+  void arm() noexcept { armed_ = true; }
+
   // Success: what the slot held goes and the caller owns result.
   void keep(T* result) noexcept {
     if (result != *out_) wipeAndFree(*out_);
     *out_ = result;
-    kept_ = true;
+    armed_ = false;
   }
 
  private:
   T** out_;
-  bool kept_ = false;
+  bool armed_;
 };
 
 }  // namespace ldappw

@@ -80,7 +80,7 @@ size_t makeMd5(TracedCall&, const Scheme&, const FormatRequest& request, char* p
 
 size_t makeSsha(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
   TextTarget target(payload);
-  return saltedHashTo(target, request.clear, bytesBeforeNul(request), "SHA1") == 0 ? target.length() : 0;
+  return saltedHashTo(target, request.clear, bytesBeforeNul(request), kSaltedDigest) == 0 ? target.length() : 0;
 }
 
 size_t makeCrypt(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {

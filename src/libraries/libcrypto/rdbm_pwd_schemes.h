@@ -17,6 +17,8 @@ constexpr TraceInfo passwordOperation(const char* name, PasswordFunction functio
   return {name, operationScope(passwordId(function)), LineClass::debug, Lines::none};
 }
 
+constexpr char kSaltedDigest[] = "SHA1";  // of {SSHA}, by its provider name
+
 // What is to be formatted.
 struct FormatRequest {
   const char* clear;

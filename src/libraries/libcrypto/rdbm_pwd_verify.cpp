@@ -22,7 +22,6 @@ constexpr size_t kLeading = 46;     // what is compared of two values of one sch
 constexpr size_t kMaskedTag = sizeof qVEIL_BRACED;
 constexpr size_t kMaskedCharacters = 164;
 constexpr size_t kLongestUnmasked = 170;
-constexpr char kSaltedDigest[] = "SHA1";
 
 struct Text {
   const char* data;
@@ -102,20 +101,10 @@ int compareLeading(const Comparison& c) noexcept {
   return compareTexts(leading(c.presented), leading(c.stored));
 }
 
-int saltedVerify(const Text& clear, const Text& value) noexcept {
-  const Text payload = behind(value, sizeof SSHA_BRACED);
-  return saltedHashCheck(clear.data, strnlen(clear.data, clear.length), payload.data,
-                         strnlen(payload.data, payload.length), kSaltedDigest);
-}
-
 int verifySalted(const Comparison& c) noexcept {
-  return saltedVerify(c.presented, c.stored);
-}
-
-// A salted value against clear text. The arguments are as in verifySalted, not exchanged, so that nothing ever matches:
-// meant.
-int verifySaltedUnexchanged(const Comparison& c) noexcept {
-  return saltedVerify(c.presented, c.stored);
+  const Text payload = behind(c.stored, sizeof SSHA_BRACED);
+  return saltedHashCheck(c.presented.data, strnlen(c.presented.data, c.presented.length), payload.data,
+                         strnlen(payload.data, payload.length), kSaltedDigest);
 }
 
 int compareFormattedStored(const Comparison& c) noexcept {
@@ -190,17 +179,12 @@ struct Rule {
 
 // The usual pairs, with a clear presented password, come first.
 constexpr Rule kRules[] = {
-    {FORMAT_SSHA, FORMAT_NONE, verifySalted},
-    {FORMAT_NONE, FORMAT_NONE, compareLeading},
-    {FORMAT_QVEIL, kAny, compareUnmasked},
-    {FORMAT_VLDL, FORMAT_NONE, notComparable},
-    {kAny, FORMAT_NONE, compareFormattedPresented},
-    {kAny, FORMAT_QVEIL, compareUnmasked},
-    {FORMAT_SHA, FORMAT_SHA, compareDigests},
-    {kAny, kSameAsStored, compareLeading},
-    {FORMAT_NONE, FORMAT_SSHA, verifySaltedUnexchanged},
-    {FORMAT_NONE, kAny, compareFormattedStored},
-    {kAny, kAny, compareWhole},
+    {FORMAT_SSHA, FORMAT_NONE, verifySalted},       {FORMAT_NONE, FORMAT_NONE, compareLeading},
+    {FORMAT_QVEIL, kAny, compareUnmasked},          {FORMAT_VLDL, FORMAT_NONE, notComparable},
+    {kAny, FORMAT_NONE, compareFormattedPresented}, {kAny, FORMAT_QVEIL, compareUnmasked},
+    {FORMAT_SHA, FORMAT_SHA, compareDigests},       {kAny, kSameAsStored, compareLeading},
+    {FORMAT_NONE, FORMAT_SSHA, verifySalted},  // not exchanged, so that no such pair of values matches: meant
+    {FORMAT_NONE, kAny, compareFormattedStored},    {kAny, kAny, compareWhole},
 };
 
 int compare(const Comparison& c) noexcept {

@@ -19,18 +19,15 @@ class TextTarget {
  public:
   explicit TextTarget(char** slot) noexcept : slot_(slot) {}
   explicit TextTarget(char* payload) noexcept : payload_(payload) {}
-  ~TextTarget() {
-    if (!claimed_) return;
-    wipeAndFree(*slot_);
-    *slot_ = nullptr;
-  }
   TextTarget(const TextTarget&) = delete;
   TextTarget& operator=(const TextTarget&) = delete;
 
   char** slot() const noexcept { return slot_; }
 
   // From here on a failure leaves the caller's slot null.
-  void claim() noexcept { claimed_ = payload_ == nullptr; }
+  void claim() noexcept {
+    if (payload_ == nullptr) guard_.arm();
+  }
 
   // False when there is no memory for the text, or the alphabet is not whole.
   bool write(const unsigned char* data, size_t bytes) noexcept {
@@ -43,11 +40,8 @@ class TextTarget {
  private:
   bool writeSlot(const unsigned char* data, size_t bytes) noexcept {
     char* text = binaryBlobToBase64(data, static_cast<int>(bytes));
-    if (text == nullptr) return false;
-    wipeAndFree(*slot_);
-    *slot_ = text;
-    claimed_ = false;
-    return true;
+    if (text != nullptr) guard_.keep(text);
+    return text != nullptr;
   }
   bool writePayload(const unsigned char* data, size_t bytes) noexcept {
     if (!isWholeAlphabet(pBase64)) return false;
@@ -57,7 +51,7 @@ class TextTarget {
 
   char* payload_ = nullptr;
   char** slot_ = &payload_;  // what the trace shows when there is no caller's slot
-  bool claimed_ = false;
+  OutGuard<char> guard_{slot_, false};
   size_t length_ = 0;
 };
 
