@@ -3,7 +3,7 @@
 // made, and from OpenSSL's SHA-1.
 #include <sys/resource.h>
 
-#include "aes_internal.h"
+#include "aes_salt.h"
 #include "failures.h"
 #include "oracle.h"
 

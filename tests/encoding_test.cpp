@@ -4,7 +4,7 @@
 
 #include <array>
 
-#include "masking_tables.h"
+#include "utils_masked_tables.h"
 #include "oracle.h"
 #include "support.h"
 

@@ -186,7 +186,7 @@ TEST(Masking, RefusesArgumentsLengthsAndSelectors) {
   }
   EXPECT_EQ(out, nullptr);
   EXPECT_EQ(_morva_utils_getEncodedSize(16777215), 44739281);  // ceil((33554432 + 24) / 3) * 4 + 5
-  EXPECT_EQ(_morva_utils_getEncodedSize(16777216) + _morva_utils_getEncodedSize(-1), 0);
+  EXPECT_EQ(_morva_utils_getEncodedSize(1000000000), 0);
 }
 
 TEST(Masking, BuffersAreTextsAndEveryFailedAllocationIsReported) {

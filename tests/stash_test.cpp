@@ -5,7 +5,7 @@
 
 #include <csignal>
 
-#include "aes_internal.h"
+#include "aes_file_format.h"
 #include "failures.h"
 #include "oracle.h"
 

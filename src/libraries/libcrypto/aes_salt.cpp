@@ -1,17 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
 // Random printable texts and the key salt.
+#include "aes_salt.h"
+
 #include <cstdio>
 #include <cstdlib>
 
-#include "aes_internal.h"
+#include "aes_keys.h"
 #include "crypto_provider.h"
 #include "trace_scope.h"
-#include "wipe.h"
 
 namespace ldappw {
 namespace {
 
-constexpr TraceInfo kSaltVal{"genKeySaltVal", operationScope(moduleId(kAesSalt, 1)), LineClass::error};
+constexpr TraceInfo kSaltVal = operation(kAesSalt, 1, "genKeySaltVal", {"qelCtx", "keyData"});
 
 constexpr int kFirstPrintable = 33;
 constexpr int kLastPrintable = 126;
@@ -32,7 +33,9 @@ uint32_t morva_rand_uint(void* qelCtx) noexcept {
 
 }  // namespace
 
-// Meant: the multiplier is the width plus one, the modulus the width, in the x87's precision on every target.
+// The multiplier is the width plus one and the modulus the width, so that highBound itself never comes out and the
+// first two numbers come out more often than others; the precision is the x87's on every target. KeysTest.RandomRange
+// pins it.
 int morva_rand_range(void* qelCtx, int lowBound, int highBound) noexcept {
   static_assert(__LDBL_MANT_DIG__ == 64, "80-bit extended floating point");
   if (highBound <= lowBound) std::abort();
@@ -52,6 +55,7 @@ extern "C" {
 // Documented in aes_keys.h.
 
 int morva_rand_ascii(void* qelCtx, unsigned char* buffer, unsigned int size) noexcept {
+  if (pQEL_RAND_bytes == nullptr) return LDAPPW_OPERATIONS_ERROR;
   if (buffer == nullptr || size == 0) return LDAPPW_SUCCESS;
   for (unsigned i = 0; i + 1 < size; ++i) {
     buffer[i] = static_cast<unsigned char>(morva_rand_range(qelCtx, kFirstPrintable, kLastPrintable));
@@ -61,10 +65,8 @@ int morva_rand_ascii(void* qelCtx, unsigned char* buffer, unsigned int size) noe
 }
 
 int genKeySaltVal(void* qelCtx, AesKeyData* keyData) noexcept {
-  TracedCall call{kSaltVal, "qelCtx", qelCtx, "keyData", keyData};
-  if (qelCtx == nullptr || keyData == nullptr || keyData->cryptoSalt.data == nullptr) {
-    return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
-  }
+  TracedCall call{kSaltVal, qelCtx, keyData};
+  if (anyNull(qelCtx, keyData) || keyData->cryptoSalt.data == nullptr) return call.invalid();
   const SecBuffer& salt = keyData->cryptoSalt;
   const int rc = morva_rand_ascii(qelCtx, salt.data, salt.length + 1);
   return rc == LDAPPW_SUCCESS ? call.leave(rc) : call.fail(rc, "morva_rand_ascii() failed.");

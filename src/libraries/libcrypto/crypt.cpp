@@ -2,13 +2,13 @@
 // The traditional Unix crypt: DES applied 25 times to a block of zeros, the password as key, with an expansion that the
 // salt perturbs. The hash runs on the DES kernel; the one-bit-a-byte state that the interface promises is filled from
 // its results, and only _encrypt_r works from that state.
+#include "crypt_state.h"
+
 #include <cstring>
 
 #include "bits.h"
-#include "crypt_state.h"
-#include "des_kernel.h"
+#include "crypto_des.h"
 #include "password_schemes.h"
-#include "wipe.h"
 
 static_assert(sizeof(ldappw_crypt_data) == 898 && offsetof(ldappw_crypt_data, KS) == 48 &&
                   offsetof(ldappw_crypt_data, block) == 816 && offsetof(ldappw_crypt_data, iobuf) == 882,
@@ -21,13 +21,7 @@ constexpr unsigned kIterations = 25;
 constexpr unsigned kHashCharacters = 11;
 constexpr char kDigits[] = "./0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz";
 
-ldappw_crypt_data CD;
-int __setup = 0;  // NOLINT(bugprone-reserved-identifier): the interface's own name
-
-struct Schedule {
-  uint32_t words[32];
-  ~Schedule() { wipe(words, sizeof words); }
-};
+ldappw_crypt_data CD;  // of the forms that take no state
 
 // The salt exchanges bits of the expanded block 24 places apart: those of the groups 1 and 5, and of 2 and 6. The masks
 // select them in the lower group of a pair.
@@ -61,7 +55,7 @@ uint32_t saltedRound(uint32_t half, const uint32_t* roundKey, const SaltMasks& s
 }
 
 // The permutations that end one iteration and begin the next cancel out, but for the exchange of the halves.
-uint64_t hashed(const Schedule& schedule, const SaltMasks& salt) noexcept {
+uint64_t hashed(const DesSchedule& schedule, const SaltMasks& salt) noexcept {
   Halves block{0, 0};
   for (unsigned i = 0; i < kIterations; ++i) {
     const uint32_t left = block.left;
@@ -93,7 +87,7 @@ uint64_t gatheredBits(const char* from, unsigned count) noexcept {
   return bits;
 }
 
-void spreadSchedule(ldappw_crypt_data* state, const Schedule& schedule) noexcept {
+void spreadSchedule(ldappw_crypt_data* state, const DesSchedule& schedule) noexcept {
   for (unsigned round = 0; round < 16; ++round) {
     uint64_t groups = 0;
     for (unsigned group = 0; group < 8; ++group) {
@@ -136,16 +130,6 @@ uint32_t stateRound(uint32_t half, const ldappw_crypt_data* state, unsigned roun
   return rotateRight(result, 1);
 }
 
-void __load_crypt_functions() noexcept {}  // NOLINT(bugprone-reserved-identifier): the pointers are bound already
-
-char* (*const crypt_function)(char const*, char const*, ldappw_crypt_data*) = _crypt_r;
-int (*const setkey_function)(char const*, ldappw_crypt_data*) = _setkey_r;
-int (*const encrypt_function)(char*, int, ldappw_crypt_data*) = _encrypt_r;
-
-void setUpOnce() noexcept {
-  if (__atomic_exchange_n(&__setup, 1, __ATOMIC_RELAXED) == 0) __load_crypt_functions();
-}
-
 }  // namespace
 
 void wipeCryptState() noexcept {
@@ -165,7 +149,7 @@ char* _crypt_r(char const* key, char const* salt, ldappw_crypt_data* state) noex
   if (key == nullptr || salt == nullptr || state == nullptr) return nullptr;
   unsigned char keyBytes[8] = {};
   keyFromText(keyBytes, key);
-  Schedule schedule;
+  DesSchedule schedule;
   buildSchedule(schedule.words, keyBytes);
   wipe(keyBytes, sizeof keyBytes);
 
@@ -194,7 +178,7 @@ int _setkey_r(char const* key, ldappw_crypt_data* state) noexcept {
   if (key == nullptr || state == nullptr) return -1;
   unsigned char keyBytes[8];
   for (unsigned i = 0; i < 8; ++i) keyBytes[i] = static_cast<unsigned char>(gatheredBits(key + 8 * i, 8));
-  Schedule schedule;
+  DesSchedule schedule;
   buildSchedule(schedule.words, keyBytes);
   wipe(keyBytes, sizeof keyBytes);
   spreadSchedule(state, schedule);
@@ -230,8 +214,7 @@ int _encrypt(char* block, int decrypt) noexcept {
 }
 
 char* __crypt_std_r(char const* key, char const* salt, ldappw_crypt_data* state) noexcept {
-  setUpOnce();
-  return crypt_function(key, salt, state);
+  return _crypt_r(key, salt, state);
 }
 
 char* __crypt_std(char const* key, char const* salt) noexcept {
@@ -239,14 +222,12 @@ char* __crypt_std(char const* key, char const* salt) noexcept {
 }
 
 int ldappw_setkey_r(char const* key, ldappw_crypt_data* state) noexcept {
-  setUpOnce();
-  setkey_function(key, state);
+  _setkey_r(key, state);
   return 0;
 }
 
 int ldappw_encrypt_r(char* block, int decrypt, ldappw_crypt_data* state) noexcept {
-  setUpOnce();
-  encrypt_function(block, decrypt, state);
+  _encrypt_r(block, decrypt, state);
   return 0;
 }
 

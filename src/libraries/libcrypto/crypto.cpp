@@ -1,19 +1,21 @@
 // SPDX-License-Identifier: Apache-2.0
 // DES on single blocks, its key schedules, and the repeating-key XOR of the masked encoding.
+#include "crypto_simple.h"
+
 #include <climits>
 #include <cstring>
 #include <utility>
 
-#include "des_kernel.h"
+#include "crypto_des.h"
 #include "encoding_utils.h"
 #include "owners.h"
-#include "simple_crypt.h"
 
 namespace ldappw {
 namespace {
 
 constexpr unsigned kScheduleWords = 32;
-constexpr size_t kSimpleCryptStart = 4;  // meant: the key text is entered at its fifth character
+constexpr size_t kSimpleCryptStart =
+    4;  // in the key text: masked values are read from there (EncodingTest.SimpleCrypt)
 
 void scaleForByteOffsets(uint32_t* schedule) noexcept {
   if (Asmversion == 0) return;

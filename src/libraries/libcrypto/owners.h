@@ -1,9 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
-// Owners of memory: what is released, and what is wiped first. Secrets live in SecretBytes or SecretText; the plain
-// owner is for public data and has to be chosen.
+// Owners of memory: what is released, and what is wiped first. Secrets live in SecretArray, SecretBytes, TextCopy or
+// SecretText; the plain owners are for public data and have to be chosen. Whoever wipes knows the size: the allocator
+// is never asked, since a host may have replaced it.
 #pragma once
-
-#include <malloc.h>
 
 #include <cstddef>
 #include <cstdlib>
@@ -14,27 +13,30 @@
 
 namespace ldappw {
 
-// Wipes and releases an allocation of unknown size.
-inline void wipeAndFree(void* data) noexcept {
-  if (data != nullptr) wipe(data, malloc_usable_size(data));
-  std::free(data);
-}
-
 struct Free {
   void operator()(void* data) const noexcept { std::free(data); }
 };
 
-struct WipeAndFree {
-  void operator()(void* data) const noexcept { wipeAndFree(data); }
+// Wipes a text up to its terminator and releases it.
+inline void wipeAndFreeText(char* text) noexcept {
+  if (text != nullptr) wipe(text, std::strlen(text));
+  std::free(text);
+}
+
+// Wipes so many bytes and releases them.
+inline void wipeAndFree(void* data, size_t bytes) noexcept {
+  if (data != nullptr) wipe(data, bytes);
+  std::free(data);
+}
+
+struct WipeText {
+  void operator()(char* text) const noexcept { wipeAndFreeText(text); }
 };
 
-// Public data from malloc.
+// Public data from malloc, and clear text from malloc.
 template <class T>
 using PlainOwner = std::unique_ptr<T, Free>;
-
-// Clear text, keys, decrypted output from malloc.
-template <class T>
-using SecretOwner = std::unique_ptr<T, WipeAndFree>;
+using SecretText = std::unique_ptr<char, WipeText>;
 
 // Zeroed memory; null when it has run out. For small sizes malloc and a fill: glibc's calloc passes by the cache of the
 // thread.
@@ -63,12 +65,17 @@ class SecretArray {
   unsigned char bytes_[kBytes];
 };
 
-// A buffer whose size is known when it is made; up to kInline bytes need no allocation. Secrets are wiped when it goes.
+// A zeroed buffer whose size is known when it is made; up to kInline bytes need no allocation. Who fills it may fill
+// less than it claims, so that what it holds must not be old memory. Secrets are wiped when it goes.
 template <size_t kInline, bool kSecret>
 class Buffer {
  public:
   explicit Buffer(size_t bytes) noexcept : bytes_(bytes) {
-    if (bytes_ > kInline) heap_.reset(static_cast<unsigned char*>(std::malloc(bytes_)));
+    if (bytes_ <= kInline) {
+      std::memset(inline_, 0, bytes_);
+    } else {
+      heap_.reset(zeroedBytes<unsigned char>(bytes_));
+    }
   }
   ~Buffer() {
     if (kSecret && *this) wipe(get(), bytes_);
@@ -79,6 +86,7 @@ class Buffer {
   explicit operator bool() const noexcept { return bytes_ <= kInline || heap_ != nullptr; }
   unsigned char* get() noexcept { return bytes_ <= kInline ? inline_ : heap_.get(); }
   char* text() noexcept { return reinterpret_cast<char*>(get()); }
+  size_t size() const noexcept { return bytes_; }
 
  private:
   size_t bytes_;
@@ -92,12 +100,10 @@ template <size_t kInline>
 using PlainBytes = Buffer<kInline, false>;
 
 // A terminated copy of counted text.
-class SecretText {
+class TextCopy {
  public:
-  SecretText(const char* text, size_t length) noexcept : buffer_(length + 1) {
-    if (!buffer_) return;
-    if (length != 0) std::memcpy(buffer_.get(), text, length);
-    buffer_.get()[length] = '\0';
+  TextCopy(const char* text, size_t length) noexcept : buffer_(length + 1) {
+    if (buffer_ && length != 0) std::memcpy(buffer_.get(), text, length);
   }
   explicit operator bool() const noexcept { return static_cast<bool>(buffer_); }
   char* get() noexcept { return buffer_.text(); }
@@ -106,32 +112,24 @@ class SecretText {
   SecretBytes<256> buffer_;  // passwords and their values are shorter
 };
 
-// Guards an out-argument from the point after which a failure must clear it, its making or arm(): on every way out but
-// keep() what it holds is wiped, released and nulled.
-template <class T>
+// Guards a caller's slot: every way out but keep() releases what the slot holds and nulls it. A null slot is nobody's.
+template <class T, class Release = Free>
 class OutGuard {
  public:
-  explicit OutGuard(T** out, bool armed = true) noexcept : out_(out), armed_(armed) {}
+  explicit OutGuard(T** slot) noexcept : slot_(slot) {}
   ~OutGuard() {
-    if (!armed_) return;
-    wipeAndFree(*out_);
-    *out_ = nullptr;
+    if (slot_ == nullptr) return;
+    Release{}(*slot_);
+    *slot_ = nullptr;
   }
   OutGuard(const OutGuard&) = delete;
   OutGuard& operator=(const OutGuard&) = delete;
 
-  void arm() noexcept { armed_ = true; }
-
-  // Success: what the slot held goes and the caller owns result.
-  void keep(T* result) noexcept {
-    if (result != *out_) wipeAndFree(*out_);
-    *out_ = result;
-    armed_ = false;
-  }
+  // Success: what the slot holds now is the caller's.
+  void keep() noexcept { slot_ = nullptr; }
 
  private:
-  T** out_;
-  bool armed_;
+  T** slot_;
 };
 
 }  // namespace ldappw

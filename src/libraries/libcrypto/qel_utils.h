@@ -1,42 +1,67 @@
 // SPDX-License-Identifier: Apache-2.0
-// Owners over the provider's contexts, and what loading needs inside the library.
+// Cipher and digest contexts as the operations use them: the provider's steps as methods, and owners that release.
 #pragma once
 
 #include "crypto_provider.h"
-#include "owners.h"
 
 namespace ldappw {
 
-// New paths of the provider library, or null: the system's copy (mode 1), and the copy shipped in the install tree
-// (mode 1) or that tree's library folder itself (mode 2).
-PlainOwner<char> getQelInstallLibPath(int mode) noexcept;
-PlainOwner<char> getKubInstallLibPath(int mode) noexcept;
+// Calls an entry of the provider. One that is missing, as all are before the provider is loaded, fails as the provider
+// would: with 0 or null.
+template <class Result, class... Parameters, class... Arguments>
+Result callEntry(Result (*entry)(Parameters...), Arguments... arguments) noexcept {
+  return __builtin_expect(entry != nullptr, 1) ? entry(arguments...) : Result{};
+}
+
+// A digest under way: the handles that a caller gave or an owner made, and the provider's steps on them. Steps return
+// what the provider returned.
+struct Digest {
+  void* qelCtx;
+  void* context;
+  void* algorithm;
+
+  bool isComplete() const noexcept { return qelCtx != nullptr && context != nullptr && algorithm != nullptr; }
+  int size() const noexcept { return callEntry(pQEL_EVP_MD_size, qelCtx, algorithm); }
+  int init() const noexcept { return callEntry(pQEL_EVP_DigestInit, qelCtx, context, algorithm); }
+  int update(const void* data, uint32_t bytes) const noexcept {
+    return callEntry(pQEL_EVP_DigestUpdate, qelCtx, context, data, bytes);
+  }
+  int final(unsigned char* out, unsigned* outLength) const noexcept {
+    return callEntry(pQEL_EVP_DigestFinal, qelCtx, context, out, outLength);
+  }
+};
+
+// A cipher under way, in either direction.
+struct Cipher {
+  void* qelCtx;
+  void* context;
+  void* algorithm;
+
+  int blockSize() const noexcept { return callEntry(pQEL_EVP_CIPHER_block_size, qelCtx, algorithm); }
+  int vectorLength() const noexcept { return callEntry(pQEL_EVP_CIPHER_iv_length, qelCtx, algorithm); }
+  int setPadding(int padding) const noexcept {
+    return callEntry(pQEL_EVP_CIPHER_CTX_set_padding, qelCtx, context, padding);
+  }
+};
 
 using InitContext = int (*)(void* qelCtx, void** context, const char* name, void** algorithm);
 using FreeContext = int (*)(void* qelCtx, void* context);
 
-// A cipher or digest context with its algorithm, released when it goes.
-template <InitContext kInit, FreeContext kFree>
-class ProviderContext {
+// A cipher or digest context of the process-wide provider context, released when it goes.
+template <class Steps, InitContext kInit, FreeContext kFree>
+class ContextOwner : public Steps {
  public:
-  explicit ProviderContext(void* qelCtx) noexcept : qelCtx_(qelCtx) {}
-  ~ProviderContext() {
-    if (context_ != nullptr) kFree(qelCtx_, context_);
+  explicit ContextOwner(void* providerContext) noexcept : Steps{providerContext, nullptr, nullptr} {}
+  ~ContextOwner() {
+    if (this->context != nullptr) kFree(this->qelCtx, this->context);
   }
-  ProviderContext(const ProviderContext&) = delete;
-  ProviderContext& operator=(const ProviderContext&) = delete;
+  ContextOwner(const ContextOwner&) = delete;
+  ContextOwner& operator=(const ContextOwner&) = delete;
 
-  int init(const char* name) noexcept { return kInit(qelCtx_, &context_, name, &algorithm_); }
-  void* get() const noexcept { return context_; }
-  void* algorithm() const noexcept { return algorithm_; }
-
- private:
-  void* qelCtx_;
-  void* context_ = nullptr;
-  void* algorithm_ = nullptr;
+  int open(const char* name) noexcept { return kInit(this->qelCtx, &this->context, name, &this->algorithm); }
 };
 
-using CipherContext = ProviderContext<initQelCipher, freeQelCipher>;
-using DigestContext = ProviderContext<initQelDigest, freeQelDigest>;
+using CipherOwner = ContextOwner<Cipher, initQelCipher, freeQelCipher>;
+using DigestOwner = ContextOwner<Digest, initQelDigest, freeQelDigest>;
 
 }  // namespace ldappw

@@ -1,10 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
-// The one process-wide provider context, and cipher and digest contexts over it.
+// The one process-wide provider context, and cipher and digest contexts over it. Log readers match the texts as they
+// are, the one that shows no code among them; ProviderTest pins all.
+#include <sys/stat.h>
+
 #include <cstddef>
 #include <cstdio>
 #include <cstdlib>
 
-#include "mutex_lock.h"
+#include "cancellation.h"
+#include "locks.h"
+#include "owners.h"
 #include "qel_utils.h"
 #include "trace_scope.h"
 
@@ -14,9 +19,9 @@ static_assert(sizeof(QelStatus) == 268 && offsetof(QelStatus, minRC) == 4 && off
 namespace ldappw {
 namespace {
 
-constexpr TraceInfo kInitCrypto{"initQelCrypto", operationScope(moduleId(kQelUtils, 4)), LineClass::error};
-constexpr TraceInfo kFreeCrypto{"freeQelCrypto", operationScope(moduleId(kQelUtils, 5)), LineClass::error};
-constexpr TraceInfo kStatusToLdap{"qelStatusToLdap", operationScope(moduleId(kQelUtils, 10)), LineClass::error};
+constexpr TraceInfo kInitCrypto = operation(kQelUtils, 4, "initQelCrypto", {"qelCtx"});
+constexpr TraceInfo kFreeCrypto = operation(kQelUtils, 5, "freeQelCrypto", {"qelCtx"});
+constexpr TraceInfo kStatusToLdap = operation(kQelUtils, 10, "qelStatusToLdap", {"qelCtx", "status"});
 
 constexpr int kPathValue = 1;
 constexpr int kStateValue = 0;
@@ -26,9 +31,6 @@ constexpr uint32_t kProviderNoMemory = 15;
 struct ContextKind {
   TraceInfo create;
   TraceInfo release;
-  const char* contextArgument;
-  const char* nameArgument;
-  const char* algorithmArgument;
   void* (**newContext)(void*);
   int (**initContext)(void*, void*);
   const void* (**byName)(void*, const char*);
@@ -40,73 +42,103 @@ struct ContextKind {
   const char* freeFailed;
 };
 
-constexpr ContextKind kCipher{{"initQelCipher", operationScope(moduleId(kQelUtils, 6)), LineClass::error},
-                              {"freeQelCipher", operationScope(moduleId(kQelUtils, 7)), LineClass::error},
-                              "cipherCtx",
-                              "cipherName",
-                              "cipher",
-                              &pQEL_EVP_CIPHER_CTX_new,
-                              &pQEL_EVP_CIPHER_CTX_init,
-                              &pQEL_EVP_get_cipherbyname,
-                              &pQEL_EVP_CIPHER_CTX_cleanup,
-                              &pQEL_EVP_CIPHER_CTX_free,
-                              "QEL_EVP_CIPHER_CTX_new() failed.",
-                              "QEL_EVP_get_cipherbyname() failed.",
-                              "QEL_EVP_CIPHER_CTX_cleanup() failed.",
-                              "QEL_EVP_CIPHER_CTX_free() failed."};
+constexpr ContextKind kCipher{
+    operation(kQelUtils, 6, "initQelCipher", {"qelCtx", "cipherCtx", "cipherName", "cipher"}),
+    operation(kQelUtils, 7, "freeQelCipher", {"qelCtx", "cipherCtx"}),
+    &pQEL_EVP_CIPHER_CTX_new,
+    &pQEL_EVP_CIPHER_CTX_init,
+    &pQEL_EVP_get_cipherbyname,
+    &pQEL_EVP_CIPHER_CTX_cleanup,
+    &pQEL_EVP_CIPHER_CTX_free,
+    "QEL_EVP_CIPHER_CTX_new() failed.",
+    "QEL_EVP_get_cipherbyname() failed.",
+    "QEL_EVP_CIPHER_CTX_cleanup() failed.",
+    "QEL_EVP_CIPHER_CTX_free() failed.",
+};
 
-constexpr ContextKind kDigest{{"initQelDigest", operationScope(moduleId(kQelUtils, 8)), LineClass::error},
-                              {"freeQelDigest", operationScope(moduleId(kQelUtils, 9)), LineClass::error},
-                              "digestCtx",
-                              "digestName",
-                              "digest",
-                              &pQEL_EVP_MD_CTX_new,
-                              &pQEL_EVP_MD_CTX_init,
-                              &pQEL_EVP_get_digestbyname,
-                              &pQEL_EVP_MD_CTX_cleanup,
-                              &pQEL_EVP_MD_CTX_free,
-                              "QEL_EVP_MD_CTX_new() failed.",
-                              "QEL_EVP_get_digestbyname() failed.",
-                              "QEL_EVP_MD_CTX_cleanup() failed.",
-                              "QEL_EVP_MD_CTX_free() failed."};
+constexpr ContextKind kDigest{
+    operation(kQelUtils, 8, "initQelDigest", {"qelCtx", "digestCtx", "digestName", "digest"}),
+    operation(kQelUtils, 9, "freeQelDigest", {"qelCtx", "digestCtx"}),
+    &pQEL_EVP_MD_CTX_new,
+    &pQEL_EVP_MD_CTX_init,
+    &pQEL_EVP_get_digestbyname,
+    &pQEL_EVP_MD_CTX_cleanup,
+    &pQEL_EVP_MD_CTX_free,
+    "QEL_EVP_MD_CTX_new() failed.",
+    "QEL_EVP_get_digestbyname() failed.",
+    "QEL_EVP_MD_CTX_cleanup() failed.",
+    "QEL_EVP_MD_CTX_free() failed.",
+};
 
-// Serialises the creation of the provider context.
-pthread_mutex_t creationMutex = PTHREAD_MUTEX_INITIALIZER;
+// ---- The end of the process, and of the library ----
+
+bool isUnloading = false;  // dlclose has begun
+bool isExiting = false;    // exit has begun, with other threads about: they get no context any more
+
+// Runs before the exit handlers of a library that is unloaded, and after those of a process that exits.
+[[gnu::destructor]] void noteUnloading() noexcept {
+  isUnloading = true;
+}
+
+// A task directory has a link for each thread beside its own two.
+bool isOnlyThread() noexcept {
+  struct stat tasks {};
+  return stat("/proc/self/task", &tasks) == 0 && tasks.st_nlink == 3;
+}
+
+// Threads that still work when the process exits would lose the code under them: they keep the provider, which the
+// process takes with it anyway.
+void unloadAtExit() noexcept {
+  if (isUnloading || isOnlyThread()) {
+    unloadQelCrypto();
+  } else {
+    __atomic_store_n(&isExiting, true, __ATOMIC_RELEASE);
+  }
+}
+
+// ---- The process-wide context ----
 
 void* currentContext() noexcept {
   return __atomic_load_n(&qelCtxGlobal, __ATOMIC_ACQUIRE);
 }
 
 // Loads the provider and makes the context; under the lock.
-[[gnu::cold]] int createProviderContext(TracedCall& call) noexcept {
+int createProviderContext(TracedCall& call) noexcept {
   QelStatus status{};
   char* loadedPath = nullptr;
   const int rc = loadQelCrypto(&loadedPath);
   const PlainOwner<char> path(loadedPath);
-  if (rc != LDAPPW_SUCCESS) {
-    return call.failText(rc, "Error - initQelCrypto: loadQelCrypto() failed. \n");  // no code: meant
-  }
-  // A provider too old to tell its path leaves the table unresolved.
-  void* context = pQEL_Init == nullptr ? nullptr : pQEL_Init(&status, path.get());
+  if (rc != LDAPPW_SUCCESS) return call.failText(rc, "Error - initQelCrypto: loadQelCrypto() failed. \n");
+  if (currentContext() != nullptr) return LDAPPW_SUCCESS;  // a trace sink of this thread was first, from inside loading
+  // A provider too old to report its path leaves the table unresolved.
+  void* context = callEntry(pQEL_Init, &status, path.get());
   if (context == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "QEL_Init() returned NULL context.");
-  pQEL_SetValue(context, &status, kPathValue, path.get());
-  pQEL_SetValue(context, &status, kStateValue, "on");
-  pQEL_Attach(context, &status);
-  std::atexit(unloadQelCrypto);
+  callEntry(pQEL_SetValue, context, &status, kPathValue, path.get());
+  callEntry(pQEL_SetValue, context, &status, kStateValue, "on");
+  callEntry(pQEL_Attach, context, &status);
+  std::atexit(unloadAtExit);
   __atomic_store_n(&qelCtxGlobal, context, __ATOMIC_RELEASE);
   return LDAPPW_SUCCESS;
 }
 
-// A copy for each kind, in which the kind's row is known.
+[[gnu::cold]] int firstContext(TracedCall& call) noexcept {
+  const NoCancellation uncancelled;
+  const MutexLock lock(creationMutex);
+  return currentContext() != nullptr ? int{LDAPPW_SUCCESS} : createProviderContext(call);
+}
+
+// ---- Contexts for one call: a copy for each kind, in which the kind's row is known ----
+
 template <const ContextKind& kind>
 int releaseContext(void* qelCtx, void* context) noexcept {
-  TracedCall call{kind.release, "qelCtx", qelCtx, kind.contextArgument, context};
-  if (qelCtx == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
+  TracedCall call{kind.release, qelCtx, context};
+  if (qelCtx == nullptr) return call.invalid();
   if (context == nullptr) return call.leave(LDAPPW_SUCCESS);
-  if (const int rc = (*kind.cleanContext)(qelCtx, context); rc != 1) {
-    return call.failShowing(LDAPPW_OPERATIONS_ERROR, kind.cleanFailed, rc);  // not released: meant
+  if (const int rc = callEntry(*kind.cleanContext, qelCtx, context);
+      rc != 1) {  // what cannot be cleaned is not released
+    return call.failShowing(LDAPPW_OPERATIONS_ERROR, kind.cleanFailed, rc);
   }
-  if (const int rc = (*kind.freeContext)(qelCtx, context); rc != 1) {
+  if (const int rc = callEntry(*kind.freeContext, qelCtx, context); rc != 1) {
     return call.failShowing(LDAPPW_OPERATIONS_ERROR, kind.freeFailed, rc);
   }
   return call.leave(LDAPPW_SUCCESS);
@@ -114,16 +146,12 @@ int releaseContext(void* qelCtx, void* context) noexcept {
 
 template <const ContextKind& kind>
 int createContext(void* qelCtx, void** context, const char* name, void** algorithm) noexcept {
-  TracedCall call{kind.create, "qelCtx",          qelCtx, kind.contextArgument,
-                  context,     kind.nameArgument, name,   kind.algorithmArgument,
-                  algorithm};
-  if (qelCtx == nullptr || context == nullptr || name == nullptr || algorithm == nullptr) {
-    return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
-  }
-  *context = *kind.newContext == nullptr ? nullptr : (*kind.newContext)(qelCtx);
+  TracedCall call{kind.create, qelCtx, context, name, algorithm};
+  if (anyNull(qelCtx, context, name, algorithm)) return call.invalid();
+  *context = callEntry(*kind.newContext, qelCtx);
   if (*context == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, kind.newFailed);
-  (*kind.initContext)(qelCtx, *context);
-  *algorithm = const_cast<void*>((*kind.byName)(qelCtx, name));
+  callEntry(*kind.initContext, qelCtx, *context);
+  *algorithm = const_cast<void*>(callEntry(*kind.byName, qelCtx, name));
   if (*algorithm == nullptr) {
     call.fail(LDAPPW_OPERATIONS_ERROR, kind.byNameFailed);
     releaseContext<kind>(qelCtx, *context);
@@ -142,28 +170,23 @@ extern "C" {
 
 // Documented in crypto_provider.h.
 
-void* qelCtxGlobal = nullptr;
-
 int initQelCrypto(void** qelCtx) noexcept {
-  TracedCall call{kInitCrypto, "qelCtx", qelCtx};
-  if (qelCtx == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
-  void* context = currentContext();
-  if (__builtin_expect(context == nullptr, 0)) {
-    const MutexLock lock(creationMutex);
-    if (currentContext() == nullptr) {
-      if (const int rc = createProviderContext(call); rc != LDAPPW_SUCCESS) return rc;
-    }
-    context = currentContext();
+  TracedCall call{kInitCrypto, qelCtx};
+  if (qelCtx == nullptr) return call.invalid();
+  if (__atomic_load_n(&isExiting, __ATOMIC_RELAXED)) return call.leave(LDAPPW_OPERATIONS_ERROR);
+  if (currentContext() == nullptr) {
+    if (const int rc = firstContext(call); rc != LDAPPW_SUCCESS) return rc;
   }
-  *qelCtx = context;
+  *qelCtx = currentContext();
   return call.leave(LDAPPW_SUCCESS);
 }
 
 int freeQelCrypto(void* qelCtx) noexcept {
-  TracedCall call{kFreeCrypto, "qelCtx", qelCtx};
-  if (qelCtx != nullptr && pQEL_Cleanup != nullptr) {
+  TracedCall call{kFreeCrypto, qelCtx};
+  if (qelCtx != nullptr) {
+    const NoCancellation uncancelled;
     QelStatus status{};
-    pQEL_Cleanup(qelCtx, &status);
+    callEntry(pQEL_Cleanup, qelCtx, &status);
   }
   return call.leave(LDAPPW_SUCCESS);
 }
@@ -185,14 +208,15 @@ int freeQelDigest(void* qelCtx, void* digestCtx) noexcept {
 }
 
 int qelStatusToLdap(void* qelCtx, QelStatus* status) noexcept {
-  TracedCall call{kStatusToLdap, "qelCtx", qelCtx, "status", status};
+  TracedCall call{kStatusToLdap, qelCtx, status};
   QelStatus last{};
   if (status == nullptr) {
-    if (qelCtx == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
-    if (pQEL_GetStatus != nullptr) pQEL_GetStatus(qelCtx, &last);
+    if (qelCtx == nullptr) return call.invalid();
+    callEntry(pQEL_GetStatus, qelCtx, &last);
     status = &last;
   }
   if (status->majRC == 0) return call.leave(LDAPPW_SUCCESS);
+  const NoCancellation uncancelled;
   std::printf("QEL Status - \nmajRC: %d\nminRC: %d\ndesc: %.*s\n", status->majRC, status->minRC,
               static_cast<int>(sizeof status->desc), status->desc);
   const bool noMemory = static_cast<uint32_t>(status->minRC) == kProviderNoMemory;

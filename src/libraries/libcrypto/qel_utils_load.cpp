@@ -1,70 +1,24 @@
 // SPDX-License-Identifier: Apache-2.0
-// Finding and opening the crypto provider library, resolving its entry table, and closing it.
+// Finding and opening the crypto provider library, resolving its entry table, and closing it. Log readers match the
+// texts as they are, with their blanks and without a code; LoadingTest pins all.
+#include "qel_utils_load.h"
+
 #include <cstdio>
 #include <cstring>
 
+#include "cancellation.h"
 #include "dsutil.h"
 #include "qel_utils.h"
+#include "qel_utils_table.h"
 #include "trace_scope.h"
-
-// The entry table. It stands before the logic, as the interface lists it.
-extern "C" {
-
-// Documented in crypto_provider.h.
-
-const char* qelLibraryName = "libtresk7qels.so";
-void** qelLoadGlobal = nullptr;
-
-#define LDAPPW_ENTRIES(X)          \
-  X(GetStatus)                     \
-  X(SetValue)                      \
-  X(GetValue)                      \
-  X(Init)                          \
-  X(Attach)                        \
-  X(Cleanup)                       \
-  X(EVP_get_cipherbyname)          \
-  X(EVP_get_digestbyname)          \
-  X(EVP_MD_CTX_new)                \
-  X(EVP_MD_CTX_free)               \
-  X(EVP_MD_CTX_init)               \
-  X(EVP_MD_CTX_cleanup)            \
-  X(EVP_MD_block_size)             \
-  X(EVP_MD_size)                   \
-  X(EVP_DigestInit)                \
-  X(EVP_DigestUpdate)              \
-  X(EVP_DigestFinal)               \
-  X(EVP_CIPHER_CTX_new)            \
-  X(EVP_CIPHER_CTX_free)           \
-  X(EVP_CIPHER_CTX_init)           \
-  X(EVP_CIPHER_CTX_cleanup)        \
-  X(EVP_CIPHER_CTX_set_key_length) \
-  X(EVP_CIPHER_CTX_set_padding)    \
-  X(EVP_CIPHER_block_size)         \
-  X(EVP_CIPHER_key_length)         \
-  X(EVP_CIPHER_iv_length)          \
-  X(EVP_EncryptInit)               \
-  X(EVP_EncryptUpdate)             \
-  X(EVP_EncryptFinal)              \
-  X(EVP_DecryptInit)               \
-  X(EVP_DecryptUpdate)             \
-  X(EVP_DecryptFinal)              \
-  X(EVP_CIPHER_CTX_cipher)         \
-  X(RAND_bytes)                    \
-  X(RAND_seed)                     \
-  X(GenerateRandomSeed)
-
-#define LDAPPW_DEFINE(operation) decltype(pQEL_##operation) pQEL_##operation = nullptr;
-LDAPPW_ENTRIES(LDAPPW_DEFINE)
-#undef LDAPPW_DEFINE
-
-}  // extern "C"
+#include "utils_loader.h"
 
 namespace ldappw {
 namespace {
 
-constexpr TraceInfo kLoad{"loadQelCrypto", operationScope(moduleId(kQelUtils, 1)), LineClass::error};
-constexpr TraceInfo kSystemPath{"getQelInstallLibPath", operationScope(moduleId(kQelUtils, 2)), LineClass::error};
-constexpr TraceInfo kShippedPath{"getKubInstallLibPath", operationScope(moduleId(kQelUtils, 3)), LineClass::error};
+constexpr TraceInfo kLoad = operation(kQelUtils, 1, "loadQelCrypto", {"attachPath"});
+constexpr TraceInfo kSystemPath = operation(kQelUtils, 2, "getQelInstallLibPath");
+constexpr TraceInfo kShippedPath = operation(kQelUtils, 3, "getKubInstallLibPath");
 
 constexpr size_t kAttachPathSize = 1024;
 constexpr char kPathSymbol[] = "treskqels_path";
@@ -75,20 +29,6 @@ constexpr char kProviderFolder[] = "/qel";
 constexpr char kVersionHint[] = "Error - Check the supported version of TRESK in the install guide.\n";
 
 using PathOperation = int (*)(char* buffer, int size);
-
-struct Entry {
-  const char* symbol;
-  void* slot;  // of the pointer, whose type is the operation's
-};
-
-#define LDAPPW_ROW(operation) {"QEL_" #operation, &pQEL_##operation},
-constexpr Entry kEntries[] = {LDAPPW_ENTRIES(LDAPPW_ROW)};
-#undef LDAPPW_ROW
-#undef LDAPPW_ENTRIES
-static_assert(sizeof kEntries / sizeof kEntries[0] == 36);
-
-// The cell that was closed last: unloading leaves the global as it is, so a second unloading must know.
-void** closedLibrary = nullptr;
 
 PlainOwner<char> joined(const char* first, const char* second, const char* third = "") noexcept {
   const size_t size = std::strlen(first) + std::strlen(second) + std::strlen(third) + 1;
@@ -141,9 +81,7 @@ int announceCopy(TracedCall& call, const char* shipped) noexcept {
 }
 
 void openLibrary(const char* path) noexcept {
-  if (qelLoadGlobal != nullptr) return;
-  qelLoadGlobal = ldapLoadLib(path, 0);
-  if (qelLoadGlobal != nullptr) closedLibrary = nullptr;
+  if (qelLoadGlobal == nullptr) qelLoadGlobal = ldapLoadLib(path, 0);
 }
 
 // The system's copy did not do: where it opened, it is too old.
@@ -155,12 +93,13 @@ void dropSystemCopy(TracedCall& call) noexcept {
   qelLoadGlobal = nullptr;
 }
 
-// Nor did the shipped copy.
+// Nor did the shipped copy. One that opens but is too old counts as a success, with the library open and the table
+// unresolved: initQelCrypto then reports that there is no context.
 int giveUp(TracedCall& call) noexcept {
-  if (qelLoadGlobal == nullptr) return resolveEntries(call);  // says that the first entry is missing
+  if (qelLoadGlobal == nullptr) return resolveEntries(call);  // reports the first entry as missing
   call.line(LineClass::error, "Error - loadQelCrypto: ldapGetSymAddress(pQEL_PATH) failed.\n");
   call.line(LineClass::error, kVersionHint);
-  return call.leave(LDAPPW_SUCCESS);  // meant: the library stays open, the table unresolved
+  return call.leave(LDAPPW_SUCCESS);
 }
 
 }  // namespace
@@ -204,8 +143,8 @@ using namespace ldappw;
 extern "C" {
 
 int loadQelCrypto(char** attachPath) noexcept {
-  TracedCall call{kLoad, "attachPath", attachPath};
-  if (attachPath == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter.");
+  TracedCall call{kLoad, attachPath};
+  if (attachPath == nullptr) return call.invalid();
   *attachPath = nullptr;
 
   for (bool shipped = false;; shipped = true) {
@@ -223,14 +162,15 @@ int loadQelCrypto(char** attachPath) noexcept {
 }
 
 void unloadQelCrypto(void) noexcept {
-  if (qelLoadGlobal != nullptr && qelLoadGlobal == closedLibrary) return;
-  if (qelCtxGlobal != nullptr && pQEL_Cleanup != nullptr) {
+  if (isClosed(qelLoadGlobal)) return;
+  const NoCancellation uncancelled;
+  if (qelCtxGlobal != nullptr) {
     QelStatus status{};
-    pQEL_Cleanup(qelCtxGlobal, &status);
+    callEntry(pQEL_Cleanup, qelCtxGlobal, &status);
   }
   if (qelLoadGlobal != nullptr) {
+    rememberClosed(qelLoadGlobal);
     ldapUnloadLib(qelLoadGlobal);
-    closedLibrary = qelLoadGlobal;
   }
 }
 

@@ -1,12 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
-// Making stored values: the scheme table and one payload maker a scheme.
+// Making stored values: one payload maker a scheme.
+#include "rdbm_pwd_format.h"
+
 #include <cstring>
+#include <iterator>
 
 #include "crypt_state.h"
-#include "mutex_lock.h"
-#include "owners.h"
-#include "password_schemes.h"
-#include "rdbm_pwd_schemes.h"
+#include "locks.h"
 #include "text_target.h"
 
 namespace ldappw {
@@ -15,77 +15,83 @@ namespace {
 constexpr TraceInfo kFormatPassword = passwordOperation("format_password", kFormatPasswordId);
 
 constexpr size_t kDigestBytes = sizeof(sha_digest);
-constexpr size_t kCryptKeySize = 1024;
+constexpr size_t kCryptKeyBytes = 8;  // that count
 constexpr size_t kCryptCharacters = 13;
-constexpr size_t kMaskedKeySize = 50;
-constexpr size_t kMaskedClear = 46;  // longer passwords are cut without notice: meant
+constexpr size_t kMaskedClear = 46;  // a longer password is cut silently, as in every stored value: MaskedTest.Cut
 constexpr size_t kMaskedCharacters = 164;
 constexpr size_t kFormattedSha = 33;
 
-// _crypt works on one process-wide state; this is the library's only lock on the way of passwords.
-pthread_mutex_t cryptMutex = PTHREAD_MUTEX_INITIALIZER;
+// The clear text up to a first NUL, behind which nothing is read, since it may be the end of what there is.
+size_t bytesBeforeNul(const FormatRequest& request) noexcept {
+  return strnlen(request.clear, request.clearBytes);
+}
 
-// Bytes of the clear text from offset on, zeros where there are none.
-void takeFixed(unsigned char* to, size_t bytes, const FormatRequest& request, size_t offset) noexcept {
-  std::memset(to, 0, bytes);
-  if (request.clearBytes <= offset) return;
-  const size_t given = request.clearBytes - offset;
-  std::memcpy(to, request.clear + offset, given < bytes ? given : bytes);
+size_t least(size_t a, size_t b) noexcept {
+  return a < b ? a : b;
+}
+
+// ---- The makers ----
+
+// Each writes a payload behind the tag and returns its length, 0 for failure.
+using PayloadMaker = size_t (*)(TracedCall& call, const Scheme& scheme, const FormatRequest& request, char* payload);
+
+size_t makeClear(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
+  if (request.clearBytes != 0) std::memcpy(payload, request.clear, request.clearBytes);
+  return request.clearBytes;
 }
 
 // The digest of the clear text, in which every byte after a first NUL counts as NUL. False when memory runs out.
 bool digestClear(const FormatRequest& request, sha_digest& digest) noexcept {
-  const void* nul = request.clearBytes == 0 ? nullptr : std::memchr(request.clear, '\0', request.clearBytes);
-  if (nul == nullptr) {
+  const size_t before = bytesBeforeNul(request);
+  if (before == request.clearBytes) {
     SHA(const_cast<char*>(request.clear), request.clearBytes, &digest);
     return true;
   }
-  SecretText copy(request.clear, request.clearBytes);
+  SecretBytes<256> copy(request.clearBytes);
   if (!copy) return false;
-  const auto before = static_cast<size_t>(static_cast<const char*>(nul) - request.clear);
-  std::memset(copy.get() + before, 0, request.clearBytes - before);
-  SHA(copy.get(), request.clearBytes, &digest);
+  std::memcpy(copy.get(), request.clear, before);
+  SHA(copy.text(), request.clearBytes, &digest);
   return true;
+}
+
+// The bytes after the tag as a digest; what is not there counts as NUL.
+void takeDigest(const FormatRequest& request, size_t tagBytes, unsigned char* digest) noexcept {
+  std::memcpy(digest, request.clear + tagBytes, least(request.clearBytes - tagBytes, kDigestBytes));
 }
 
 size_t makeSha(TracedCall& call, const Scheme& scheme, const FormatRequest& request, char* payload) noexcept {
   sha_digest digest{};
   auto* digestBytes = reinterpret_cast<unsigned char*>(&digest);
-  const bool tagged = request.clearBytes >= scheme.tagBytes && beginsWith(request.clear, scheme.tag, scheme.tagBytes);
-  if (tagged && request.clearBytes == kFormattedSha) {
+  const bool isTagged = !request.isClear && bytesBeforeNul(request) >= scheme.tagBytes && hasTag(request.clear, scheme);
+  if (isTagged && request.clearBytes == kFormattedSha) {
     call.line(LineClass::debug,
               "format_password: This pwd update is in SHA format and is from an ORVEX supplier. Do nothing.\n");
     return 0;
   }
-  if (tagged) {
+  if (isTagged) {
     call.line(LineClass::debug,
               "format_password: This pwd update is in SHA format and is NOT from an ORVEX supplier. Base64 it.\n");
-    takeFixed(digestBytes, kDigestBytes, request, scheme.tagBytes);
+    takeDigest(request, scheme.tagBytes, digestBytes);
   } else if (!digestClear(request, digest)) {
     return 0;
   }
-  TextTarget target(payload);
-  return target.write(digestBytes, kDigestBytes) ? target.length() : 0;
-}
-
-// What the digests of the provider take: the clear text up to a first NUL.
-size_t bytesBeforeNul(const FormatRequest& request) noexcept {
-  return strnlen(request.clear, request.clearBytes);
+  TextTarget target = behindTag(payload);
+  return writeBase64(target, digestBytes, kDigestBytes) ? target.length : 0;
 }
 
 size_t makeMd5(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
-  TextTarget target(payload);
-  return unsaltedHashTo(target, "md5", request.clear, bytesBeforeNul(request)) == 0 ? target.length() : 0;
+  TextTarget target = behindTag(payload);
+  return unsaltedHashTo(target, "md5", request.clear, bytesBeforeNul(request)) == 0 ? target.length : 0;
 }
 
 size_t makeSsha(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
-  TextTarget target(payload);
-  return saltedHashTo(target, request.clear, bytesBeforeNul(request), kSaltedDigest) == 0 ? target.length() : 0;
+  TextTarget target = behindTag(payload);
+  return saltedHashTo(target, request.clear, bytesBeforeNul(request), kSaltedDigest) == 0 ? target.length : 0;
 }
 
 size_t makeCrypt(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
-  SecretArray<kCryptKeySize> key;
-  takeFixed(key.data(), kCryptKeySize - 1, request, 0);
+  SecretArray<kCryptKeyBytes + 1> key;
+  std::memcpy(key.data(), request.clear, strnlen(request.clear, least(request.clearBytes, kCryptKeyBytes)));
   const MutexLock lock(cryptMutex);
   std::memcpy(payload, _crypt(key.text(), request.salt), kCryptCharacters);
   wipeCryptState();
@@ -93,8 +99,8 @@ size_t makeCrypt(TracedCall&, const Scheme&, const FormatRequest& request, char*
 }
 
 size_t makeMasked(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
-  SecretArray<kMaskedKeySize> clear;
-  takeFixed(clear.data(), kMaskedClear, request, 0);
+  SecretArray<kMaskedClear + 1> clear;
+  std::memcpy(clear.data(), request.clear, strnlen(request.clear, least(request.clearBytes, kMaskedClear)));
   char* made = nullptr;
   const int rc = _morva_utils_encode_buffer(clear.text(), &made);
   const PlainOwner<char> encoded(made);
@@ -105,51 +111,62 @@ size_t makeMasked(TracedCall&, const Scheme&, const FormatRequest& request, char
 
 size_t makeAes(TracedCall&, const Scheme& scheme, const FormatRequest& request, char* payload) noexcept {
   if (request.keyData == nullptr) return 0;
-  TextTarget target(payload);
+  TextTarget target = behindTag(payload);
   const int rc =
       aesEncryptTo(target, request.clear, g_CipherName[scheme.keyIndex], &request.keyData->aesKeys[scheme.keyIndex],
                    &request.keyData->cryptoSalt, static_cast<int>(request.clearBytes));
-  return rc == 0 ? target.length() : 0;
+  return rc == 0 ? target.length : 0;
 }
 
-constexpr int kNoKey = -1;
+struct MakerRow {
+  int code;
+  PayloadMaker make;
+};
 
-// The most wanted come first. The 21 of MD5 is less than the 29 characters that it writes: meant, as are the shorter
-// rooms of the digests.
-constexpr Scheme kSchemes[] = {{FORMAT_AES256, AES256_BRACED, sizeof AES256_BRACED, kMeasured, 0, 2, makeAes},
-                               {FORMAT_SSHA, SSHA_BRACED, sizeof SSHA_BRACED, 62, 40, kNoKey, makeSsha},
-                               {FORMAT_SHA, SHA_BRACED, sizeof SHA_BRACED, 33, 20, kNoKey, makeSha},
-                               {FORMAT_MD5, MD5_BRACED, sizeof MD5_BRACED, 21, 16, kNoKey, makeMd5},
-                               {FORMAT_CRYPT, crypt_BRACED, sizeof crypt_BRACED, 20, 13, kNoKey, makeCrypt},
-                               {FORMAT_QVEIL, qVEIL_BRACED, sizeof qVEIL_BRACED, 171, 164, kNoKey, makeMasked},
-                               {FORMAT_AES192, AES192_BRACED, sizeof AES192_BRACED, kMeasured, 0, 1, makeAes},
-                               {FORMAT_AES128, AES128_BRACED, sizeof AES128_BRACED, kMeasured, 0, 0, makeAes}};
+// In the order of the scheme table.
+constexpr MakerRow kMakers[] = {
+    {FORMAT_NONE, makeClear}, {FORMAT_SSHA, makeSsha},    {FORMAT_SHA, makeSha},    {FORMAT_CRYPT, makeCrypt},
+    {FORMAT_MD5, makeMd5},    {FORMAT_QVEIL, makeMasked}, {FORMAT_AES256, makeAes}, {FORMAT_AES192, makeAes},
+    {FORMAT_AES128, makeAes}, {FORMAT_VLDL, nullptr},
+};
 
-int copyClear(const FormatRequest& request, char* out, size_t outSize) noexcept {
-  if (outSize < request.clearBytes) return 0;
-  if (request.clearBytes != 0) std::memcpy(out, request.clear, request.clearBytes);
-  return static_cast<int>(request.clearBytes);
+constexpr bool fitTheSchemes() {
+  for (size_t i = 0; i < std::size(kSchemes); ++i) {
+    const bool isMade = kSchemes[i].fixedLength != kNeverMade;
+    if (kMakers[i].code != kSchemes[i].code || (kMakers[i].make != nullptr) != isMade) return false;
+  }
+  return std::size(kMakers) == std::size(kSchemes);
+}
+static_assert(fitTheSchemes(), "a maker for each scheme that can be made");
+
+// ---- Formatting ----
+
+// {AES256} without keys becomes {qVEIL}; the shorter keys have no such way out and make nothing.
+// SchemesTest.WithoutKeys pins it.
+const Scheme* schemeToMake(int code, const AesKeyData* keyData) noexcept {
+  return findScheme(code == FORMAT_AES256 && keyData == nullptr ? int{FORMAT_QVEIL} : code);
 }
 
-// Writes the value into the cleared buffer.
-int formatValue(TracedCall& call, const Scheme& scheme, const FormatRequest& request, char* out,
-                size_t outSize) noexcept {
-  const int least = valueLength(scheme, static_cast<int>(request.clearBytes));
-  if (least < 0 || outSize < static_cast<size_t>(least)) return 0;
-  if (scheme.code == FORMAT_CRYPT && request.salt == nullptr) return 0;
-  std::memcpy(out, scheme.tag, scheme.tagBytes);
-  if (outSize - scheme.tagBytes < scheme.payloadRoom) return 0;
-  const size_t payload = scheme.make(call, scheme, request, out + scheme.tagBytes);
-  return payload == 0 ? 0 : static_cast<int>(scheme.tagBytes + payload);
+int formattedValue(TracedCall& call, int code, const FormatRequest& request, char* out, size_t outSize) noexcept {
+  const Scheme* scheme = schemeToMake(code, request.keyData);
+  if (scheme == nullptr || scheme->fixedLength == kNeverMade) {
+    call.line(LineClass::debug, "Error - format_password: Format-UNKNOWN pwd encoding %d\n", code);
+    return 0;
+  }
+  const int length = valueLength(*scheme, static_cast<int>(request.clearBytes));
+  if (length < 0 || outSize < static_cast<size_t>(length)) return 0;
+  if (scheme->code == FORMAT_CRYPT && request.salt == nullptr) return 0;
+  std::memcpy(out, scheme->tag, scheme->tagBytes);
+  if (outSize - scheme->tagBytes < scheme->payloadRoom) return 0;
+  const size_t payload = kMakers[scheme - kSchemes].make(call, *scheme, request, out + scheme->tagBytes);
+  return payload == 0 ? 0 : static_cast<int>(scheme->tagBytes + payload);
 }
 
 }  // namespace
 
-const Scheme* findScheme(int code) noexcept {
-  for (const Scheme& scheme : kSchemes) {
-    if (scheme.code == code) return &scheme;
-  }
-  return nullptr;
+int formatValue(int code, const FormatRequest& request, char* out, size_t outSize) noexcept {
+  TracedCall call{kFormatPassword};
+  return call.leave(formattedValue(call, code, request, out, outSize));
 }
 
 }  // namespace ldappw
@@ -163,16 +180,12 @@ extern "C" {
 int format_password(int scheme, char* salt, AesKeyData* keyData, const char* clear, int clearLength, char* out,
                     int outSize) noexcept {
   TracedCall call{kFormatPassword};
-  if (clear == out) return call.leave(0);
-  if (out == nullptr || outSize < 0) return call.leave(0);
+  if (clear == out || out == nullptr || outSize < 0) return call.leave(0);
   const auto room = static_cast<size_t>(outSize);
   std::memset(out, 0, room);  // also for what is refused
   if (clear == nullptr || clearLength < 0) return call.leave(0);
-  if (keyData == nullptr && scheme == FORMAT_AES256) scheme = FORMAT_QVEIL;  // this one alone: meant
-  const FormatRequest request{clear, static_cast<size_t>(clearLength), salt, keyData};
-  if (scheme == FORMAT_NONE) return call.leave(copyClear(request, out, room));
-  if (const Scheme* row = findScheme(scheme)) return call.leave(formatValue(call, *row, request, out, room));
-  return call.failText(0, "Error - format_password: Format-UNKNOWN pwd encoding %d\n", scheme);
+  const FormatRequest request{clear, static_cast<size_t>(clearLength), salt, keyData, false};
+  return call.leave(formattedValue(call, scheme, request, out, room));
 }
 
 }  // extern "C"

@@ -1,27 +1,24 @@
 // SPDX-License-Identifier: Apache-2.0
-// Checking presented passwords against stored values, and turning reversible values back into clear text.
-#include <algorithm>
+// Checking presented passwords against stored values. Which of the schemes of the two texts decide how they are
+// compared stands in one table; each comparison is a few lines above it.
 #include <cstring>
 
 #include "owners.h"
 #include "password_schemes.h"
-#include "rdbm_pwd_schemes.h"
+#include "rdbm_pwd.h"
+#include "rdbm_pwd_format.h"
+#include "rdbm_pwd_reverse.h"
 #include "text_target.h"
 
 namespace ldappw {
 namespace {
 
-constexpr TraceInfo kVerifyPassword{"verify_password", smallScope(passwordId(kVerifyPasswordId)), LineClass::debug,
-                                    Lines::none};
-constexpr TraceInfo kUnformatPassword = passwordOperation("unformat_password", kUnformatPasswordId);
+constexpr TraceInfo kVerifyPassword{
+    "verify_password", {passwordId(kVerifyPasswordId), kSmallLevel, kSmallMask}, LineClass::debug, {}, Lines::none};
 
 constexpr int kNotCompared = 99;
-constexpr size_t kWorkSize = 1024;
-constexpr size_t kFixedRoom = 192;  // more than the longest value of fixed length
+constexpr size_t kWorkSize = 1024;  // no longer value is compared by formatting
 constexpr size_t kLeading = 46;     // what is compared of two values of one scheme, and of unmasked texts
-constexpr size_t kMaskedTag = sizeof qVEIL_BRACED;
-constexpr size_t kMaskedCharacters = 164;
-constexpr size_t kLongestUnmasked = 170;
 
 struct Text {
   const char* data;
@@ -31,9 +28,9 @@ struct Text {
 // One comparison: both texts, and the scheme that each is taken for.
 struct Comparison {
   Text presented;
-  int presentedScheme;
+  const Scheme& presentedScheme;
   Text stored;
-  int storedScheme;
+  const Scheme& storedScheme;
   AesKeyData* keyData;
 };
 
@@ -61,7 +58,7 @@ struct CryptSalt {
   char characters[3] = {};
 };
 
-// Room for a formatted value. format_password clears it, so it starts as it is, and only what was formatted is wiped.
+// Room for a formatted value, of which only what was written is looked at and wiped.
 class WorkBuffer {
  public:
   WorkBuffer() = default;
@@ -69,25 +66,22 @@ class WorkBuffer {
   WorkBuffer(const WorkBuffer&) = delete;
   WorkBuffer& operator=(const WorkBuffer&) = delete;
 
-  // Formats a clear text in the scheme, and with the salt, of the value that it is compared with.
-  Text formatLike(const Text& clear, int scheme, const Text& value, AesKeyData* keyData) noexcept {
-    CryptSalt salt(value);
-    char* saltText = scheme == FORMAT_CRYPT ? salt.characters : nullptr;
-    length_ = static_cast<size_t>(format_password(scheme, saltText, keyData, clear.data, static_cast<int>(clear.length),
-                                                  bytes_, roomFor(scheme)));
+  // Formats in the scheme, and with the salt, of the value that the result is compared with. isClear: the text is a
+  // password, whatever it begins with.
+  Text formatLike(const Text& text, bool isClear, const Scheme& scheme, const Text& value,
+                  AesKeyData* keyData) noexcept {
+    const CryptSalt salt(value);
+    const FormatRequest request{text.data, text.length, salt.characters, keyData, isClear};
+    length_ = static_cast<size_t>(formatValue(scheme.code, request, bytes_, sizeof bytes_));
     return {bytes_, length_};
   }
 
  private:
-  // format_password clears its whole buffer, so it is told of no more than a value of fixed length needs.
-  static int roomFor(int scheme) noexcept {
-    const Scheme* row = findScheme(scheme);
-    return static_cast<int>(row != nullptr && row->fixedLength != kMeasured ? kFixedRoom : kWorkSize);
-  }
-
   char bytes_[kWorkSize];
   size_t length_ = 0;
 };
+
+// ---- The comparisons ----
 
 int notComparable(const Comparison&) noexcept {
   return kNotCompared;
@@ -109,45 +103,34 @@ int verifySalted(const Comparison& c) noexcept {
 
 int compareFormattedStored(const Comparison& c) noexcept {
   WorkBuffer work;
-  return compareTexts(work.formatLike(c.stored, c.presentedScheme, c.presented, c.keyData), c.presented);
+  return compareTexts(work.formatLike(c.stored, true, c.presentedScheme, c.presented, c.keyData), c.presented);
 }
 
 // Tags compare without regard to case, payloads exactly. The tags differ when a missing key made another scheme of it.
 int compareFormattedPresented(const Comparison& c) noexcept {
   WorkBuffer work;
-  const Text made = work.formatLike(c.presented, c.storedScheme, c.stored, c.keyData);
+  const Text made = work.formatLike(c.presented, true, c.storedScheme, c.stored, c.keyData);
   if (made.length != c.stored.length) return kNotCompared;
-  const size_t tagBytes = findScheme(c.storedScheme)->tagBytes;
-  if (!beginsWith(made.data, c.stored.data, tagBytes)) return kNotCompared;
+  const size_t tagBytes = c.storedScheme.tagBytes;
+  if (const int difference = compareTag(made.data, c.stored.data, tagBytes); difference != 0) return difference;
   return compareTexts(behind(made, tagBytes), behind(c.stored, tagBytes));
 }
 
 // Two {SHA} values: one that carries a raw digest matches its base64 form.
 int compareDigests(const Comparison& c) noexcept {
   WorkBuffer work;
-  const Text made = work.formatLike(c.presented, FORMAT_SHA, c.presented, g_DirKeyData);
+  const Text made = work.formatLike(c.presented, false, c.storedScheme, c.presented, g_DirKeyData);
   return compareTexts(made.length != 0 ? made : c.presented, c.stored);
 }
-
-// The fixed number of characters that are taken of a masked value, terminated.
-class MaskedText {
- public:
-  explicit MaskedText(const Text& masked) noexcept {
-    std::memcpy(copy_.text(), masked.data, masked.length < kMaskedCharacters ? masked.length : kMaskedCharacters);
-  }
-  int decode(char** clear) noexcept { return _morva_utils_decode_buffer(copy_.text(), clear); }
-
- private:
-  SecretArray<kMaskedCharacters + 1> copy_;
-};
 
 // One side of a comparison in clear: a masked one decoded, any other as it is.
 class Unmasked {
  public:
-  Unmasked(const Text& side, int scheme) noexcept : text_(side) {
-    if (scheme != FORMAT_QVEIL) return;
+  Unmasked(const Text& side, const Scheme& scheme) noexcept : text_(side) {
+    if (scheme.code != FORMAT_QVEIL) return;
+    const Text payload = behind(side, scheme.tagBytes);
     char* clear = nullptr;
-    failed_ = MaskedText(behind(side, kMaskedTag)).decode(&clear) != 0;
+    failed_ = unmaskPayload(payload.data, payload.length, &clear) != 0;
     clear_.reset(clear);
     if (!failed_ && clear != nullptr) text_ = {clear, std::strlen(clear)};
   }
@@ -157,7 +140,7 @@ class Unmasked {
  private:
   Text text_;
   bool failed_ = false;
-  SecretOwner<char> clear_;
+  SecretText clear_;
 };
 
 int compareUnmasked(const Comparison& c) noexcept {
@@ -167,7 +150,8 @@ int compareUnmasked(const Comparison& c) noexcept {
   return compareTexts(leading(presented.text()), leading(stored.text()));
 }
 
-// Which comparison a pair of schemes gets: the first row that fits.
+// ---- Which comparison a pair of schemes gets ----
+
 constexpr int kAny = -1;
 constexpr int kSameAsStored = -2;
 
@@ -177,47 +161,37 @@ struct Rule {
   int (*compare)(const Comparison&);
 };
 
-// The usual pairs, with a clear presented password, come first.
+// The first row that fits counts. The usual pairs, with a clear presented password, come first. A {SSHA} value
+// presented against a clear stored text is checked as the password of a value whose payload is that text, so that a
+// value never matches the password that it was made of: SchemesTest.Pairs pins it.
+// clang-format off
 constexpr Rule kRules[] = {
-    {FORMAT_SSHA, FORMAT_NONE, verifySalted},       {FORMAT_NONE, FORMAT_NONE, compareLeading},
-    {FORMAT_QVEIL, kAny, compareUnmasked},          {FORMAT_VLDL, FORMAT_NONE, notComparable},
-    {kAny, FORMAT_NONE, compareFormattedPresented}, {kAny, FORMAT_QVEIL, compareUnmasked},
-    {FORMAT_SHA, FORMAT_SHA, compareDigests},       {kAny, kSameAsStored, compareLeading},
-    {FORMAT_NONE, FORMAT_SSHA, verifySalted},  // not exchanged, so that no such pair of values matches: meant
-    {FORMAT_NONE, kAny, compareFormattedStored},    {kAny, kAny, compareWhole},
+    // stored      presented
+    {FORMAT_SSHA,  FORMAT_NONE,   verifySalted},
+    {FORMAT_NONE,  FORMAT_NONE,   compareLeading},
+    {FORMAT_QVEIL, kAny,          compareUnmasked},
+    {FORMAT_VLDL,  FORMAT_NONE,   notComparable},
+    {kAny,         FORMAT_NONE,   compareFormattedPresented},
+    {kAny,         FORMAT_QVEIL,  compareUnmasked},
+    {FORMAT_SHA,   FORMAT_SHA,    compareDigests},
+    {kAny,         kSameAsStored, compareLeading},
+    {FORMAT_NONE,  FORMAT_SSHA,   verifySalted},
+    {FORMAT_NONE,  kAny,          compareFormattedStored},
+    {kAny,         kAny,          compareWhole},
 };
+// clang-format on
 
 int compare(const Comparison& c) noexcept {
+  const int stored = c.storedScheme.code;
+  const int presented = c.presentedScheme.code;
   for (const Rule& rule : kRules) {
-    const int presented = rule.presented == kSameAsStored ? c.storedScheme : rule.presented;
-    if ((rule.stored == kAny || rule.stored == c.storedScheme) &&
-        (presented == kAny || presented == c.presentedScheme)) {
-      return rule.compare(c);
-    }
+    const bool fitsStored = rule.stored == kAny || rule.stored == stored;
+    const bool fitsPresented = rule.presented == kAny || rule.presented == presented ||
+                               (rule.presented == kSameAsStored && presented == stored);
+    if (fitsStored && fitsPresented) return rule.compare(c);
   }
   return kNotCompared;
 }
-
-int unmaskValue(const char* value, char** clear, int* clearLength) noexcept {
-  const char* masked = value[0] == '>' ? value : value + kMaskedTag;
-  const int rc = MaskedText({masked, strnlen(masked, kMaskedCharacters)}).decode(clear);
-  if (rc == 0 && *clear != nullptr && std::strlen(*clear) <= kLongestUnmasked) {
-    if (clearLength != nullptr) *clearLength = static_cast<int>(std::strlen(*clear));
-    return 1;
-  }
-  _morva_utils_decode_buffer_free(clear);
-  return 0;
-}
-
-int decryptValue(const Scheme& scheme, const char* value, char** clear, AesKeyData* keyData,
-                 int* clearLength) noexcept {
-  if (keyData == nullptr) return 0;
-  const int rc = aesDecryptBuffer(value + scheme.tagBytes, clear, g_CipherName[scheme.keyIndex],
-                                  &keyData->aesKeys[scheme.keyIndex], &keyData->cryptoSalt, clearLength);
-  return rc == 0 ? 1 : 0;
-}
-
-constexpr int kReversibleBit = 0x80;
 
 }  // namespace
 }  // namespace ldappw
@@ -231,46 +205,13 @@ extern "C" {
 int verify_password(const char* presented, int presentedLength, const char* stored, int storedLength,
                     int presentedIsClear, AesKeyData* keyData) noexcept {
   TracedCall call{kVerifyPassword};
-  if (presented == nullptr || stored == nullptr || presentedLength < 0 || storedLength < 0) {
-    return call.leave(kNotCompared);
-  }
-  const int storedScheme = check_format(stored, static_cast<unsigned>(storedLength));
-  const int presentedScheme =
-      presentedIsClear != 0 ? int{FORMAT_NONE} : check_format(presented, static_cast<unsigned>(presentedLength));
-  return call.leave(compare({{presented, static_cast<size_t>(presentedLength)},
-                             presentedScheme,
-                             {stored, static_cast<size_t>(storedLength)},
-                             storedScheme,
-                             keyData}));
-}
-
-int unformat_password(const char* value, char** clear, AesKeyData* keyData, int* clearLength) noexcept {
-  TracedCall call{kUnformatPassword};
-  if (value == nullptr || clear == nullptr) return call.leave(0);
-  const int code = check_format(value, static_cast<unsigned>(std::strlen(value)));
-  if (code == FORMAT_QVEIL) return call.leave(unmaskValue(value, clear, clearLength));
-  const Scheme* scheme = findScheme(code);
-  if (scheme != nullptr && scheme->fixedLength == kMeasured) {
-    return call.leave(decryptValue(*scheme, value, clear, keyData, clearLength));
-  }
-  return call.failText(0, "Format:UNIMPLEMENTED pwd encoding %d\n", code);
-}
-
-int morva_decodePW(char** clear, const char* value, AesKeyData* keyData) noexcept {
-  if (clear == nullptr) return LDAPPW_OPERATIONS_ERROR;
-  *clear = nullptr;
-  if (value == nullptr) return LDAPPW_OPERATIONS_ERROR;
-  const size_t length = std::strlen(value);
-  char* result = nullptr;
-  int rc = LDAPPW_SUCCESS;
-  if ((check_format(value, static_cast<unsigned>(length)) & kReversibleBit) != 0) {
-    if (unformat_password(value, &result, keyData, nullptr) == 0) rc = LDAPPW_OTHER;
-  } else {
-    SecretText copy(value, length);  // the decoder writes to its text
-    if (copy) _morva_utils_decode_buffer(copy.get(), &result);
-  }
-  *clear = result;
-  return rc == LDAPPW_SUCCESS && result == nullptr ? LDAPPW_NO_MEMORY : rc;
+  if (anyNull(presented, stored) || presentedLength < 0 || storedLength < 0) return call.leave(kNotCompared);
+  const Text presentedText{presented, static_cast<size_t>(presentedLength)};
+  const Text storedText{stored, static_cast<size_t>(storedLength)};
+  const Scheme& storedScheme = schemeOf(storedText.data, storedText.length);
+  const Scheme& presentedScheme =
+      presentedIsClear != 0 ? kSchemes[kClearRow] : schemeOf(presentedText.data, presentedText.length);
+  return call.leave(compare({presentedText, presentedScheme, storedText, storedScheme, keyData}));
 }
 
 }  // extern "C"

@@ -4,8 +4,8 @@
 #pragma once
 
 #include "aes_keys.h"
-#include "base64.h"
 #include "owners.h"
+#include "utils_base64.h"
 
 namespace ldappw {
 
@@ -14,46 +14,33 @@ inline size_t lengthOf(const char* text) noexcept {
   return text == nullptr ? 0 : std::strlen(text);
 }
 
-// A new text in a caller's slot, or characters behind a tag that is written already, without a terminator.
-class TextTarget {
- public:
-  explicit TextTarget(char** slot) noexcept : slot_(slot) {}
-  explicit TextTarget(char* payload) noexcept : payload_(payload) {}
-  TextTarget(const TextTarget&) = delete;
-  TextTarget& operator=(const TextTarget&) = delete;
+// A new text in a caller's slot, or characters without a terminator behind a tag that is written already.
+struct TextTarget {
+  char** slot;
+  char* payload;
+  size_t length = 0;  // of the characters behind the tag
 
-  char** slot() const noexcept { return slot_; }
+  bool isNull() const noexcept { return slot == nullptr && payload == nullptr; }
+};
 
-  // From here on a failure leaves the caller's slot null.
-  void claim() noexcept {
-    if (payload_ == nullptr) guard_.arm();
-  }
+inline TextTarget toSlot(char** slot) noexcept {
+  return {slot, nullptr};
+}
+inline TextTarget behindTag(char* payload) noexcept {
+  return {nullptr, payload};
+}
 
-  // False when there is no memory for the text, or the alphabet is not whole.
-  bool write(const unsigned char* data, size_t bytes) noexcept {
-    return payload_ == nullptr ? writeSlot(data, bytes) : writePayload(data, bytes);
-  }
-
-  // The characters that were written behind the tag.
-  size_t length() const noexcept { return length_; }
-
- private:
-  bool writeSlot(const unsigned char* data, size_t bytes) noexcept {
+// Writes bytes as base64. False when there is no memory for the text, or the alphabet is not whole.
+inline bool writeBase64(TextTarget& target, const unsigned char* data, size_t bytes) noexcept {
+  if (target.slot != nullptr) {
     char* text = binaryBlobToBase64(data, static_cast<int>(bytes));
-    if (text != nullptr) guard_.keep(text);
+    if (text != nullptr) *target.slot = text;
     return text != nullptr;
   }
-  bool writePayload(const unsigned char* data, size_t bytes) noexcept {
-    if (!isWholeAlphabet(pBase64)) return false;
-    length_ = encodeBytes(data, bytes, pBase64, payload_);
-    return true;
-  }
-
-  char* payload_ = nullptr;
-  char** slot_ = &payload_;  // what the trace shows when there is no caller's slot
-  OutGuard<char> guard_{slot_, false};
-  size_t length_ = 0;
-};
+  if (!isWholeAlphabet(pBase64)) return false;
+  target.length = encodeBytes(data, bytes, pBase64, target.payload);
+  return true;
+}
 
 // saltedHashEncrypt, saltedHashVerify, unsaltedHashEncrypt and aesEncryptBuffer. Counted texts hold no NUL.
 int saltedHashTo(TextTarget& target, const char* clear, size_t clearBytes, const char* digestName) noexcept;

@@ -5,31 +5,68 @@
 #include <cstdio>
 
 namespace ldappw {
+namespace {
 
-void TracedCall::writeEntering(const void* const* pairs, size_t count) noexcept {
-  char list[512] = "";  // the longest list has six arguments of at most 40 characters
+constexpr size_t kLineSize = 2048;  // the longest line shows an attach path of 1023 characters
+
+// Formats here, where the compiler has checked the format, so that the facility gets no format from a variable.
+struct Line {
+  Line(const char* format, va_list values) noexcept { std::vsnprintf(text, sizeof text, format, values); }
+  char text[kLineSize];
+};
+
+}  // namespace
+
+int TracedCall::failShowing(int rc, const char* what, int shown) noexcept {
+  line(info_.failures, "Error - %s: %s rc = %d\n", info_.name, what, shown);
+  return leave(rc);
+}
+
+int TracedCall::failText(int rc, const char* format, ...) noexcept {
+  va_list values;
+  va_start(values, format);
+  write(info_.failures, format, values);
+  va_end(values);
+  return leave(rc);
+}
+
+void TracedCall::line(LineClass lineClass, const char* format, ...) noexcept {
+  va_list values;
+  va_start(values, format);
+  write(lineClass, format, values);
+  va_end(values);
+}
+
+void TracedCall::write(LineClass lineClass, const char* format, va_list values) noexcept {
+  if (!scope_.debugOn()) return;
+  ldtr_formater_local(&info_.scope, static_cast<int>(lineClass), "%s", Line(format, values).text);
+}
+
+void TracedCall::writeEntering(const void* const* arguments, size_t count) noexcept {
+  char list[512] = "";  // six arguments of at most 40 characters
   size_t used = 0;
   for (size_t i = 0; i < count && used < sizeof list; ++i) {
-    const char* name = static_cast<const char*>(pairs[2 * i]);
-    const int written =
-        std::snprintf(list + used, sizeof list - used, "%s %s = %p", i == 0 ? "" : ",", name, pairs[2 * i + 1]);
+    const int written = std::snprintf(list + used, sizeof list - used, "%s %s = %p", i == 0 ? "" : ",",
+                                      info_.arguments.names[i], arguments[i]);
     used += static_cast<size_t>(written);
   }
-  const char* function = info_.enteringAs != nullptr ? info_.enteringAs : info_.name;
-  ldtr_formater_local(&info_.scope, LDTR_DEBUG, "%s: Entering.%s\n", function, list);
+  line(LineClass::debug, "%s: Entering.%s\n", info_.enteringAs != nullptr ? info_.enteringAs : info_.name, list);
 }
 
 void TracedCall::writeLeaving() noexcept {
   if (info_.leavingLine != nullptr) {
     ldtr_formater_local(&info_.scope, LDTR_DEBUG, info_.leavingLine, scope_.rc());
   } else {
-    ldtr_formater_local(&info_.scope, LDTR_DEBUG, "%s: Leaving. rc = %d\n", info_.name, scope_.rc());
+    line(LineClass::debug, "%s: Leaving. rc = %d\n", info_.name, scope_.rc());
   }
 }
 
-void TracedCall::writeFailure(const char* what, int shown) noexcept {
-  ldtr_formater_local(&info_.scope, static_cast<int>(info_.failures), "Error - %s: %s rc = %d\n", info_.name, what,
-                      shown);
+void globalLine(LineClass lineClass, const char* format, ...) noexcept {
+  if ((ldtr_events() & static_cast<unsigned>(LDTR_EVENT_DEBUG)) == 0) return;
+  va_list values;
+  va_start(values, format);
+  ldtr_formater_global(static_cast<int>(lineClass), "%s", Line(format, values).text);
+  va_end(values);
 }
 
 }  // namespace ldappw

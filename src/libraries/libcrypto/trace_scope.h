@@ -1,8 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 // One traced call: the scope record, the usual lines about entering, failing and leaving, and the result code, so that
-// a failing step is one return. Lines that depart from the usual shape are given whole through failText.
+// a failing step is one return. Log readers match these lines as they are; a text that departs from the usual shape
+// stands whole where it is used.
 #pragma once
 
+#include <cstdarg>
 #include <cstddef>
 
 #include "encoding_utils.h"
@@ -15,10 +17,17 @@ enum class LineClass : int { debug = LDTR_DEBUG, error = LDTR_ERROR };
 // Whether a function writes "<name>: Entering. ..." and "<name>: Leaving. rc = ..." lines.
 enum class Lines { none, leavingOnly, usual };
 
+// The names of the pointer arguments that the entering line shows, in the order in which a TracedCall takes them.
+struct ArgumentNames {
+  static constexpr size_t kMost = 6;
+  const char* names[kMost];
+};
+
 struct TraceInfo {
   const char* name;
   ldtr_scope scope;
   LineClass failures;  // the class of the module's failure lines
+  ArgumentNames arguments{};
   Lines lines = Lines::usual;
   const char* enteringAs = nullptr;   // another name in the entering line
   const char* leavingLine = nullptr;  // another leaving line, with one %d
@@ -29,21 +38,7 @@ constexpr unsigned kOperationMask = 0x10000;
 constexpr unsigned kSmallLevel = 33;  // getters, setters and password verification
 constexpr unsigned kSmallMask = 0x1000;
 
-constexpr ldtr_scope operationScope(unsigned id) {
-  return {id, kOperationLevel, kOperationMask};
-}
-constexpr ldtr_scope smallScope(unsigned id) {
-  return {id, kSmallLevel, kSmallMask};
-}
-
-// Identifiers: 0x0409NN00 of the password module, 0x50MMNN00 of the others; NN counts a module's functions from 1.
-constexpr unsigned passwordId(unsigned function) {
-  return 0x04090000U | (function << 8U);
-}
-constexpr unsigned moduleId(unsigned module, unsigned function) {
-  return 0x50000000U | (module << 16U) | (function << 8U);
-}
-
+// The modules by the numbers in their identifiers.
 enum Module : unsigned {
   kQelUtils = 1,
   kAesUtils,
@@ -56,16 +51,41 @@ enum Module : unsigned {
   kUnsaltedHash
 };
 
+// Identifiers are 0x0409NN00 in the password module and 0x50MMNN00 in the others; NN counts a module's functions
+// from 1.
+constexpr unsigned passwordId(unsigned function) {
+  return 0x04090000U | (function << 8U);
+}
+constexpr unsigned moduleId(Module module, unsigned function) {
+  return 0x50000000U | (module << 16U) | (function << 8U);
+}
+
+// Loading and keys report failures as errors, the operations on passwords as debug lines.
+constexpr LineClass failuresOf(Module module) {
+  return module < kAesCrypto ? LineClass::error : LineClass::debug;
+}
+
+constexpr TraceInfo operation(Module module, unsigned function, const char* name, ArgumentNames arguments = {}) {
+  return {name, {moduleId(module, function), kOperationLevel, kOperationMask}, failuresOf(module), arguments};
+}
+constexpr TraceInfo accessor(Module module, unsigned function, const char* name, ArgumentNames arguments = {}) {
+  return {name, {moduleId(module, function), kSmallLevel, kSmallMask}, failuresOf(module), arguments};
+}
+
+template <class... Pointers>
+constexpr bool anyNull(Pointers... pointers) {
+  return ((pointers == nullptr) || ...);
+}
+
 class TracedCall {
  public:
-  // After the function come the pointer arguments to show, each as its name and its value. They are put together only
-  // when there is a line to write.
-  template <class... NamesAndValues>
-  explicit TracedCall(const TraceInfo& info, NamesAndValues... pairs) noexcept : info_(info), scope_(info.scope) {
-    static_assert(sizeof...(pairs) % 2 == 0, "names and values");
+  // The pointers are those that the entering line shows; they are put together only when there is a line to write.
+  template <class... Pointers>
+  explicit TracedCall(const TraceInfo& info, Pointers... arguments) noexcept : info_(info), scope_(info.scope) {
+    static_assert(sizeof...(arguments) <= ArgumentNames::kMost);
     if (__builtin_expect(scope_.debugOn(), 0) && info_.lines == Lines::usual) {
-      const void* const list[] = {static_cast<const void*>(pairs)..., nullptr};
-      writeEntering(list, sizeof...(pairs) / 2);
+      const void* const list[] = {static_cast<const void*>(arguments)..., nullptr};
+      writeEntering(list, sizeof...(arguments));
     }
   }
   ~TracedCall() {
@@ -84,40 +104,25 @@ class TracedCall {
   [[gnu::cold]] int fail(int rc, const char* what) noexcept { return failShowing(rc, what, rc); }
 
   // The same with another value shown than the one returned.
-  [[gnu::cold]] int failShowing(int rc, const char* what, int shown) noexcept {
-    if (__builtin_expect(scope_.debugOn(), 0)) writeFailure(what, shown);
-    return leave(rc);
-  }
+  [[gnu::cold]] int failShowing(int rc, const char* what, int shown) noexcept;
 
-  // A line that departs from the usual shape, whole.
-  template <class... Values>
-  [[gnu::cold]] int failText(int rc, const char* format, Values... values) noexcept {
-    line(info_.failures, format, values...);
-    return leave(rc);
-  }
+  [[gnu::cold]] int invalid() noexcept { return fail(LDAPPW_OPERATIONS_ERROR, "Invalid parameter."); }
 
-  template <class... Values>
-  void line(LineClass lineClass, const char* format, Values... values) noexcept {
-    if (__builtin_expect(scope_.debugOn(), 0)) {
-      ldtr_formater_local(&info_.scope, static_cast<int>(lineClass), format, values...);
-    }
-  }
+  // A failure line that departs from the usual shape, whole.
+  [[gnu::cold, gnu::format(printf, 3, 4)]] int failText(int rc, const char* format, ...) noexcept;
+
+  [[gnu::cold, gnu::format(printf, 3, 4)]] void line(LineClass lineClass, const char* format, ...) noexcept;
 
  private:
-  [[gnu::cold]] void writeEntering(const void* const* pairs, size_t count) noexcept;
+  [[gnu::cold]] void write(LineClass lineClass, const char* format, va_list values) noexcept;
+  [[gnu::cold]] void writeEntering(const void* const* arguments, size_t count) noexcept;
   [[gnu::cold]] void writeLeaving() noexcept;
-  [[gnu::cold]] void writeFailure(const char* what, int shown) noexcept;
 
   const TraceInfo& info_;
   ldtr_function_local scope_;
 };
 
-// A line of the debug class from a function that has no scope.
-template <class... Values>
-void globalLine(LineClass lineClass, const char* format, Values... values) noexcept {
-  if ((ldtr_events() & static_cast<unsigned>(LDTR_EVENT_DEBUG)) != 0) {
-    ldtr_formater_global(static_cast<int>(lineClass), format, values...);
-  }
-}
+// A line from a function that has no scope.
+[[gnu::cold, gnu::format(printf, 2, 3)]] void globalLine(LineClass lineClass, const char* format, ...) noexcept;
 
 }  // namespace ldappw

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// Plain digests through the crypto provider: the payload of {MD5} values. Its lines differ from the usual shape, and
-// any provider value but 0 is a success here: both are meant.
+// Plain digests through the crypto provider: the payload of {MD5} values. Log readers match the lines as they are,
+// which lack the code, the newline or a blank here and there, and there is none about entering. Any value of the
+// provider but 0 is a success. SchemesTest.UnsaltedFailures pins both.
 #include <cstring>
 
 #include "password_schemes.h"
@@ -12,8 +13,9 @@ namespace ldappw {
 namespace {
 
 constexpr TraceInfo kEncrypt{"unsaltedHashEncrypt",
-                             operationScope(moduleId(kUnsaltedHash, 1)),
+                             {moduleId(kUnsaltedHash, 1), kOperationLevel, kOperationMask},
                              LineClass::debug,
+                             {},
                              Lines::leavingOnly,
                              nullptr,
                              "unsaltedHashEncrypt: Leaving. rc=%d\n"};
@@ -24,33 +26,33 @@ constexpr size_t kUsualDigest = 64;  // what needs no allocation
 
 int unsaltedHashTo(TextTarget& target, const char* digestName, const char* clear, size_t clearBytes) noexcept {
   TracedCall call{kEncrypt};
-  if (clear == nullptr || target.slot() == nullptr) return call.leave(LDAPPW_OPERATIONS_ERROR);
+  if (clear == nullptr || target.isNull() || clearBytes > UINT32_MAX) return call.leave(LDAPPW_OPERATIONS_ERROR);
   void* qelCtx = nullptr;
   if (const int rc = initQelCrypto(&qelCtx); rc != 0) return call.leave(rc);
-  DigestContext digest(qelCtx);
-  if (const int rc = digest.init(digestName); rc != 0) {
+  DigestOwner digest(qelCtx);
+  if (const int rc = digest.open(digestName); rc != 0) {
     return call.failText(rc, "Error - unsaltedHashEncrypt: initQelDigest() failed");
   }
-  if (pQEL_EVP_DigestInit(qelCtx, digest.get(), digest.algorithm()) == 0) {
+  if (digest.init() == 0) {
     return call.failText(LDAPPW_OPERATIONS_ERROR, "Error - unsaltedHashEncrypt: QEL_EVP_DigestInit() failed");
   }
-  target.claim();
-  const int size = pQEL_EVP_MD_size(qelCtx, digest.algorithm());
-  const size_t bytes = size < 0 ? 0 : static_cast<size_t>(size);
+  OutGuard<char> result(target.slot);
+  const int size = digest.size();
+  const size_t bytes = size > 0 ? static_cast<size_t>(size) : 0;
   SecretBytes<kUsualDigest> raw(bytes);
-  if (size < 0 || !raw) return call.failText(LDAPPW_NO_MEMORY, "Error - unsaltedHashEncrypt : calloc() failed\n");
-  std::memset(raw.get(), 0, bytes);
-  if (pQEL_EVP_DigestUpdate(qelCtx, digest.get(), clear, static_cast<unsigned>(clearBytes)) == 0) {
+  if (bytes == 0 || !raw) return call.failText(LDAPPW_NO_MEMORY, "Error - unsaltedHashEncrypt : calloc() failed\n");
+  if (digest.update(clear, static_cast<uint32_t>(clearBytes)) == 0) {
     return call.failText(LDAPPW_OPERATIONS_ERROR, "Error - unsaltedHashEncrypt: QEL_EVP_DigestUpdate() failed");
   }
-  if (pQEL_EVP_DigestFinal(qelCtx, digest.get(), raw.get(), nullptr) == 0) {
+  if (digest.final(raw.get(), nullptr) == 0) {
     return call.failText(LDAPPW_OPERATIONS_ERROR, "Error - unsaltedHashEncrypt: QEL_EVP_DigestFinal() failed");
   }
-  if (!target.write(raw.get(), bytes)) {
+  if (!writeBase64(target, raw.get(), bytes)) {
     return call.failText(LDAPPW_OPERATIONS_ERROR,
                          "Error - unsaltedHashEncrypt: binaryBlobToBase64()returned NULL. rc = %d\n",
                          static_cast<int>(LDAPPW_OPERATIONS_ERROR));
   }
+  result.keep();
   return call.leave(LDAPPW_SUCCESS);
 }
 
@@ -63,7 +65,7 @@ extern "C" {
 // Documented in password_schemes.h.
 
 int unsaltedHashEncrypt(const char* digestName, const char* clear, char** out) noexcept {
-  TextTarget target(out);
+  TextTarget target = toSlot(out);
   return unsaltedHashTo(target, digestName, clear, lengthOf(clear));
 }
 

@@ -1,11 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 // Base64 (RFC 4648, section 4) over the standard or any other alphabet of 64 characters, and the compaction of texts to
 // an alphabet.
+#include "utils_base64.h"
+
 #include <climits>
 #include <cstdio>
 #include <cstring>
 
-#include "base64.h"
+#include "cancellation.h"
 #include "encoding_utils.h"
 #include "owners.h"
 
@@ -98,9 +100,11 @@ unsigned decodeGroup(const char* in, unsigned char* out, const PlaceTable& table
     }
   }
   const unsigned bytes = kBytesByFirstPad[firstPad];
+  const unsigned second = (index[1] & 15U) << 4U | ((index[2] >> 2U) & 15U);
+  const unsigned third = (index[2] & 3U) << 6U | index[3];
   out[0] = static_cast<unsigned char>(index[0] << 2U | ((index[1] >> 4U) & 3U));
-  if (bytes >= 2) out[1] = static_cast<unsigned char>((index[1] & 15U) << 4U | ((index[2] >> 2U) & 15U));
-  if (bytes == 3) out[2] = static_cast<unsigned char>((index[2] & 3U) << 6U | index[3]);
+  out[1] = static_cast<unsigned char>(bytes >= 2 ? second : 0);  // a group that gives less leaves a gap of zeros
+  out[2] = static_cast<unsigned char>(bytes == 3 ? third : 0);
   return bytes;
 }
 
@@ -221,8 +225,11 @@ const char* pBase64Find = kStandardWithPad;
 char* binaryBlobToString(const unsigned char* data, int length, const char* alphabet) noexcept {
   if (alphabet == nullptr || (data == nullptr && length > 0) || !isWholeAlphabet(alphabet)) return nullptr;
   const size_t bytes = length > 0 ? static_cast<size_t>(length) : 0;
-  char* text = static_cast<char*>(std::malloc(encodedRoom(bytes)));
-  if (text != nullptr) text[encodeBytes(data, bytes, alphabet, text)] = '\0';
+  const size_t room = encodedRoom(bytes);
+  char* text = static_cast<char*>(std::malloc(room));
+  if (text == nullptr) return nullptr;
+  const size_t written = encodeBytes(data, bytes, alphabet, text);
+  std::memset(text + written, 0, room - written);
   return text;
 }
 
@@ -246,6 +253,7 @@ unsigned char* base64ToBinaryBlob(const char* text, unsigned int* outLength) noe
 
 char* compactToOnlyString(const char* text, const char* alphabet) noexcept {
   if (text == nullptr || alphabet == nullptr) return nullptr;
+  const NoCancellation uncancelled;
   const char* from = std::strpbrk(text, alphabet);
   if (from == nullptr) {
     std::printf("No base64 characters found in input buf %s\n", text);

@@ -1,12 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
 // The wrappers over the dynamic loader, and two helpers of the server's start-up: the library path and the repair of
 // cipher specifications. Failures go to the debug printer alone.
+#include "utils_loader.h"
+
 #include <dlfcn.h>
 
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 
+#include "cancellation.h"
 #include "dsutil.h"
 #include "encoding_utils.h"
 #include "owners.h"
@@ -22,14 +25,14 @@ constexpr char kVariable[] = "LD_LIBRARY_PATH";
 constexpr char kSystemFolder[] = "/usr/lib";
 
 char libraryPath[kPathSize];  // handed to putenv, so it lives as long as the process
+void** closedCell = nullptr;
 
-template <class... Values>
-void debugLine(unsigned debugClass, const char* format, Values... values) noexcept {
-  if (read_ldap_debug() != 0) PrintDebug(debugClass, format, values...);
+bool isDebugging() noexcept {
+  return read_ldap_debug() != 0;
 }
 
 void reportOverflow(size_t tried, size_t size, int line) noexcept {
-  if (tried >= size) debugLine(kTextClass, "kubstr error near %s:%d\n", __FILE__, line);
+  if (tried >= size && isDebugging()) PrintDebug(kTextClass, "kubstr error near %s:%d\n", __FILE__, line);
 }
 
 bool holdsElement(char* path, const char* element) noexcept {
@@ -41,6 +44,15 @@ bool holdsElement(char* path, const char* element) noexcept {
 }
 
 }  // namespace
+
+void rememberClosed(void** cell) noexcept {
+  __atomic_store_n(&closedCell, cell, __ATOMIC_RELAXED);
+}
+
+bool isClosed(void** cell) noexcept {
+  return cell != nullptr && cell == __atomic_load_n(&closedCell, __ATOMIC_RELAXED);
+}
+
 }  // namespace ldappw
 
 using namespace ldappw;
@@ -53,18 +65,21 @@ int defFlags = RTLD_NOW | RTLD_GLOBAL;
 
 void** ldapLoadLib(const char* fileName, int flags) noexcept {
   if (fileName == nullptr) return nullptr;  // the loader would open the program itself
+  const NoCancellation uncancelled;
   PlainOwner<void*> cell(static_cast<void**>(std::malloc(sizeof(void*))));
   if (!cell) return nullptr;
   *cell = dlopen(fileName, flags == 0 ? defFlags : flags);
-  if (*cell == nullptr) {
-    debugLine(kLoaderClass, "dlopen failed for %s: %s\n", fileName, dlerror());
+  if (*cell == nullptr) {  // the loader's text is asked for once: without debugging it stays for the caller
+    if (isDebugging()) PrintDebug(kLoaderClass, "dlopen failed for %s: %s\n", fileName, dlerror());
     return nullptr;
   }
+  if (isClosed(cell.get())) rememberClosed(nullptr);
   return cell.release();
 }
 
 int ldapUnloadLib(void** handle) noexcept {
   if (handle == nullptr) return LDAPPW_OTHER;
+  const NoCancellation uncancelled;
   if (*handle != nullptr) dlclose(*handle);
   *handle = nullptr;
   std::free(handle);
@@ -74,13 +89,14 @@ int ldapUnloadLib(void** handle) noexcept {
 void* ldapGetSymAddress(void** handle, const char* symbol) noexcept {
   if (handle == nullptr || symbol == nullptr) return nullptr;
   void* address = dlsym(*handle, symbol);
-  if (address == nullptr) debugLine(kLoaderClass, "dlsym failed: %s\n", dlerror());
+  if (address == nullptr && isDebugging()) PrintDebug(kLoaderClass, "dlsym failed: %s\n", dlerror());
   return address;
 }
 
 int setDefLibpath(void) noexcept {
   // Read before the buffer is touched: after an earlier call the environment's value lies in it.
   const PlainOwner<char> value(ldap_getenv(kVariable));
+  if (!value && ldap_chkenv(kVariable) != 0) return LDAPPW_NO_MEMORY;  // set, but there is no copy: the path stays
   if (value) {
     char elements[kPathSize] = "";
     kub_strlcat(elements, value.get(), sizeof elements);
@@ -91,12 +107,12 @@ int setDefLibpath(void) noexcept {
   reportOverflow(first, sizeof libraryPath, __LINE__);
   if (value) {
     kub_strlcat(libraryPath, value.get(), sizeof libraryPath);
-    reportOverflow(first, sizeof libraryPath, __LINE__);  // meant: the first append is looked at, not this one
+    reportOverflow(first, sizeof libraryPath, __LINE__);  // of the first append: a cut here is not reported
     reportOverflow(kub_strlcat(libraryPath, ":", sizeof libraryPath), sizeof libraryPath, __LINE__);
     reportOverflow(kub_strlcat(libraryPath, kSystemFolder, sizeof libraryPath), sizeof libraryPath, __LINE__);
   } else {
     kub_strlcat(libraryPath, kSystemFolder, sizeof libraryPath);
-    reportOverflow(first, sizeof libraryPath, __LINE__);  // meant, as above
+    reportOverflow(first, sizeof libraryPath, __LINE__);
   }
   return putenv(libraryPath);
 }

@@ -5,12 +5,13 @@
 #include <cstring>
 #include <ctime>
 
+#include "crypto_simple.h"
 #include "encoding_utils.h"
-#include "masking_bits.h"
-#include "masking_cipher.h"
-#include "masking_tables.h"
 #include "owners.h"
-#include "simple_crypt.h"
+#include "utils_base64.h"
+#include "utils_masked_bits.h"
+#include "utils_masked_cipher.h"
+#include "utils_masked_tables.h"
 
 namespace ldappw::masking {
 namespace {
@@ -40,10 +41,11 @@ static_assert(kPacketBytes - kBlockAt == kCipherBlock);
 constexpr size_t kDataBefore = 47;
 constexpr size_t kPacketInRecord = kPacketBytes - kLengthAt;
 constexpr size_t kFixedRecord = kDataBefore + kPacketInRecord;
+constexpr size_t kUsualRecord = 256;  // passwords need no allocation for theirs
 
 constexpr unsigned kLengthCursor = 4;  // where the scattering of the length enters the pattern tables
 
-size_t findBinaryDataBufferSize(size_t n) noexcept {
+uint64_t findBinaryDataBufferSize(uint64_t n) noexcept {
   return 2 * n < 97 ? 96 : 96 + (2 * n - 96 + 31) / 32 * 32;
 }
 
@@ -116,8 +118,8 @@ int encode(const unsigned char* data, size_t length, char** out) noexcept {
   SecretArray<kPacketBytes> packet;
   packet.data()[0] = '1';
   packet.data()[kIdentifierAt] = static_cast<unsigned char>(encoding.identifier[0]);
-  const size_t size = findBinaryDataBufferSize(length);
-  const SecretOwner<unsigned char> record(static_cast<unsigned char*>(std::malloc(size + kPacketInRecord)));
+  const auto size = static_cast<size_t>(findBinaryDataBufferSize(length));
+  SecretBytes<kUsualRecord> record(size + kPacketInRecord);
   if (!record) return LDAPPW_NO_MEMORY;
   unsigned char* area = record.get() + kPacketInRecord;
   mask(data, length, selector, packet.data(), area, size);
@@ -173,16 +175,20 @@ const char* alphabetOf(char identifier) noexcept {
 int decodeMasked(const char* text, Decoded& out) noexcept {
   const char* alphabet = *text == '\0' ? nullptr : alphabetOf(*text);
   if (alphabet == nullptr) return LDAPPW_SUCCESS;
-  unsigned bytes = 0;
-  const SecretOwner<unsigned char> record(stringToBinaryBlob(text + 1, &bytes, alphabet));
-  return record ? unmask(record.get(), bytes, out) : LDAPPW_NO_MEMORY;
+  const size_t characters = std::strlen(text + 1);
+  SecretBytes<kUsualRecord> record(decodedRoom(characters));
+  if (!record) return LDAPPW_NO_MEMORY;
+  return unmask(record.get(), decodeText(text + 1, characters, alphabet, record.get()).bytes, out);
 }
 
+// The form ">" + any other character + base64 + "<". Padding inside leaves bytes behind the stated end: they go.
 int _noencode_decode_binary(const char* text, Decoded& out) noexcept {
   unsigned bytes = 0;
   out.data = base64ToBinaryBlob(text, &bytes);
+  if (out.data == nullptr) return LDAPPW_NO_MEMORY;
+  out.data[bytes] = '\0';
   out.length = bytes;
-  return out.data != nullptr ? LDAPPW_SUCCESS : LDAPPW_NO_MEMORY;
+  return LDAPPW_SUCCESS;
 }
 
 // The older form ">0" + base64 of simpleCrypt output + "<".
@@ -205,15 +211,16 @@ int decode(char* text, Decoded& out) noexcept {
   const size_t length = std::strlen(text);
   if (length < 2 || text[0] != '>' || text[length - 1] != '<') return copied(text, length, out);
   const char form = text[1];
-  text[length - 1] = '\0';  // meant: the caller's text loses its last character
+  text[length - 1] = '\0';  // in the caller's text, which callers know to have lost its "<" (MaskingTest.Forms)
   const char* payload = length > 2 ? text + 2 : text + 1;
   if (form == '1') return decodeMasked(payload, out);
   return form == '0' ? decodeSimple(payload, out) : _noencode_decode_binary(payload, out);
 }
 
+// Bytes behind a first NUL are not wiped: only the caller knows of them.
 void release(char** result) noexcept {
   if (result == nullptr) return;
-  wipeAndFree(*result);
+  wipeAndFreeText(*result);
   *result = nullptr;
 }
 
@@ -258,7 +265,7 @@ int _morva_utils_decode_binary(char* text, unsigned char** out, int* outLength) 
   const int rc = masking::decode(text, decoded);
   if (rc != LDAPPW_SUCCESS) return rc;
   if (decoded.length > INT_MAX) {
-    wipeAndFree(decoded.data);
+    wipeAndFree(decoded.data, decoded.length);
     return LDAPPW_OTHER;
   }
   *out = decoded.data;
@@ -280,9 +287,10 @@ void _morva_utils_decode_binary_free(char** result) noexcept {
 }
 
 int _morva_utils_getEncodedSize(int length) noexcept {
-  if (length < 0 || length > masking::kLargestLength) return 0;
-  const size_t bytes = masking::findBinaryDataBufferSize(static_cast<size_t>(length)) + masking::kPacketInRecord;
-  return static_cast<int>((bytes + 2) / 3 * 4 + 5);
+  const uint64_t data = length > 0 ? static_cast<uint64_t>(length) : 0;
+  const uint64_t bytes = masking::findBinaryDataBufferSize(data) + masking::kPacketInRecord;
+  const uint64_t size = (bytes + 2) / 3 * 4 + 5;
+  return size <= INT_MAX ? static_cast<int>(size) : 0;
 }
 
 }  // extern "C"

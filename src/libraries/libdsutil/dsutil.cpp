@@ -5,12 +5,15 @@
 #include <dlfcn.h>
 #include <link.h>
 
+#include <unistd.h>
+
 #include <atomic>
-#include <climits>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+
+#include "guards.h"
 
 namespace {
 
@@ -21,12 +24,32 @@ int levelFromEnvironment() {
 
 std::atomic<int> debugLevel{levelFromEnvironment()};
 
+// The name under which the loader knows this library, or null where it is part of the program.
+const char* nameOfThisLibrary() {
+  Dl_info info;
+  void* self = nullptr;
+  if (dladdr1(static_cast<const void*>(&debugLevel), &info, &self, RTLD_DL_LINKMAP) == 0 || self == nullptr) {
+    return nullptr;
+  }
+  const char* name = static_cast<const link_map*>(self)->l_name;
+  return *name == '\0' ? nullptr : name;
+}
+
+// The working directory when this library was loaded, which a relative name starts from; the process may leave it.
+dsutil::Text folderAtLoad;
+
+__attribute__((constructor)) void rememberFolder() {
+  const char* name = nameOfThisLibrary();
+  if (name != nullptr && *name != '/') folderAtLoad.reset(getcwd(nullptr, 0));
+}
+
 }  // namespace
 
 extern "C" {
 
 void PrintDebug(unsigned debugClass, const char* format, ...) {
   if (debugLevel.load(std::memory_order_relaxed) == 0) return;
+  const dsutil::NoCancellation uncancelled;
   va_list values;
   va_start(values, format);
   flockfile(stderr);  // the class and the text stay together when threads print at once
@@ -58,12 +81,22 @@ int putEnvVar(const char* name, const char* value) {
   return name == nullptr || value == nullptr ? -1 : setenv(name, value, 1);
 }
 
+// Not the loader's own account of the directory: that comes without a bound on its length, or not at all.
 char* getKUBInstallLibPath(void) {
-  Dl_info info;
-  void* self = nullptr;
-  if (dladdr1(reinterpret_cast<void*>(&getKUBInstallLibPath), &info, &self, RTLD_DL_LINKMAP) == 0) return nullptr;
-  char origin[PATH_MAX + 1];  // the loader's own bound on the path of an object
-  return dlinfo(self, RTLD_DI_ORIGIN, origin) == 0 ? strdup(origin) : nullptr;
+  const char* name = nameOfThisLibrary();
+  if (name == nullptr) return nullptr;
+  const bool isRelative = *name != '/';
+  if (isRelative && !folderAtLoad) return nullptr;
+  const char* start = isRelative ? folderAtLoad.get() : "";
+  const char* slash = std::strrchr(name, '/');
+  const size_t folderBytes = slash == nullptr ? 0 : static_cast<size_t>(slash - name);
+  const size_t size = std::strlen(start) + 1 + folderBytes + 1;
+  char* path = static_cast<char*>(std::malloc(size));
+  if (path == nullptr) return nullptr;
+  std::snprintf(path, size, "%s%s%.*s", start, isRelative && folderBytes != 0 ? "/" : "", static_cast<int>(folderBytes),
+                name);
+  if (*path == '\0') std::memcpy(path, "/", 2);
+  return path;
 }
 
 size_t kub_strlcat(char* destination, const char* source, size_t size) {

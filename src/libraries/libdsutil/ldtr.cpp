@@ -2,11 +2,13 @@
 // The trace facility: the event mask, the sink and the formatting of lines.
 #include "ldtr.h"
 
+#include <pthread.h>
+
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
-#include <memory>
-#include <mutex>
+
+#include "guards.h"
 
 namespace {
 
@@ -17,12 +19,28 @@ struct SinkSlot {
   void* user = nullptr;
 };
 
-std::mutex sinkMutex;
+pthread_mutex_t sinkMutex = PTHREAD_MUTEX_INITIALIZER;
 SinkSlot installedSink;  // guarded by sinkMutex; copied out, so that a sink may itself trace or change the sink
 
+class SinkLock {
+ public:
+  SinkLock() noexcept { pthread_mutex_lock(&sinkMutex); }
+  ~SinkLock() { pthread_mutex_unlock(&sinkMutex); }
+  SinkLock(const SinkLock&) = delete;
+  SinkLock& operator=(const SinkLock&) = delete;
+};
+
 SinkSlot currentSink() {
-  const std::lock_guard<std::mutex> lock(sinkMutex);
+  const SinkLock lock;
   return installedSink;
+}
+
+// A fork takes the lock, so that the child, which has none of the other threads, finds it free.
+void lockSink() {
+  pthread_mutex_lock(&sinkMutex);
+}
+void unlockSink() {
+  pthread_mutex_unlock(&sinkMutex);
 }
 
 void writeToStandardError(const ldtr_record& record) {
@@ -38,16 +56,12 @@ void writeToStandardError(const ldtr_record& record) {
   }
 }
 
-struct FreeDeleter {
-  void operator()(char* text) const noexcept { std::free(text); }
-};
-
 void writeLine(const ldtr_scope& scope, int severity, const char* format, va_list values) {
   char shortLine[512];
   va_list again;
   va_copy(again, values);
   const int length = std::vsnprintf(shortLine, sizeof shortLine, format, values);
-  std::unique_ptr<char, FreeDeleter> longLine;
+  dsutil::Text longLine;
   if (length >= static_cast<int>(sizeof shortLine)) {
     const size_t size = static_cast<size_t>(length) + 1;
     longLine.reset(static_cast<char*>(std::malloc(size)));
@@ -59,9 +73,10 @@ void writeLine(const ldtr_scope& scope, int severity, const char* format, va_lis
   ldtr_write(&record);
 }
 
-__attribute__((constructor)) void readEventsFromEnvironment() {
+__attribute__((constructor)) void start() {
   if (const char* text = secure_getenv("LDTR_EVENTS"))
     trcEvents = static_cast<unsigned>(std::strtoul(text, nullptr, 0));
+  pthread_atfork(lockSink, unlockSink, unlockSink);
 }
 
 }  // namespace
@@ -71,11 +86,12 @@ extern "C" {
 unsigned int trcEvents = 0;
 
 void ldtr_set_sink(void (*sink)(const struct ldtr_record*, void* user), void* user) {
-  const std::lock_guard<std::mutex> lock(sinkMutex);
+  const SinkLock lock;
   installedSink = {sink, user};
 }
 
 void ldtr_write(const struct ldtr_record* record) {
+  const dsutil::NoCancellation uncancelled;
   const SinkSlot slot = currentSink();
   if (slot.sink != nullptr) {
     slot.sink(record, slot.user);

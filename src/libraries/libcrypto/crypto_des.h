@@ -6,9 +6,16 @@
 #include <cstdint>
 
 #include "bits.h"
-#include "des_tables.h"
+#include "crypto_des_tables.h"
+#include "wipe.h"
 
 namespace ldappw {
+
+// A key schedule, wiped when it goes.
+struct DesSchedule {
+  uint32_t words[32];
+  ~DesSchedule() { wipe(words, sizeof words); }
+};
 
 struct Halves {
   uint32_t left;

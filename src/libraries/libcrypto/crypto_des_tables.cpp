@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // The tables of DES. The published ones stand as in FIPS 46-3; the others are computed from them by the compiler.
-#include "des_tables.h"
+#include "crypto_des_tables.h"
 
 namespace ldappw {
 

@@ -1,15 +1,16 @@
 // SPDX-License-Identifier: Apache-2.0
 // The ciphers under the masked encoding: DES with a key put together from the key table, and simpleCrypt.
-#include "masking_cipher.h"
+#include "utils_masked_cipher.h"
 
 #include <cstdlib>
 #include <cstring>
 #include <ctime>
 
+#include "crypto_des.h"
+#include "crypto_simple.h"
 #include "encoding_utils.h"
-#include "masking_bits.h"
-#include "masking_tables.h"
-#include "simple_crypt.h"
+#include "utils_masked_bits.h"
+#include "utils_masked_tables.h"
 #include "wipe.h"
 
 namespace ldappw::masking {
@@ -17,11 +18,6 @@ namespace {
 
 constexpr int kReachableKeys = 77;
 constexpr unsigned char kSimpleCryptIndexMask = 0xe7;
-
-struct KeySchedule {
-  uint32_t words[32];
-  ~KeySchedule() { wipe(words, sizeof words); }
-};
 
 unsigned timeSeed() noexcept {
   return static_cast<unsigned>(std::time(nullptr));
@@ -49,7 +45,7 @@ using ScheduleBuilder = void (*)(uint32_t*, const unsigned char*, int);
 void applyDes(unsigned char* data, size_t n, unsigned char keyIndex, ScheduleBuilder build, int decrypt) noexcept {
   unsigned char key[kCipherBlock];
   makeKey(keyIndex, key);
-  KeySchedule schedule;
+  DesSchedule schedule;
   build(schedule.words, key, decrypt);
   wipe(key, sizeof key);
   for (size_t i = 0; i < n; i += kCipherBlock) des(schedule.words, data + i);

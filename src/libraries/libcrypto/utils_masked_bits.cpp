@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 // The bit work of the masked encoding, and what must hold of its tables.
-#include "masking_bits.h"
+#include "utils_masked_bits.h"
 
-#include "masking_tables.h"
+#include "utils_masked_tables.h"
 
 namespace ldappw::masking {
 namespace {

@@ -1,0 +1,62 @@
+// SPDX-License-Identifier: Apache-2.0
+// Finding rows, the lengths of values, and the comparison of tags.
+#include "rdbm_pwd_schemes.h"
+
+#include <climits>
+#include <cstdint>
+#include <cstring>
+
+namespace ldappw {
+
+namespace {
+
+constexpr int kCipherBlock = 16;
+
+int paddedLength(int clearLength, size_t tagBytes) noexcept {
+  const int64_t padded = (int64_t{clearLength} + kCipherBlock) / kCipherBlock * kCipherBlock;
+  const int64_t length = (padded + 2) / 3 * 4 + static_cast<int64_t>(tagBytes);
+  return length > INT_MAX ? -1 : static_cast<int>(length);
+}
+
+constexpr int folded(char c) {
+  return c >= 'A' && c <= 'Z' ? c - 'A' + 'a' : static_cast<unsigned char>(c);
+}
+
+uint32_t wordAt(const char* text) noexcept {
+  uint32_t word = 0;
+  std::memcpy(&word, text, sizeof word);
+  return word;
+}
+
+}  // namespace
+
+const Scheme* findScheme(int code) noexcept {
+  for (const Scheme& scheme : kSchemes) {
+    if (scheme.code == code) return &scheme;
+  }
+  return nullptr;
+}
+
+int valueLength(const Scheme& scheme, int clearLength) noexcept {
+  if (scheme.fixedLength == kAsClear) return clearLength;
+  if (scheme.fixedLength == kPadded) return paddedLength(clearLength, scheme.tagBytes);
+  return scheme.fixedLength == kNeverMade ? -1 : scheme.fixedLength;
+}
+
+int compareTag(const char* left, const char* right, size_t bytes) noexcept {
+  for (size_t i = 0; i < bytes; ++i) {
+    if (const int difference = folded(left[i]) - folded(right[i]); difference != 0) return difference;
+  }
+  return 0;
+}
+
+bool hasTag(const char* value, const Scheme& scheme) noexcept {
+  // Tags have 5 to 8 bytes, which two words that overlap cover. The cases of a letter differ in one bit.
+  const size_t last = scheme.tagBytes - sizeof(uint32_t);
+  const uint32_t differences =
+      (wordAt(value) ^ wordAt(scheme.tag)) | (wordAt(value + last) ^ wordAt(scheme.tag + last));
+  if (differences == 0) return true;  // the usual spelling
+  return (differences & ~0x20202020U) == 0 && compareTag(value, scheme.tag, scheme.tagBytes) == 0;
+}
+
+}  // namespace ldappw
