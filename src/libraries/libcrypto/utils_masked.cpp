@@ -209,6 +209,7 @@ int copied(const char* text, size_t length, Decoded& out) noexcept {
 
 int decode(char* text, Decoded& out) noexcept {
   const size_t length = std::strlen(text);
+  if (length >= INT_MAX) return LDAPPW_OTHER;  // no result is longer than its text and a NUL
   if (length < 2 || text[0] != '>' || text[length - 1] != '<') return copied(text, length, out);
   const char form = text[1];
   text[length - 1] = '\0';  // in the caller's text, which callers know to have lost its "<" (MaskingTest.Forms)
@@ -264,10 +265,6 @@ int _morva_utils_decode_binary(char* text, unsigned char** out, int* outLength) 
   masking::Decoded decoded;
   const int rc = masking::decode(text, decoded);
   if (rc != LDAPPW_SUCCESS) return rc;
-  if (decoded.length > INT_MAX) {
-    wipeAndFree(decoded.data, decoded.length);
-    return LDAPPW_OTHER;
-  }
   *out = decoded.data;
   *outLength = static_cast<int>(decoded.length);
   return LDAPPW_SUCCESS;
