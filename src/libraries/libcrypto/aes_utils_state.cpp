@@ -1,38 +1,17 @@
 // SPDX-License-Identifier: Apache-2.0
-// The process-wide key state that password formatting reads, loaded from stash files, and the loading of a record for a
-// caller that keeps its own.
+// The process-wide key state that password formatting reads.
 #include <cstring>
 
-#include "aes_utils_record.h"
+#include "aes_keys.h"
 #include "trace_scope.h"
 
 namespace ldappw {
 namespace {
 
-constexpr TraceInfo kSet = operation(kAesUtils, 4, "setAESKeyData", {"keyStashFile", "keyData"});
-constexpr TraceInfo kSetCfg = accessor(kAesUtils, 6, "setCfgKeyDataGlobal", {"keyStashFile"});
-constexpr TraceInfo kSetDir = accessor(kAesUtils, 7, "setDirKeyDataGlobal", {"keyStashFile"});
 constexpr TraceInfo kGetCfg = accessor(kAesUtils, 8, "getCfgKeyDataGlobal");
 constexpr TraceInfo kGetDir = accessor(kAesUtils, 9, "getDirKeyDataGlobal");
 constexpr TraceInfo kSetCfgSync = accessor(kAesUtils, 10, "setCfgCryptoSyncGlobal", {"cryptoSync"});
 constexpr TraceInfo kSetCipherName = accessor(kAesUtils, 11, "setCipherNameGlobal");
-
-int loadRecord(const char* keyStashFile, AesKeyData** keyData) noexcept {
-  if (const int rc = initAesKeyData(keyData); rc != LDAPPW_SUCCESS) return rc;
-  RecordGuard record(keyData);
-  if (const int rc = readKeyStashFile(keyStashFile, *keyData); rc != LDAPPW_SUCCESS) return rc;
-  record.keep();
-  return setCipherNameGlobal();
-}
-
-int setGlobal(const TraceInfo& info, const char* keyStashFile, AesKeyData*& global) noexcept {
-  TracedCall call{info, keyStashFile};
-  if (global != nullptr) return call.leave(LDAPPW_SUCCESS);
-  AesKeyData* keyData = nullptr;
-  const int rc = loadRecord(keyStashFile, &keyData);
-  if (rc == LDAPPW_SUCCESS) global = keyData;
-  return call.leave(rc);
-}
 
 }  // namespace
 }  // namespace ldappw
@@ -47,14 +26,6 @@ AesKeyData* g_CfgKeyData = nullptr;
 AesKeyData* g_DirKeyData = nullptr;
 char* g_CfgCryptoSync = nullptr;
 const char* g_CipherName[3] = {nullptr, nullptr, nullptr};
-
-int setCfgKeyDataGlobal(const char* keyStashFile) noexcept {
-  return setGlobal(kSetCfg, keyStashFile, g_CfgKeyData);
-}
-
-int setDirKeyDataGlobal(const char* keyStashFile) noexcept {
-  return setGlobal(kSetDir, keyStashFile, g_DirKeyData);
-}
 
 AesKeyData* getCfgKeyDataGlobal(void) noexcept {
   const TracedCall call{kGetCfg};
@@ -81,12 +52,6 @@ int setCipherNameGlobal(void) noexcept {
     g_CipherName[2] = "AES-256-ECB";
   }
   return call.leave(LDAPPW_SUCCESS);
-}
-
-int setAESKeyData(const char* keyStashFile, AesKeyData** keyData) noexcept {
-  TracedCall call{kSet, keyStashFile, keyData};
-  if (keyData == nullptr) return call.invalid();
-  return call.leave(loadRecord(keyStashFile, keyData));
 }
 
 }  // extern "C"
