@@ -17,7 +17,7 @@
 extern "C" {
 #endif
 
-/* What the provider says of its last step. The layout is exchanged with the provider: 268 bytes. */
+/* What the provider reports of its last step. The layout is exchanged with the provider: 268 bytes. */
 typedef struct QelStatus {
   int32_t majRC; /* 0 is success */
   int32_t minRC; /* 15 is out of memory */
@@ -79,51 +79,63 @@ LDAPPW_DATA int (*pQEL_GenerateRandomSeed)(void* ctx, QelStatus* status, unsigne
 
 /*
  * loadQelCrypto opens the provider library (the system's copy in /usr/lib, or whatever the loader finds when
- * TRESK_LOCAL_INSTALL_MODE is set; otherwise the copy shipped in qel/qellib beside this library) and resolves the entry
- * table. TRESK_SHIPPED_QEL tells the provider which copy it is. A library left open by an earlier failure is used
- * again.
+ * TRESK_LOCAL_INSTALL_MODE is set; otherwise the copy shipped in qel/qellib beside libdsutil) and resolves the entry
+ * table. TRESK_SHIPPED_QEL in the environment names the copy in use to the provider. A library left open by an earlier
+ * failure is used again.
  *
- *   attachPath  out  null on entry or not; on success a new buffer of 1024 bytes: the directory to attach the provider
- *                    at. After a failure null, or a buffer that the caller releases all the same.
+ *   attachPath  out  what it points to on entry is ignored; on success a new buffer of 1024 bytes: the directory to
+ *                    attach the provider at. After a failure null, or a buffer that the caller releases all the same.
  *
- * Returns 0; 1 for a null argument, a missing entry, or a path that cannot be had; 90; or what putEnvVar gave. A
- * shipped copy without treskqels_path gives 0 with no path and the table untouched. Not to be called from two threads
- * at once.
+ * Returns 0; 1 for a null argument, a missing entry, or a path that the provider or libdsutil does not report;
+ * LDAPPW_NO_MEMORY; or the result of putEnvVar. A shipped copy without treskqels_path gives 0 with no path and the
+ * table untouched. Not to be called from two threads at once.
  */
 LDAPPW_API int loadQelCrypto(char** attachPath) LDAPPW_NOEXCEPT;
 
-/* Destroys the provider context and closes the library, where there are. Neither global is cleared and the table stays
+/* Destroys the provider context and closes the library, where they exist. Neither global is cleared and the table stays
  * stale: a later load needs the caller to reset both to null. Closing the same library twice is harmless. Not traced.
  * One thread only, after all others have finished. */
 LDAPPW_API void unloadQelCrypto(void) LDAPPW_NOEXCEPT;
 
 /* ---- Contexts ---- */
 
-/* Hands out the process-wide provider context, which the first call makes; unloading is registered to run at exit. Many
- * threads may call at once: one context is made. Returns 0; 1 for a null argument or when the provider gives no
- * context; or the code of loadQelCrypto. After a failure *qelCtx is untouched and any later call tries again. */
+/*
+ * initQelCrypto hands out the process-wide provider context, which the first call creates. Many threads may call at
+ * once: one context is created. The provider is unloaded at exit, or when this library is unloaded; a process that
+ * exits while other threads run keeps it mapped, and those threads get no context any more.
+ *
+ *   qelCtx  out  the context; untouched after a failure, and any later call tries again
+ *
+ * Returns 0; 1 for a null argument, when the provider gives no context, or when the process is exiting; or the code of
+ * loadQelCrypto.
+ */
 LDAPPW_API int initQelCrypto(void** qelCtx) LDAPPW_NOEXCEPT;
 
-/* Destroys a provider context; null is fine. Always 0. For a caller with a context of its own: the process-wide one
- * must not be used afterwards. */
+/* Destroys a provider context; null does nothing. Always 0. For a caller with a context of its own: the process-wide
+ * one must not be used afterwards. */
 LDAPPW_API int freeQelCrypto(void* qelCtx) LDAPPW_NOEXCEPT;
 
 /*
- * initQelCipher and initQelDigest make a cipher or digest context and look the algorithm up by name ("AES-128-ECB",
- * "SHA1", "md5"). The context is released with the matching free operation; the algorithm is never released.
- * Return 0, or 1 for a null argument, an unknown name or a provider failure; the context is null after the last two.
+ * initQelCipher and initQelDigest create a cipher or digest context and look its algorithm up by name.
+ *
+ *   qelCtx      in   the provider context
+ *   cipherCtx   out  the context, released with the matching free operation; null after a failure of the provider
+ *   cipherName  in   a name that the provider knows, such as "AES-128-ECB", "SHA1" or "md5"
+ *   cipher      out  the algorithm, which is never released
+ *
+ * Return 0, or 1 for a null argument, an unknown name or a provider failure.
  */
 LDAPPW_API int initQelCipher(void* qelCtx, void** cipherCtx, const char* cipherName, void** cipher) LDAPPW_NOEXCEPT;
 LDAPPW_API int initQelDigest(void* qelCtx, void** digestCtx, const char* digestName, void** digest) LDAPPW_NOEXCEPT;
 
-/* Clean and release a cipher or digest context; null is fine. Return 0, or 1 for a null qelCtx or a provider failure (a
- * context that cannot be cleaned is not released). */
+/* Clean and release a cipher or digest context; null does nothing. Return 0, or 1 for a null qelCtx or a provider
+ * failure (a context that cannot be cleaned is not released). */
 LDAPPW_API int freeQelCipher(void* qelCtx, void* cipherCtx) LDAPPW_NOEXCEPT;
 LDAPPW_API int freeQelDigest(void* qelCtx, void* digestCtx) LDAPPW_NOEXCEPT;
 
-/* The LDAP code for a provider status: the given one, or the context's last when status is null. A majRC other than 0
- * is also printed on standard output. Returns 0 for a majRC of 0; 90 for a minRC of 15; else 1, also when both are
- * null. */
+/* Translates a provider status: the given one, or the context's last when status is null. A majRC other than 0 is also
+ * printed on standard output. Returns 0 for a majRC of 0; LDAPPW_NO_MEMORY for a minRC of 15; otherwise 1, also when
+ * both arguments are null. */
 LDAPPW_API int qelStatusToLdap(void* qelCtx, QelStatus* status) LDAPPW_NOEXCEPT;
 
 #ifdef __cplusplus

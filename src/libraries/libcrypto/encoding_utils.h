@@ -8,11 +8,14 @@
  *     convention says so.
  *  2. A null pointer where a value is needed is refused with a code or a null result; nothing is read through it.
  *  3. What an operation allocates belongs to the caller, who releases it with free() unless a matching _free function
- * is named. A null pointer may always be released.
- *  4. An out-argument must point to null on entry. Unless stated otherwise it is null after a failure.
+ *     is named. A null pointer may always be released.
+ *  4. An out-argument must point to null on entry. Unless stated otherwise a failure releases what it holds and sets it
+ *     to null; a success stores the new pointer and leaves the old value to the caller.
  *  5. Lengths are in bytes. Nothing is read beyond a length or a terminator that the caller gave; where a fixed number
  *     of bytes is to be taken, what is not there counts as NUL.
- *  6. Operations may be called from many threads at once unless stated otherwise. No exception leaves the library.
+ *  6. Operations may be called from many threads at once unless stated otherwise, from a process that forks at any
+ *     moment, in its child, and from a trace sink. No exception leaves the library, and no cancellation is acted on
+ *     inside it.
  *  7. Buffers of the library's own that held clear text, keys or key schedules are wiped before they are released; what
  *     was handed to the caller is the caller's to wipe.
  *  8. Exported variables are the library's own, never the host's of the same name. Programs reach them through these
@@ -42,7 +45,7 @@ extern "C" {
 #define LDAPPW_NOEXCEPT
 #endif
 
-/* Result codes: those of LDAP (RFC 4511), and NO_MEMORY of the LDAP client interface. */
+/* Result codes: those of LDAP (RFC 4511), and LDAPPW_NO_MEMORY of the LDAP client interface. */
 enum {
   LDAPPW_SUCCESS = 0,
   LDAPPW_OPERATIONS_ERROR = 1,      /* null argument, unknown type, failed file or provider operation */
@@ -67,22 +70,32 @@ LDAPPW_DATA const char* pBase64;
 LDAPPW_DATA const char* pBase64Find;
 
 /*
- * binaryBlobToString encodes length bytes of data over the alphabet into a new text of 4 * ceil(length / 3) characters;
- * binaryBlobToBase64 does so over *pBase64. A length of 0 or less gives an empty text. Returns null for a null data
- * with a positive length, a null alphabet or one of less than 64 characters, or when memory runs out.
+ * binaryBlobToString encodes data over an alphabet; binaryBlobToBase64 does so over *pBase64.
+ *
+ *   data      in   length bytes
+ *   length    in   bytes; 0 or less gives an empty text
+ *   alphabet  in   64 characters or more
+ *
+ * Returns a new text of 4 * ceil(length / 3) characters and a NUL; null for a null data with a positive length, a null
+ * or short alphabet, or when memory runs out.
  */
 LDAPPW_API char* binaryBlobToString(const unsigned char* data, int length, const char* alphabet) LDAPPW_NOEXCEPT;
 LDAPPW_API char* binaryBlobToBase64(const unsigned char* data, int length) LDAPPW_NOEXCEPT;
 
 /*
- * stringToBinaryBlob decodes text over the alphabet into a new buffer that ends in a NUL byte, and stores the number of
- * decoded bytes in *outLength; base64ToBinaryBlob does so over *pBase64.
+ * stringToBinaryBlob decodes text over an alphabet; base64ToBinaryBlob does so over *pBase64.
+ *
+ *   text       in   a NUL-terminated text
+ *   outLength  out  the number of decoded bytes; untouched after a failure
+ *   alphabet   in   a NUL-terminated text
  *
  * Nothing is rejected. Each group of four characters gives 3 bytes without "=", 2 with the first "=" in the fourth
  * place, 1 with it in the second or third, none with it in the first; missing characters of a short last group count as
- * "=". A character of neither the alphabet nor "=" stands for the value 65, whose bits spill over as they fall.
+ * "=". Groups lie three bytes apart whatever they give: gaps are zeros. A character of neither the alphabet nor "="
+ * stands for the value 65, whose bits spill over as they fall.
  *
- * Returns null for a null argument, a text too long for *outLength, or when memory runs out.
+ * Returns a new buffer that ends in a NUL byte; null for a null argument, a text too long for *outLength, or when
+ * memory runs out.
  */
 LDAPPW_API unsigned char* stringToBinaryBlob(const char* text, unsigned int* outLength,
                                              const char* alphabet) LDAPPW_NOEXCEPT;
@@ -90,8 +103,8 @@ LDAPPW_API unsigned char* base64ToBinaryBlob(const char* text, unsigned int* out
 
 /*
  * compactToOnlyString returns a new text with only those characters of text that are in the alphabet;
- * compactToOnlyBase64 does so with *pBase64 (so "=" goes as well). When none is, or when memory runs out, a line on
- * standard output says so and the result is null.
+ * compactToOnlyBase64 does so with *pBase64 (so "=" goes as well). When there is none, or when memory runs out, a line
+ * on standard output says so and the result is null.
  */
 LDAPPW_API char* compactToOnlyString(const char* text, const char* alphabet) LDAPPW_NOEXCEPT;
 LDAPPW_API char* compactToOnlyBase64(const char* text) LDAPPW_NOEXCEPT;
@@ -110,8 +123,8 @@ LDAPPW_DATA int Asmversion;
 /* Enciphers or deciphers, as the schedule was built, the 8-byte block in place. */
 LDAPPW_API void des(const uint32_t* schedule, unsigned char* block) LDAPPW_NOEXCEPT;
 
-/* Builds the schedule of the 8-byte key, whose parity bits (the lowest of each byte) are not looked at; decrypt 0 is
- * for enciphering. deskey56 is the same operation. */
+/* Builds the schedule of the 8-byte key, whose parity bits (the lowest of each byte) are ignored; decrypt 0 is for
+ * enciphering. deskey56 is the same operation. */
 LDAPPW_API void deskey(uint32_t* schedule, const unsigned char* key, int decrypt) LDAPPW_NOEXCEPT;
 LDAPPW_API void deskey56(uint32_t* schedule, const unsigned char* key, int decrypt) LDAPPW_NOEXCEPT;
 
@@ -141,8 +154,11 @@ LDAPPW_DATA int encryptionType;
 
 /*
  * Mask text with its terminating NUL (_morva_utils_encode_buffer) or length bytes (_morva_utils_encode_binary) into a
- * new text. Return 0; 1 for a null argument; 80 for a negative length or one above 16777215, the largest that a record
- * can state; 89 for an encryptionType that is not supported; 90. 48 bytes or fewer give 164 characters.
+ * new text. 48 bytes or fewer give 164 characters.
+ *
+ * Return 0; 1 for a null argument; LDAPPW_OTHER for a negative length or one above 16777215, the largest that a record
+ * can state; LDAPPW_NOT_SUPPORTED for an encryptionType that is not supported; LDAPPW_NO_MEMORY. *out is untouched
+ * after a failure.
  */
 LDAPPW_API int _morva_utils_encode_buffer(const char* text, char** out) LDAPPW_NOEXCEPT;
 LDAPPW_API int _morva_utils_encode_binary(const unsigned char* data, int length, char** out) LDAPPW_NOEXCEPT;
@@ -151,41 +167,44 @@ LDAPPW_API int _morva_utils_encode_binary(const unsigned char* data, int length,
  * Undo the masking. A text that is not wrapped in ">" and "<" is clear and comes back as a copy, its terminating NUL
  * counted in *outLength; ">0" wraps simpleCrypt output in base64, any second character but "0" and "1" wraps plain
  * base64. In each wrapped form the final "<" of the caller's text is overwritten with a NUL, and the result ends in a
- * NUL that *outLength does not count. No checksum guards a masked text: a damaged one gives other bytes, or 89.
+ * NUL that *outLength does not count. No checksum guards a masked text: a damaged one gives other bytes, or
+ * LDAPPW_NOT_SUPPORTED.
  *
- * Return 0; 1 for a null argument; 89 for a record that does not hold together; 90. An unknown alphabet identifier
- * gives 0 and leaves the result null.
+ * Return 0; 1 for a null argument; LDAPPW_NOT_SUPPORTED for a record that does not hold together; LDAPPW_NO_MEMORY;
+ * LDAPPW_OTHER for a text too long for *outLength. An unknown alphabet identifier gives 0 and leaves the result null.
  */
 LDAPPW_API int _morva_utils_decode_buffer(char* text, char** out) LDAPPW_NOEXCEPT;
 LDAPPW_API int _morva_utils_decode_binary(char* text, unsigned char** out, int* outLength) LDAPPW_NOEXCEPT;
 
-/* Wipe and release a result and set the caller's pointer to null. A null pointer, or a pointer to null, does nothing.
- */
+/* Wipe a result up to its first NUL, release it and set the caller's pointer to null. A null pointer, or a pointer to
+ * null, does nothing. Binary data behind a zero byte is the caller's to wipe. */
 LDAPPW_API void _morva_utils_encode_buffer_free(char** result) LDAPPW_NOEXCEPT;
 LDAPPW_API void _morva_utils_encode_binary_free(char** result) LDAPPW_NOEXCEPT;
 LDAPPW_API void _morva_utils_decode_buffer_free(char** result) LDAPPW_NOEXCEPT;
 LDAPPW_API void _morva_utils_decode_binary_free(char** result) LDAPPW_NOEXCEPT;
 
-/* The size of a buffer, terminator included, that holds the masked form of length bytes; 0 for a length that cannot be
- * masked. */
+/* Returns the size of a buffer, terminator included, that holds the masked form of length bytes, also for lengths that
+ * cannot be masked; 0 for a size that no int can state. */
 LDAPPW_API int _morva_utils_getEncodedSize(int length) LDAPPW_NOEXCEPT;
 
-/* ---- Run-time loading and the library path; failures are told through the server's debug printer ---- */
+/* ---- Run-time loading and the library path; failures are reported by the server's debug printer alone ---- */
 
 /* The dlopen flags of ldapLoadLib when it is given 0; RTLD_NOW | RTLD_GLOBAL at start. */
 LDAPPW_DATA int defFlags;
 
-/* Opens the library with dlopen and returns a new cell that holds its handle, or null. ldapUnloadLib releases it. */
+/* Opens the library with dlopen and returns a new cell that holds its handle, or null; the caller may ask dlerror for
+ * the reason unless debugging is on. ldapUnloadLib releases the cell. */
 LDAPPW_API void** ldapLoadLib(const char* fileName, int flags) LDAPPW_NOEXCEPT;
 
-/* Closes the library and releases the cell. Returns 0, or 80 for a null cell. */
+/* Closes the library and releases the cell. Returns 0, or LDAPPW_OTHER for a null cell. */
 LDAPPW_API int ldapUnloadLib(void** handle) LDAPPW_NOEXCEPT;
 
-/* The address of the symbol in the cell's library, or null. */
+/* Returns the address of the symbol in the cell's library, or null, with the reason in dlerror as above. */
 LDAPPW_API void* ldapGetSymAddress(void** handle, const char* symbol) LDAPPW_NOEXCEPT;
 
 /* Appends "/usr/lib" to LD_LIBRARY_PATH unless it is an element of it already. Returns putenv's result, 0 when nothing
- * had to be done. A path longer than the library's 2048 characters is cut. For start-up: one thread only. */
+ * had to be done, or LDAPPW_NO_MEMORY with the path as it was. A path longer than 2048 characters is cut. For start-up:
+ * one thread only. */
 LDAPPW_API int setDefLibpath(void) LDAPPW_NOEXCEPT;
 
 /* In a text of two-character SSL cipher codes whose first "0A" follows its first "09", puts another "0A" before that
@@ -194,10 +213,16 @@ LDAPPW_API void fixupCipherSpecs(char* specs) LDAPPW_NOEXCEPT;
 
 /* ---- The terminal ---- */
 
-/* Prompts "Enter password ==> " on standard output, reads one line of at most 254 characters from standard input
- * without echo, drops its last character (the newline) and returns it as a new text, empty at the end of input; null
- * when memory runs out. When echo cannot be switched off the process ends with errno as its exit status. Changes the
- * terminal while it runs: one call at a time. */
+/*
+ * getPassword prompts "Enter password ==> " on standard output and reads one line of at most 254 characters from the
+ * descriptor of standard input, without echo where that is a terminal. What the caller's stdio has read ahead is not
+ * seen, and nothing behind the line is read.
+ *
+ * Returns the line without its last character, whatever that is, as a new text, empty at the end of input; null when
+ * memory runs out. When echo cannot be switched off the process ends with errno as its exit status. SIGINT, SIGTERM,
+ * SIGHUP and SIGQUIT bring the terminal back before they act as they would without the prompt; where the process goes
+ * on, so does the prompt. Changes the terminal and signal actions while it runs: one call at a time.
+ */
 LDAPPW_API char* getPassword(void) LDAPPW_NOEXCEPT;
 
 #ifdef __cplusplus

@@ -1,6 +1,6 @@
 /* SPDX-License-Identifier: Apache-2.0 */
 /*
- * ldappw password schemes: telling which scheme a stored password value uses, making stored values, checking presented
+ * ldappw password schemes: recognising the scheme of a stored password value, making stored values, checking presented
  * passwords and turning reversible values back into clear text; with the Unix crypt and the digests behind them. The
  * rules of encoding_utils.h hold here too.
  *
@@ -44,32 +44,51 @@ LDAPPW_DATA char VLDL_BRACED[6];
 /* ---- Schemes ---- */
 
 /*
- * check_format returns the scheme code of a value of length bytes, of which it reads the first 8 and the last. It never
- * fails: what it cannot classify is 1. A tag needs at least one byte after it, except "{MD5}"; an untagged value of 8
- * bytes or more wrapped in '>' and '<' is 128. Allocates nothing. Traced, with the code as result.
+ * check_format returns the scheme code of a value.
+ *
+ *   value   in   length bytes, of which the first 8 and the last are read; no terminator is needed
+ *   length  in   bytes
+ *
+ * It never fails: what it cannot classify is FORMAT_NONE. A tag needs at least one byte after it, except "{MD5}". An
+ * untagged value of 8 bytes or more wrapped in '>' and '<' is FORMAT_QVEIL. Allocates nothing. Traced, with the code as
+ * result.
  */
 LDAPPW_API int check_format(const char* value, unsigned int length) LDAPPW_NOEXCEPT;
 
-/* The number of characters that format_password writes for clearLength bytes, tag included, or -1 for a scheme that
- * cannot be made or a value too long for an int. For scheme 3 it is 21, the least size that format_password accepts,
- * although the value has 29. */
+/*
+ * formatted_password_length returns the number of characters that format_password writes, tag included.
+ *
+ *   scheme       in   a scheme code
+ *   clearLength  in   bytes of clear text; a negative number goes through the same arithmetic and may give any number
+ *
+ * Returns -1 for a scheme that cannot be made or a value too long for an int. For FORMAT_MD5 it is 21, the least size
+ * that format_password accepts, although the value has 29 characters. Not traced.
+ */
 LDAPPW_API int formatted_password_length(int scheme, int clearLength) LDAPPW_NOEXCEPT;
 
 /*
  * format_password writes the stored value of a clear password.
  *
- *   scheme       in   a scheme code; 133 without keyData becomes 128
- *   salt         in   scheme 4 only: its first two characters salt the crypt (see generate_crypt_salt)
- *   keyData      in   schemes 133 to 135: the key and salt; g_CipherName must have been set
- *   clear        in   clearLength bytes. Schemes 3 and 9 take it up to the first NUL, 4 the first 8 bytes, 128 the
- * first 46; for scheme 2 bytes after a NUL count as NUL. It must not be the same buffer as out. out          out
- * outSize bytes, cleared first; a NUL follows the value where there is room
+ *   scheme       in   a scheme code; FORMAT_AES256 without keyData becomes FORMAT_QVEIL
+ *   salt         in   FORMAT_CRYPT only: its first two characters salt the crypt (see generate_crypt_salt)
+ *   keyData      in   the AES schemes: the key and salt; g_CipherName must have been set
+ *   clear        in   clearLength bytes, of which nothing behind a first NUL is read by the one-way schemes and
+ *                     FORMAT_QVEIL; must not be the same buffer as out
+ *   clearLength  in   bytes
+ *   out          out  outSize bytes, cleared first; a NUL follows the value where there is room
+ *   outSize      in   bytes
  *
- * The least outSize: the clear length (1), 33 (2), 21 (3), 20 (4), 62 (9), 171 (128), formatted_password_length (133 to
- * 135). Scheme 3 writes 29 characters whatever outSize is: give at least 30.
+ *   scheme          what counts of clear                         least outSize
+ *   FORMAT_NONE     all bytes                                    clearLength
+ *   FORMAT_SHA      all bytes; those behind a NUL count as NUL   33
+ *   FORMAT_MD5      up to the first NUL                          21, but 29 characters are written: give 30 or more
+ *   FORMAT_CRYPT    the first 8 bytes, up to a NUL               20
+ *   FORMAT_SSHA     up to the first NUL                          62
+ *   FORMAT_QVEIL    the first 46 bytes, up to a NUL              171
+ *   the AES ones    all bytes                                    formatted_password_length
  *
- * Scheme 2 and a clear text that begins with "{SHA}": of 33 bytes it is a value in its final form, nothing is done (0);
- * of any other length the 20 bytes after the tag are taken as the digest itself.
+ * A clear text that begins with "{SHA}" is a special case of FORMAT_SHA: of 33 bytes it is a value in its final form
+ * from a supplier, and 0 is returned; of any other length the 20 bytes after the tag are taken as the digest itself.
  *
  * Returns the length of the value, or 0 when nothing was formatted; out then holds zeros, or the tag alone. Traced.
  */
@@ -77,12 +96,21 @@ LDAPPW_API int format_password(int scheme, char* salt, AesKeyData* keyData, cons
                                char* out, int outSize) LDAPPW_NOEXCEPT;
 
 /*
- * verify_password tells whether a presented password matches a stored value. Either may carry a tag; presentedIsClear
- * non-zero takes the presented one as clear text whatever it looks like. Neither needs a terminator. Two clear texts,
- * or two values of one scheme other than {SHA}, are compared over their first 46 bytes.
+ * verify_password checks whether a presented password matches a stored value. Either may carry a tag.
  *
- * Returns 0 for a match. Anything else is no match: 99 when nothing could be compared, 49 or another code for {SSHA},
- * -1 or 1 otherwise. The time does not depend on where the first difference is. Traced.
+ *   presented         in   presentedLength bytes; no terminator is needed
+ *   presentedLength   in   bytes
+ *   stored            in   storedLength bytes; no terminator is needed
+ *   storedLength      in   bytes
+ *   presentedIsClear  in   not 0: presented is clear text, whatever it begins with
+ *   keyData           in   of the AES schemes
+ *
+ * Two clear texts, two masked ones, and two values of one scheme other than {SHA} are compared over their first 46
+ * bytes. An AES value of a password of more than 751 bytes matches none: compare with unformat_password's result.
+ *
+ * Returns 0 for a match. Anything else is no match: 99 when nothing could be compared, LDAPPW_INVALID_CREDENTIALS or
+ * another code for {SSHA}, the difference of the tags, or -1 or 1 from the comparison of bytes. The time does not
+ * depend on where the first difference is. Traced.
  */
 LDAPPW_API int verify_password(const char* presented, int presentedLength, const char* stored, int storedLength,
                                int presentedIsClear, AesKeyData* keyData) LDAPPW_NOEXCEPT;
@@ -90,18 +118,27 @@ LDAPPW_API int verify_password(const char* presented, int presentedLength, const
 /*
  * unformat_password turns a {qVEIL} or AES value back into clear text.
  *
- *   clear        out  a new text: released with _morva_utils_decode_buffer_free
+ *   value        in   a NUL-terminated value
+ *   clear        out  a new NUL-terminated text: released with _morva_utils_decode_buffer_free
  *   keyData      in   of the AES schemes
- *   clearLength  out  may be null
+ *   clearLength  out  bytes of the clear text; may be null
  *
  * Returns 1 for success and 0 for failure. Traced.
  */
 LDAPPW_API int unformat_password(const char* value, char** clear, AesKeyData* keyData,
                                  int* clearLength) LDAPPW_NOEXCEPT;
 
-/* The server's entry for reading clear text out of a value: as unformat_password for a reversible scheme; any other
- * value is returned as it is, or unmasked when it is wrapped in ">" and "<". Returns 0, 1 for a null argument, 80 for a
- * value that cannot be reversed, or 90 when nothing was produced. *clear is always set. Not traced. */
+/*
+ * morva_decodePW is the server's entry for reading clear text out of a value.
+ *
+ *   clear    out  always set: as from unformat_password for a value of a reversible scheme; any other value as it is,
+ *                 or unmasked when it is wrapped in ">" and "<"; null after a failure
+ *   value    in   a NUL-terminated value
+ *   keyData  in   of the AES schemes
+ *
+ * Returns 0; 1 for a null argument; LDAPPW_OTHER for a value that cannot be reversed; LDAPPW_NO_MEMORY when nothing was
+ * produced. Not traced.
+ */
 LDAPPW_API int morva_decodePW(char** clear, const char* value, AesKeyData* keyData) LDAPPW_NOEXCEPT;
 
 /* ---- Unix crypt: DES (FIPS 46-3) applied 25 times under a salted expansion ---- */
@@ -159,15 +196,25 @@ LDAPPW_API void SHA(char* data, unsigned long length, sha_digest* digest) LDAPPW
 
 /*
  * saltedHashEncrypt makes base64(digest(clear + salt) + salt) with a random salt as long as the digest;
- * unsaltedHashEncrypt base64(digest(clear)). clear is taken up to its NUL; digestName is one that the provider knows.
- * Return 0, 1, 90 or the code of initQelCrypto or initQelDigest. When initQelCrypto fails *out is untouched. Traced.
+ * unsaltedHashEncrypt base64(digest(clear)).
+ *
+ *   clear       in   a NUL-terminated text
+ *   out         out  a new NUL-terminated text, without a tag
+ *   digestName  in   a name that the provider knows
+ *
+ * Return 0; 1 for a null argument or a failed provider or base64 step; LDAPPW_NO_MEMORY; or the code of initQelCrypto
+ * or initQelDigest. *out is untouched when the arguments are refused or initQelCrypto fails. Traced.
  */
 LDAPPW_API int saltedHashEncrypt(const char* clear, char** out, const char* digestName) LDAPPW_NOEXCEPT;
 LDAPPW_API int unsaltedHashEncrypt(const char* digestName, const char* clear, char** out) LDAPPW_NOEXCEPT;
 
-/* Checks clear against such a salted text: the first digest-size bytes are the digest, all others the salt, whatever
- * their number. Returns 0 for a match, 49 for none; 1 also for a text that is not base64 or holds less than a digest.
- * Traced. */
+/*
+ * saltedHashVerify checks clear against such a salted text: the first bytes, as many as the digest has, are the digest,
+ * all others the salt, whatever their number.
+ *
+ * Returns 0 for a match and LDAPPW_INVALID_CREDENTIALS for none; 1 also for a text that is not base64 or holds less
+ * than a digest; otherwise the codes above. Traced.
+ */
 LDAPPW_API int saltedHashVerify(const char* clear, const char* stored, const char* digestName) LDAPPW_NOEXCEPT;
 
 #ifdef __cplusplus

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // The masked encoding: data scattered over random background, enciphered, and written as text over one of sixteen
-// alphabets, with a control packet inside that tells how to undo it.
+// alphabets, with a control packet inside that states how to undo it.
 #include <climits>
 #include <cstring>
 #include <ctime>

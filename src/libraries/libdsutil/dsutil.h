@@ -37,7 +37,7 @@ LDTR_API int putEnvVar(const char* name, const char* value);
 LDTR_API char* getKUBInstallLibPath(void);
 
 /* Appends source to the text in the buffer of size bytes, cutting what does not fit and always terminating, and
- * returns the length that it tried to make: a result of size or more tells that the text was cut (BSD strlcat). */
+ * returns the length that it tried to make: a result of size or more means that the text was cut (BSD strlcat). */
 LDTR_API size_t kub_strlcat(char* destination, const char* source, size_t size);
 
 #ifdef __cplusplus
