@@ -1,5 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // AES encryption of buffers against OpenSSL, and each way in which it can fail.
+#include <climits>
+
 #include "failures.h"
 #include "oracle.h"
 
@@ -88,12 +90,43 @@ TEST_F(AesFailures, OfBothDirections) {
 TEST_F(AesFailures, OfEncryption) {
   encrypt.refusesNulls(clear);
   encrypt.fails({{1, "Invalid parameter.", replacing(length, -1)},
+                 {90, "calloc() returned NULL.", replacing(length, INT_MAX)},
+                 {90, "calloc() returned NULL.", replacing(length, INT_MAX - 64)},
                  {90, "Error - aesEncryptBuffer: calloc() failed.\n", both(longVector, failingAllocation(0))},
                  {90, "calloc() returned NULL.", failingAllocation(0)},
                  {1, "QEL_EVP_EncryptInit() failed.", replacing(pQEL_EVP_EncryptInit, kFails)},
                  {1, "QEL_EVP_EncryptUpdate() failed.", replacing(pQEL_EVP_EncryptUpdate, kFails)},
                  {1, "QEL_EVP_EncryptFinal() failed.", replacing(pQEL_EVP_EncryptFinal, kFails)},
                  {1, "binaryBlobToBase64() returned NULL.", failingAllocation(1)}});
+}
+
+// A provider that claims more than it writes.
+TEST_F(AesFailures, YieldZerosForWhatWasNotWritten) {
+  const auto claims = [](void*, void*, unsigned char*, int* count, auto...) { return *count = 20, 1; };
+  const auto claimsTooMuch = [](void*, void*, unsigned char*, int* count, auto...) { return *count = 2000, 1; };
+  const auto claimsLess = [](void*, void*, unsigned char*, int* count, auto...) { return *count = -1, 1; };
+  replacing(pQEL_EVP_EncryptUpdate, claims)([&] {
+    replacing(pQEL_EVP_EncryptFinal, [](auto...) { return 1; })([&] {
+      dirtyStack();
+      ASSERT_EQ(aesEncryptBuffer("20 bytes of the text", &out, name, key, iv, 20), 0);
+      EXPECT_EQ(taken(std::exchange(out, nullptr)), opensslBase64(std::string(20, '\0')));
+    });
+  });
+  encrypt.fails(
+      {{1, "QEL_EVP_EncryptUpdate() failed.", replacing(pQEL_EVP_EncryptUpdate, claimsTooMuch)},
+       {1, "QEL_EVP_EncryptUpdate() failed.", replacing(pQEL_EVP_EncryptUpdate, claimsLess)},
+       {1, "QEL_EVP_EncryptFinal() failed.",
+        replacing(pQEL_EVP_EncryptFinal, [](void*, void*, unsigned char*, int* count) { return *count = 2000, 1; })}});
+}
+
+// Key wrapping adds more than a block.
+TEST_F(AesFailures, AreNotThoseOfRoom) {
+  const auto widest = [](void*, void*, unsigned char* to, int* count) {
+    std::memset(to, 'w', 64);
+    return *count = 64, 1;
+  };
+  replacing(pQEL_EVP_EncryptFinal, widest)([&] { ASSERT_EQ(encrypt(), 0); });
+  EXPECT_EQ(opensslDecoded(taken(std::exchange(out, nullptr))).substr(288), std::string(64, 'w'));
 }
 
 TEST_F(AesFailures, OfDecryption) {

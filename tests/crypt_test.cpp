@@ -135,6 +135,7 @@ int emptied(int rc) {
   return out == nullptr ? rc : -1;
 }
 
+const Failure noDigest = replacing(pQEL_EVP_MD_size, [](auto...) { return 0; });
 const Failure longDigest = replacing(pQEL_EVP_MD_size, [](auto...) { return 400; });  // usual ones need no allocation
 
 TEST(SaltedHash, ReportsProviderFailures) {
@@ -160,6 +161,8 @@ TEST(SaltedHash, ReportsProviderFailures) {
       {"initQelDigest() failed.", 1, 1, replacing(name, "no digest")},
       {"calloc() returned NULL.", 90, 0, both(longDigest, failingAllocation(0))},
       {"calloc() returned NULL.", 0, 90, both(longDigest, failingAllocation(1))},
+      {"calloc() returned NULL.", 90, 90, noDigest},
+      {"calloc() returned NULL.", 90, 90, replacing(pQEL_EVP_MD_size, [](auto...) { return -1; })},
       {"QEL_RAND_bytes() failed.", 1, 0, replacing(pQEL_RAND_bytes, two)},
       {"QEL_EVP_DigestInit() failed.", 1, 1, replacing(pQEL_EVP_DigestInit, two)},
       {"QEL_EVP_DigestUpdate() failed.", 1, 1, replacing(pQEL_EVP_DigestUpdate, two)},
@@ -176,7 +179,7 @@ TEST(SaltedHash, ReportsProviderFailures) {
                [] { return emptied(saltedHashEncrypt(clear, &out, name)); });
     expectLine("Error - saltedHashVerify: ", row.verifying, [&] { return saltedHashVerify(clear, stored, name); });
   }
-  EXPECT_EQ(released, 14);  // once in each failure from the lookup of the digest on
+  EXPECT_EQ(released, 18);  // once in each failure from the lookup of the digest on
 }
 
 TEST(UnsaltedHash, ReportsProviderFailuresInItsOwnWords) {
@@ -188,6 +191,7 @@ TEST(UnsaltedHash, ReportsProviderFailuresInItsOwnWords) {
       {1, {"Error - unsaltedHashEncrypt: initQelDigest() failed"}, replacing(name, "no digest")},
       {1, {"Error - unsaltedHashEncrypt: QEL_EVP_DigestInit() failed"}, replacing(pQEL_EVP_DigestInit, zero)},
       {90, {"Error - unsaltedHashEncrypt : calloc() failed\n"}, both(longDigest, failingAllocation(0))},
+      {90, {"Error - unsaltedHashEncrypt : calloc() failed\n"}, noDigest},
       {1, {"Error - unsaltedHashEncrypt: QEL_EVP_DigestUpdate() failed"}, replacing(pQEL_EVP_DigestUpdate, zero)},
       {1, {"Error - unsaltedHashEncrypt: QEL_EVP_DigestFinal() failed"}, replacing(pQEL_EVP_DigestFinal, zero)},
       {1, {"Error - unsaltedHashEncrypt: binaryBlobToBase64()returned NULL. rc = 1\n"}, failingAllocation(0)},

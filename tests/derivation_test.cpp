@@ -176,10 +176,24 @@ TEST_F(Derivation, ItsStepsReportWhatTheyLack) {
   const Operation sync{"genKeySyncVal", [&] { return genKeySyncVal(ctx, digestCtx, digest, seed, record); }};
   for (const Operation& each : {grow, sync}) each.refusesNulls(ctx, digestCtx, digest, seed, record);
   Operation{"genKeySaltVal", [&] { return genKeySaltVal(ctx, record); }}.refusesNulls(ctx, record);
-  grow.fails({{90, "morva_pbkdf2() failed.", failingAllocation(0)}});
+  // A digest that fails in the middle of thousands of rounds must not give other keys.
+  static int rounds = 0;
+  static const auto realInit = pQEL_EVP_DigestInit;
+  const Failure oneRound = replacing(
+      pQEL_EVP_DigestInit, [](void* c, void* d, const void* a) { return ++rounds == 7777 ? 0 : realInit(c, d, a); });
+  grow.fails({{90, "morva_pbkdf2() failed.", failingAllocation(0)}, {1, "morva_pbkdf2() failed.", oneRound}});
   sync.fails({{90, "calloc(cryptoSync) returned NULL.", failingAllocation(0)},
               {90, "morva_pbkdf2() failed.", failingAllocation(1)},
+              {1, "morva_pbkdf2() failed.", replacing(pQEL_EVP_DigestFinal, [](auto...) { return 0; })},
               {1, "binaryBlobToBase64() returned NULL.", failingAllocation(2)}});
+  ASSERT_EQ(sync(), 0);
+  const std::string own = textOf(record->cryptoSync);
+  const Replaced<const char*> aliased(seed, reinterpret_cast<const char*>(record->cryptoSync.data));
+  ASSERT_EQ(sync(), 0);
+  const std::string ofOwn = textOf(record->cryptoSync);
+  const Replaced<const char*> copied(seed, own.c_str());
+  ASSERT_EQ(sync(), 0);
+  EXPECT_EQ(textOf(record->cryptoSync), ofOwn);
   taken();
 }
 

@@ -4,9 +4,9 @@
 
 #include <array>
 
-#include "utils_masked_tables.h"
 #include "oracle.h"
 #include "support.h"
+#include "utils_masked_tables.h"
 
 using namespace test;
 
@@ -26,7 +26,9 @@ TEST(Base64, AgreesWithOpensslInAnyAlphabetAtEveryLength) {
       std::string text = opensslBase64(data);
       for (char& c : text) c = c == '=' ? c : alphabet[kStandard.find(c)];
       Guarded guarded(data);
-      EXPECT_EQ(taken(binaryBlobToBase64(bytesOf(guarded.data()), static_cast<int>(n))), text);
+      char* encoded = binaryBlobToBase64(bytesOf(guarded.data()), static_cast<int>(n));
+      EXPECT_EQ(std::string(encoded, n / 3 * 4 + 5), text + std::string(n / 3 * 4 + 5 - text.size(), '\0'));
+      free(encoded);
       unsigned length = 0;
       unsigned char* blob = base64ToBinaryBlob(text.c_str(), &length);
       EXPECT_EQ(std::string(reinterpret_cast<char*>(blob), length + 1), data + '\0');

@@ -182,6 +182,18 @@ TEST(ProviderContext, IsMadeOverOneLibraryAndReleasedOnceHoweverOftenThatIsUnloa
   EXPECT_EQ(log, kCreation + "Cleanup\nCleanup\nclosed\n");
 }
 
+TEST(ProviderContext, UnloadingClosesANewLibraryInTheOldCell) {
+  const std::string log = staged("complete", nullptr, [] {
+    void* context = nullptr;
+    EXPECT_EQ(initQelCrypto(&context), 0);
+    unloadQelCrypto();
+    qelCtxGlobal = nullptr;
+    qelLoadGlobal = ldapLoadLib(qelLibraryName, 0);  // malloc gives the cell's address again, as a rule
+    unloadQelCrypto();
+  });
+  EXPECT_EQ(log, kCreation + "Cleanup\nclosed\nclosed\n");
+}
+
 TEST(ProviderContext, FailuresLeaveItAbsentAndMayBeRetried) {
   const std::string log = staged("complete", nullptr, [] {
     char untouched = 0;

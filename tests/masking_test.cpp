@@ -2,6 +2,7 @@
 // The masked encoding: recorded texts under fixed draws, records that name no key, damage and other hostile input.
 #include <gtest/gtest.h>
 
+#include <climits>
 #include <random>
 
 #include "encoding_utils.h"
@@ -110,6 +111,8 @@ TEST(Masking, DecodesOrRefuses) {
       {"not closed", ">1abc", 0, 6, ">1abc"},
       {"plain base64", ">xQUJD<", 0, 3, "ABC"},
       {"older form", ">0Fl0ECgFC<", 0, 6, "secret"},
+      {"older form with padding inside", ">0Fg==Fl0E<", 0, 4, "s8gn"},
+      {"plain base64 with padding inside", ">x=z==<", 0, 0, ""},
       {"no alphabet", ">1<"},
       {"unknown alphabet", ">1?QUJD<"},
       {"empty record", ">10<", 89},
@@ -186,7 +189,9 @@ TEST(Masking, RefusesArgumentsLengthsAndSelectors) {
   }
   EXPECT_EQ(out, nullptr);
   EXPECT_EQ(_morva_utils_getEncodedSize(16777215), 44739281);  // ceil((33554432 + 24) / 3) * 4 + 5
-  EXPECT_EQ(_morva_utils_getEncodedSize(1000000000), 0);
+  EXPECT_EQ(_morva_utils_getEncodedSize(INT_MIN) + _morva_utils_getEncodedSize(-1), 2 * 165);
+  EXPECT_EQ(_morva_utils_getEncodedSize(805306352), 2147483645);
+  EXPECT_EQ(_morva_utils_getEncodedSize(805306353) + _morva_utils_getEncodedSize(INT_MAX), 0);
 }
 
 TEST(Masking, BuffersAreTextsAndEveryFailedAllocationIsReported) {

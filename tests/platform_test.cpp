@@ -5,6 +5,8 @@
 #include <fnmatch.h>
 #include <gtest/gtest.h>
 #include <pty.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
 #include <termios.h>
 
 #include <thread>
@@ -54,6 +56,31 @@ TEST(Loader, OpensResolvesClosesAndTellsFailuresToTheDebugLogAlone) {
   EXPECT_EQ(ldapUnloadLib(nullptr), 80);
   const Replaced<int> flags(defFlags, RTLD_NOW | RTLD_NOLOAD);
   EXPECT_EQ(ldapLoadLib("libutil.so.1", 0), nullptr);
+}
+
+// Loaded by a relative name from a folder that no system call takes a path to.
+TEST(InstallFolder, MayLieDeeperThanAnyPath) {
+  const test::TempFolder folder;
+  const std::string library =
+      std::filesystem::canonical("/proc/self/exe").parent_path().parent_path() / "lib/libdsutil.so.1";
+  const pid_t child = fork();
+  if (child == 0) {
+    std::filesystem::current_path(folder.file(""));
+    const std::string name(200, 'd');
+    for (int i = 0; i < 25; ++i) {
+      if (mkdir(name.c_str(), 0700) != 0 || chdir(name.c_str()) != 0) _exit(2);
+    }
+    std::filesystem::copy(library, "deep.so");
+    void* handle = dlmopen(LM_ID_NEWLM, "./deep.so", RTLD_NOW);
+    char* (*const path)() =
+        handle == nullptr ? nullptr : reinterpret_cast<char* (*)()>(dlsym(handle, "getKUBInstallLibPath"));
+    if (path == nullptr) _exit(3);
+    char* const found = path();
+    _exit(found == nullptr || std::strlen(found) > 25 * 201 ? 0 : 4);
+  }
+  int status = -1;
+  waitpid(child, &status, 0);
+  EXPECT_EQ(status, 0);
 }
 
 // The number of overflow lines in a debug log that holds nothing else.

@@ -33,6 +33,7 @@ std::string format(int scheme, const std::string& clear, std::string salt = "ab"
 int verify(const std::string& presented, const std::string& stored, int isClear = 0, AesKeyData* keyData = keys()) {
   Guarded p(presented);
   Guarded s(stored);
+  dirtyStack();
   return verify_password(p.data(), static_cast<int>(presented.size()), s.data(), static_cast<int>(stored.size()),
                          isClear, keyData);
 }
@@ -207,6 +208,19 @@ TEST(FormatPassword, RefusesAndLeavesAtMostTheTag) {
   EXPECT_EQ(unformat({out, 171}, nullptr), "abc");
 }
 
+TEST(FormatPassword, ReadsNothingBehindAFirstNul) {
+  for (const int scheme : {2, 3, 4, 9, 128}) {
+    char out[2][256];
+    for (const std::string& clear : {"{SHA"s, "pass"s}) {
+      Guarded end(clear + '\0');
+      const std::string whole = clear + std::string(296, '\0');
+      const int length = format_password(scheme, std::string("ab").data(), nullptr, end.data(), 300, out[0], 256);
+      EXPECT_EQ(format_password(scheme, std::string("ab").data(), nullptr, whole.data(), 300, out[1], 256), length);
+      EXPECT_EQ(std::string(out[0], 12) == std::string(out[1], 12), scheme < 9) << scheme;  // the others draw
+    }
+  }
+}
+
 TEST(FormatPassword, TakesTaggedShaAsAlreadyHashed) {
   const Lines final{"format_password: This pwd update is in SHA format and is from an ORVEX supplier. Do nothing.\n"};
   const Lines raw{"format_password: This pwd update is in SHA format and is NOT from an ORVEX supplier. Base64 it.\n"};
@@ -255,6 +269,8 @@ TEST(VerifyPassword, TreatsTheOddPairsAsPromised) {
   const std::string sha = format(2, "secret");
   const std::string noAlphabet = "{qVEIL}>1\x7f====<";
   const std::string tooShort = format(128, "").substr(0, 10) + "AAAA<";
+  const std::string gapSalt = "ab\0cd"s;  // what "YWI=" and "Y2Rl" give, a byte less than they take
+  const std::string gap = "{SSHA}" + opensslBase64(opensslDigest("SHA1", "secretx" + gapSalt) + "x") + "YWI=Y2Rl";
   const std::string salted8 = "{SSHA}" + saltedPayload("secret", "8 bytes!");
   const struct {
     const char* name;
@@ -272,6 +288,13 @@ TEST(VerifyPassword, TreatsTheOddPairsAsPromised) {
       {"a raw digest presented", "{SHA}" + opensslDigest("SHA1", "secret"), sha, 0, 0, keys()},
       {"crypt with half a salt", "secret", "{crypt}a", 99, 0, keys()},
       {"AES-256 without a key", "secret", format(133, "secret"), 99, 0, nullptr},
+      {"as long as what is made without a key", "secret", "{AES256}" + std::string(163, 'x'), 'q' - 'a', 0, nullptr},
+      {"a digest is no password", "{SHA}" + opensslDigest("SHA1", "secret"), sha, -1, 1, keys()},
+      {"nor is it of another length", "{SHA}" + opensslDigest("SHA1", "secret") + "12345678", sha, 1, 1, keys()},
+      {"nor a value", sha, sha, 1, 1, keys()},
+      {"a password like a value", sha, "{SHA}" + opensslBase64(opensslDigest("SHA1", sha)), 0, 1, keys()},
+      {"a password like a tag", "{SHA}", "{SHA}" + opensslBase64(opensslDigest("SHA1", "{SHA}")), 0, 1, keys()},
+      {"the salt has a gap", "secret", gap, 0, 0, keys()},
       {"an unknown alphabet stands for itself", noAlphabet, noAlphabet, 0, 1, keys()},
       {"what cannot be unmasked matches nothing", tooShort, tooShort, 99, 1, keys()},
       {"less than a digest", "secret", "{SSHA}" + opensslBase64(std::string(19, 'x')), 1, 0, keys()},

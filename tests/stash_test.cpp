@@ -56,6 +56,7 @@ TEST_F(StashFiles, ThatCannotBeRead) {
     putFile(path, fixedFile().substr(0, length));
     const std::string part = length < 12 ? "cryptoSync" : length < 24 ? "cryptoSalt" : "aesKeys";
     read.fails({{1, "fread(" + part + ") failed.", untouched}});
+    EXPECT_EQ(target->cryptoSync.length, length == 0 ? 0U : 8U);
   }
   for (const char* length : {"ffffffff", "feffffff", "00000080", "5d000000", "09000100"}) {
     putFile(path, fixedFile().replace(0, 4, fromHex(length)));

@@ -6,7 +6,7 @@
 #include <cstdlib>
 
 #include "aes_keys.h"
-#include "crypto_provider.h"
+#include "qel_utils.h"
 #include "trace_scope.h"
 
 namespace ldappw {
@@ -18,7 +18,7 @@ constexpr int kFirstPrintable = 33;
 constexpr int kLastPrintable = 126;
 
 unsigned char* morva_rand(void* qelCtx, unsigned char* buffer, unsigned count) noexcept {
-  if (pQEL_RAND_bytes(qelCtx, buffer, static_cast<int>(count)) != 1) {
+  if (randomBytes(qelCtx, buffer, static_cast<int>(count)) != 1) {
     std::fputs("The PRNG is not seeded!\n", stderr);  // keys must never come from a generator that failed
     std::abort();
   }

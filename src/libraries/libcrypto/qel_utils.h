@@ -2,6 +2,7 @@
 // Cipher and digest contexts as the operations use them: the provider's steps as methods, and owners that release.
 #pragma once
 
+#include "cancellation.h"
 #include "crypto_provider.h"
 
 namespace ldappw {
@@ -11,6 +12,12 @@ namespace ldappw {
 template <class Result, class... Parameters, class... Arguments>
 Result callEntry(Result (*entry)(Parameters...), Arguments... arguments) noexcept {
   return __builtin_expect(entry != nullptr, 1) ? entry(arguments...) : Result{};
+}
+
+// A generator may open devices and files to seed itself.
+inline int randomBytes(void* qelCtx, unsigned char* buffer, int count) noexcept {
+  const NoCancellation uncancelled;
+  return callEntry(pQEL_RAND_bytes, qelCtx, buffer, count);
 }
 
 // A digest under way: the handles that a caller gave or an owner made, and the provider's steps on them. Steps return

@@ -60,7 +60,7 @@ int saltedHashTo(TextTarget& target, const char* clear, size_t clearBytes, const
   SecretBytes<2 * kUsualDigest> raw(2 * size);
   if (size == 0 || !raw) return call.fail(LDAPPW_NO_MEMORY, "calloc() returned NULL.");
   unsigned char* salt = raw.get() + size;
-  if (callEntry(pQEL_RAND_bytes, qelCtx, salt, static_cast<int>(size)) != 1) {
+  if (randomBytes(qelCtx, salt, static_cast<int>(size)) != 1) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "QEL_RAND_bytes() failed.");
   }
   if (const int rc = digestSalted(call, digest, {clear, clearBytes}, {salt, size}, raw.get()); rc != 0) return rc;
