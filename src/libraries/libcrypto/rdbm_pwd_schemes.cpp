@@ -15,7 +15,7 @@ constexpr int kCipherBlock = 16;
 int paddedLength(int clearLength, size_t tagBytes) noexcept {
   const int64_t padded = (int64_t{clearLength} + kCipherBlock) / kCipherBlock * kCipherBlock;
   const int64_t length = (padded + 2) / 3 * 4 + static_cast<int64_t>(tagBytes);
-  return length > INT_MAX ? -1 : static_cast<int>(length);
+  return length > INT_MAX || length < INT_MIN ? -1 : static_cast<int>(length);
 }
 
 constexpr int folded(char c) {
