@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // Creating and rebuilding stash files, and what seeds and salts must look like. Log readers match the texts as they
-// are, those that name another function or call a bad salt an invalid parameter among them; StashTest pins all.
+// are, those that name another function or call a bad salt an invalid parameter among them; the StashFileMaking and
+// CryptoStrings suites pin all.
 #include <cstring>
 
 #include "aes_file_format.h"

@@ -34,8 +34,8 @@ uint32_t morva_rand_uint(void* qelCtx) noexcept {
 }  // namespace
 
 // The multiplier is the width plus one and the modulus the width, so that highBound itself never comes out and the
-// first two numbers come out more often than others; the precision is the x87's on every target. KeysTest.RandomRange
-// pins it.
+// first two numbers come out more often than others; the precision is the x87's on every target.
+// Derivation.RandomTextsAreOfTheirRangeAndEndAtTheLastByte pins it.
 int morva_rand_range(void* qelCtx, int lowBound, int highBound) noexcept {
   static_assert(__LDBL_MANT_DIG__ == 64, "80-bit extended floating point");
   if (highBound <= lowBound) std::abort();

@@ -15,7 +15,7 @@ namespace {
 
 constexpr unsigned kScheduleWords = 32;
 constexpr size_t kSimpleCryptStart =
-    4;  // in the key text: masked values are read from there (EncodingTest.SimpleCrypt)
+    4;  // in the key text: masked values are read from there (SimpleCrypt suite)
 
 void scaleForByteOffsets(uint32_t* schedule) noexcept {
   if (Asmversion == 0) return;

@@ -23,9 +23,9 @@ inline int randomBytes(void* qelCtx, unsigned char* buffer, int count) noexcept 
 // A digest under way: the handles that a caller gave or an owner made, and the provider's steps on them. Steps return
 // what the provider returned.
 struct Digest {
-  void* qelCtx;
-  void* context;
-  void* algorithm;
+  void* qelCtx = nullptr;
+  void* context = nullptr;
+  void* algorithm = nullptr;
 
   bool isComplete() const noexcept { return qelCtx != nullptr && context != nullptr && algorithm != nullptr; }
   int size() const noexcept { return callEntry(pQEL_EVP_MD_size, qelCtx, algorithm); }
@@ -40,9 +40,9 @@ struct Digest {
 
 // A cipher under way, in either direction.
 struct Cipher {
-  void* qelCtx;
-  void* context;
-  void* algorithm;
+  void* qelCtx = nullptr;
+  void* context = nullptr;
+  void* algorithm = nullptr;
 
   int blockSize() const noexcept { return callEntry(pQEL_EVP_CIPHER_block_size, qelCtx, algorithm); }
   int vectorLength() const noexcept { return callEntry(pQEL_EVP_CIPHER_iv_length, qelCtx, algorithm); }
@@ -58,7 +58,7 @@ using FreeContext = int (*)(void* qelCtx, void* context);
 template <class Steps, InitContext kInit, FreeContext kFree>
 class ContextOwner : public Steps {
  public:
-  explicit ContextOwner(void* providerContext) noexcept : Steps{providerContext, nullptr, nullptr} {}
+  explicit ContextOwner(void* providerContext) noexcept { this->qelCtx = providerContext; }
   ~ContextOwner() {
     if (this->context != nullptr) kFree(this->qelCtx, this->context);
   }

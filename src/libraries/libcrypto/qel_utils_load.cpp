@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Finding and opening the crypto provider library, resolving its entry table, and closing it. Log readers match the
-// texts as they are, with their blanks and without a code; LoadingTest pins all.
+// texts as they are, with their blanks and without a code; ProviderLoading.FindsACopyOrTellsWhatIsWrong pins all.
 #include "qel_utils_load.h"
 
 #include <cstdio>

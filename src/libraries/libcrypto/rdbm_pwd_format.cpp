@@ -17,7 +17,7 @@ constexpr TraceInfo kFormatPassword = passwordOperation("format_password", kForm
 constexpr size_t kDigestBytes = sizeof(sha_digest);
 constexpr size_t kCryptKeyBytes = 8;  // that count
 constexpr size_t kCryptCharacters = 13;
-constexpr size_t kMaskedClear = 46;  // a longer password is cut silently, as in every stored value: MaskedTest.Cut
+constexpr size_t kMaskedClear = 46;  // a longer password is cut silently, as in every stored value (EachScheme suite)
 constexpr size_t kMaskedCharacters = 164;
 constexpr size_t kFormattedSha = 33;
 
@@ -142,7 +142,7 @@ static_assert(fitTheSchemes(), "a maker for each scheme that can be made");
 // ---- Formatting ----
 
 // {AES256} without keys becomes {qVEIL}; the shorter keys have no such way out and make nothing.
-// SchemesTest.WithoutKeys pins it.
+// FormatPassword.RefusesAndLeavesAtMostTheTag pins it.
 const Scheme* schemeToMake(int code, const AesKeyData* keyData) noexcept {
   return findScheme(code == FORMAT_AES256 && keyData == nullptr ? int{FORMAT_QVEIL} : code);
 }

@@ -26,7 +26,8 @@ constexpr int kNeverMade = -3;  // fixedLength: recognised only
 constexpr int kNoKey = -1;
 
 // The lengths that a value must exceed are uneven, and the 21 of {MD5} is less than the 29 characters that it writes:
-// values and callers' buffers of every server out there fit these numbers. SchemesTest.Recognised and .Rooms pin them.
+// values and callers' buffers of every server out there fit these numbers. CheckFormat.FollowsTheUnevenLengthsOfTheTags
+// and the EachScheme suite pin them.
 // clang-format off
 inline constexpr Scheme kSchemes[] = {
     //                                              longer than  length      room  key

@@ -163,7 +163,7 @@ struct Rule {
 
 // The first row that fits counts. The usual pairs, with a clear presented password, come first. A {SSHA} value
 // presented against a clear stored text is checked as the password of a value whose payload is that text, so that a
-// value never matches the password that it was made of: SchemesTest.Pairs pins it.
+// value never matches the password that it was made of: VerifyPassword.TreatsTheOddPairsAsPromised pins it.
 // clang-format off
 constexpr Rule kRules[] = {
     // stored      presented

@@ -212,7 +212,7 @@ int decode(char* text, Decoded& out) noexcept {
   if (length >= INT_MAX) return LDAPPW_OTHER;  // no result is longer than its text and a NUL
   if (length < 2 || text[0] != '>' || text[length - 1] != '<') return copied(text, length, out);
   const char form = text[1];
-  text[length - 1] = '\0';  // in the caller's text, which callers know to have lost its "<" (MaskingTest.Forms)
+  text[length - 1] = '\0';  // in the caller's text, which callers know to have lost its "<" (Masking.DecodesOrRefuses)
   const char* payload = length > 2 ? text + 2 : text + 1;
   if (form == '1') return decodeMasked(payload, out);
   return form == '0' ? decodeSimple(payload, out) : _noencode_decode_binary(payload, out);
