@@ -14,8 +14,8 @@ namespace ldappw {
 namespace {
 
 constexpr unsigned kScheduleWords = 32;
-constexpr size_t kSimpleCryptStart =
-    4;  // in the key text: masked values are read from there (SimpleCrypt suite)
+// Where the key text is entered; masked values are read from there (SimpleCrypt suite).
+constexpr size_t kSimpleCryptStart = 4;
 
 void scaleForByteOffsets(uint32_t* schedule) noexcept {
   if (Asmversion == 0) return;
