@@ -16,6 +16,14 @@
 #include "oracle.h"
 #include "support.h"
 
+static bool noCopies = false;
+
+// In place of the utility library's.
+extern "C" char* ldap_getenv(const char* name) {
+  const char* value = getenv(name);
+  return value == nullptr || noCopies ? nullptr : strdup(value);
+}
+
 namespace {
 
 using test::Replaced;
@@ -101,6 +109,13 @@ struct Repair {
   long overflows;
 };
 
+TEST(LibraryPath, StaysWhenThereIsNoMemoryForACopy) {
+  setenv("LD_LIBRARY_PATH", "/opt/x", 1);
+  const Replaced<bool> none(noCopies, true);
+  EXPECT_EQ(setDefLibpath(), 90);
+  EXPECT_STREQ(getenv("LD_LIBRARY_PATH"), "/opt/x");
+}
+
 TEST(LibraryPath, HoldsTheSystemFolderAfterwards) {
   const std::string full(2032, 'x');  // with the name, all the 2048 characters there are
   const Repair rows[] = {
@@ -167,27 +182,81 @@ TEST(Prompt, ReadsALineAndDropsItsLastCharacter) {
   }
 }
 
-TEST(Prompt, SwitchesEchoOffWhileItReads) {
+// A terminal that echoes, with somebody at it.
+class Terminal : public testing::Test {
+ protected:
+  void SetUp() override {
+    ASSERT_EQ(openpty(&host, &terminal, nullptr, nullptr, nullptr), 0);
+    ASSERT_EQ(tcgetattr(terminal, &before), 0);
+    before.c_lflag |= ECHO | ECHONL;
+    ASSERT_EQ(tcsetattr(terminal, TCSANOW, &before), 0);
+  }
+  void TearDown() override {
+    EXPECT_TRUE(echoes());
+    close(terminal);
+    close(host);
+  }
+  bool echoes() const {
+    termios now{};
+    tcgetattr(terminal, &now);
+    return (now.c_lflag & (ECHO | ECHONL)) != 0;
+  }
+  void awaitSilence() const {
+    for (int i = 0; i < 100000 && echoes(); ++i) usleep(100);
+  }
   int host = -1, terminal = -1;
-  ASSERT_EQ(openpty(&host, &terminal, nullptr, nullptr, nullptr), 0);
   termios before{};
-  ASSERT_EQ(tcgetattr(terminal, &before), 0);
-  before.c_lflag |= ECHO | ECHONL;
-  ASSERT_EQ(tcsetattr(terminal, TCSANOW, &before), 0);
-  std::thread typist([host, before] {
-    for (termios now = before; (now.c_lflag & (ECHO | ECHONL)) != 0; tcgetattr(host, &now)) std::this_thread::yield();
+};
+
+TEST_F(Terminal, DoesNotEchoWhileThePromptReads) {
+  std::thread typist([this] {
+    awaitSilence();
     EXPECT_EQ(write(host, "secret\n", 7), 7);
   });
   EXPECT_EQ(prompted(fdopen(dup(terminal), "r")), "secret");
   typist.join();
-  termios after{};
-  ASSERT_EQ(tcgetattr(terminal, &after), 0);
-  EXPECT_EQ(after.c_lflag, before.c_lflag);
   char echoed[8];
   fcntl(host, F_SETFL, O_NONBLOCK);
   EXPECT_EQ(read(host, echoed, sizeof echoed), -1) << "the terminal showed what was typed";
-  close(terminal);
-  close(host);
+}
+
+// What a child that prompts on the terminal gets, with a signal in the middle; its exit status is the password's length.
+TEST_F(Terminal, EchoesAgainBeforeASignalActs) {
+  static const struct {
+    int signal;
+    bool isHandled;
+    int status;
+  } rows[] = {{SIGINT, false, SIGINT},
+              {SIGTERM, false, SIGTERM},
+              {SIGHUP, false, SIGHUP},
+              {SIGINT, true, 6 << 8U},
+              {SIGUSR1, true, 6 << 8U}};
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.signal);
+    const pid_t child = fork();
+    if (child == 0) {
+      dup2(terminal, STDIN_FILENO);
+      struct sigaction ours {};
+      ours.sa_handler = [](int) {};  // without SA_RESTART: the read is interrupted
+      if (row.isHandled) sigaction(row.signal, &ours, nullptr);
+      if (freopen("/dev/null", "w", stdout) == nullptr) _exit(99);
+      const std::string password = test::taken(getPassword());
+      char rest = 0;
+      _exit(read(STDIN_FILENO, &rest, 1) == 1 && rest == 'n' ? static_cast<int>(password.size()) : 98);
+    }
+    awaitSilence();
+    kill(child, row.signal);
+    int status = 0;
+    if (row.isHandled) {
+      usleep(20000);
+      awaitSilence();
+      EXPECT_EQ(write(host, "secret\nnext\n", 12), 12);
+    }
+    EXPECT_EQ(waitpid(child, &status, 0), child);
+    EXPECT_EQ(status, row.status);
+    EXPECT_TRUE(echoes());
+    tcflush(terminal, TCIFLUSH);
+  }
 }
 
 }  // namespace

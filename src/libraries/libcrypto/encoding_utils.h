@@ -17,7 +17,8 @@
  *     moment, in its child, and from a trace sink. No exception leaves the library, and no cancellation is acted on
  *     inside it.
  *  7. Buffers of the library's own that held clear text, keys or key schedules are wiped before they are released; what
- *     was handed to the caller is the caller's to wipe.
+ *     was handed to the caller is the caller's to wipe. A program that handles passwords is best linked with -z now:
+ *     at the first call of each function a lazily bound one saves registers on the stack, with what is in them.
  *  8. Exported variables are the library's own, never the host's of the same name. Programs reach them through these
  *     headers when they are compiled position-independent (-fPIE or -fPIC, the default of most systems).
  */
