@@ -2,36 +2,50 @@
 // The locks and what a fork does with them.
 #include "locks.h"
 
+#include <pthread.h>
+
 namespace ldappw {
 namespace {
 
-constexpr pthread_mutex_t kRecursive = PTHREAD_RECURSIVE_MUTEX_INITIALIZER_NP;
-constexpr pthread_mutex_t kPlain = PTHREAD_MUTEX_INITIALIZER;
+pthread_mutex_t creationMutex = PTHREAD_MUTEX_INITIALIZER;
+pthread_mutex_t cryptMutex = PTHREAD_MUTEX_INITIALIZER;
+thread_local bool isCreating = false;  // this thread holds creationMutex
 
 void beforeFork() noexcept {
-  pthread_mutex_lock(&creationMutex);
+  if (!isCreating) pthread_mutex_lock(&creationMutex);
   pthread_mutex_lock(&cryptMutex);
 }
 
-void afterForkInParent() noexcept {
+void afterFork() noexcept {
   pthread_mutex_unlock(&cryptMutex);
-  pthread_mutex_unlock(&creationMutex);
-}
-
-// The child's thread has another number than the parent's, which holds the recursive lock: it cannot unlock that one.
-void afterForkInChild() noexcept {
-  cryptMutex = kPlain;
-  creationMutex = kRecursive;
+  if (!isCreating) pthread_mutex_unlock(&creationMutex);
 }
 
 // The C library forgets the handlers when this library is unloaded.
 [[gnu::constructor]] void watchForks() noexcept {
-  pthread_atfork(beforeFork, afterForkInParent, afterForkInChild);
+  pthread_atfork(beforeFork, afterFork, afterFork);
 }
 
 }  // namespace
 
-pthread_mutex_t creationMutex = kRecursive;
-pthread_mutex_t cryptMutex = kPlain;
+CreationLock::CreationLock() noexcept : passed_(isCreating) {
+  if (passed_) return;
+  pthread_mutex_lock(&creationMutex);
+  isCreating = true;
+}
+
+CreationLock::~CreationLock() {
+  if (passed_) return;
+  isCreating = false;
+  pthread_mutex_unlock(&creationMutex);
+}
+
+CryptLock::CryptLock() noexcept {
+  pthread_mutex_lock(&cryptMutex);
+}
+
+CryptLock::~CryptLock() {
+  pthread_mutex_unlock(&cryptMutex);
+}
 
 }  // namespace ldappw

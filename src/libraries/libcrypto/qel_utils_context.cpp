@@ -123,7 +123,7 @@ int createProviderContext(TracedCall& call) noexcept {
 
 [[gnu::cold]] int firstContext(TracedCall& call) noexcept {
   const NoCancellation uncancelled;
-  const MutexLock lock(creationMutex);
+  const CreationLock lock;
   return currentContext() != nullptr ? int{LDAPPW_SUCCESS} : createProviderContext(call);
 }
 
