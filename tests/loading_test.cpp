@@ -134,6 +134,11 @@ TEST(ProviderLoading, LooksInTheSystemFolderUnlessTheModeIsLocal) {
   });
 }
 
+#ifdef __SANITIZE_THREAD__  // its own thread is still there at exit, so that nothing is cleaned up
+const std::string kEnd = "closed\n";
+#else
+const std::string kEnd = "Cleanup\nclosed\n";
+#endif
 const std::string kCreation = "Init /toolkit\nSetValue 1 /toolkit\nSetValue 0 on\nAttach\n";
 
 TEST(ProviderContext, IsOneForThreadsThatAskAtOnceAndCleanedUpAtExit) {
@@ -150,7 +155,7 @@ TEST(ProviderContext, IsOneForThreadsThatAskAtOnceAndCleanedUpAtExit) {
     for (std::thread& thread : threads) thread.join();
     for (const void* context : contexts) EXPECT_EQ(context, qelCtxGlobal);
   });
-  EXPECT_EQ(log, kCreation + "Cleanup\nclosed\n");
+  EXPECT_EQ(log, kCreation + kEnd);
 }
 
 TEST(ProviderContext, IsMadeOverOneLibraryAndReleasedOnceHoweverOftenThatIsUnloaded) {
@@ -220,7 +225,7 @@ TEST(ProviderContext, FailuresLeaveItAbsentAndMayBeRetried) {
     EXPECT_EQ(trace.messages(), expected);
     test::expectErrorClasses(trace);
   });
-  EXPECT_EQ(log, "Init /toolkit\n" + kCreation + "Cleanup\nclosed\n");
+  EXPECT_EQ(log, "Init /toolkit\n" + kCreation + kEnd);
   staged(nullptr, "nopath", [] {  // too old to be resolved
     void* context = nullptr;
     EXPECT_EQ(initQelCrypto(&context), 1);
