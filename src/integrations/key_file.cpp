@@ -1,0 +1,111 @@
+// SPDX-License-Identifier: Apache-2.0
+// Documented in key_file.h.
+#include "key_file.h"
+
+#include <errno.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstring>
+
+#include "secret_bytes.h"
+
+namespace plugin {
+namespace {
+
+constexpr char kDamaged[] = "not a whole key stash file";
+constexpr int kSaltType = 1;            // of validateCryptoString
+constexpr off_t kBytesBesideSync = 88;  // of a stash file
+constexpr mode_t kOthers = S_IRWXG | S_IRWXO;
+
+class Descriptor {
+ public:
+  // Does not wait for the other end of a pipe.
+  explicit Descriptor(const char* path) noexcept : fd_(open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY)) {}
+  ~Descriptor() {
+    if (fd_ >= 0) close(fd_);
+  }
+  Descriptor(const Descriptor&) = delete;
+  Descriptor& operator=(const Descriptor&) = delete;
+  int get() const noexcept { return fd_; }
+
+ private:
+  int fd_;
+};
+
+// The library believes the length that the file states, and makes room for it.
+bool holdsItsSync(int fd, off_t size) noexcept {
+  unsigned char length[4];
+  if (size <= kBytesBesideSync || pread(fd, length, sizeof length, 0) != static_cast<ssize_t>(sizeof length)) {
+    return false;
+  }
+  off_t stated = 0;
+  for (size_t i = sizeof length; i-- > 0;) stated = stated << 8U | off_t{length[i]};
+  return stated > 0 && stated <= size - kBytesBesideSync;
+}
+
+// Why the file cannot be loaded, or null.
+const char* fileProblem(const char* path, KeyReport& report) noexcept {
+  const Descriptor file(path);
+  struct stat found {};
+  if (file.get() < 0 || fstat(file.get(), &found) != 0) return std::strerror(errno);
+  if (S_ISDIR(found.st_mode)) return std::strerror(EISDIR);
+  if (!S_ISREG(found.st_mode)) return "not a regular file";
+  if (found.st_size == 0) return "the file is empty";
+  if (!holdsItsSync(file.get(), found.st_size)) return kDamaged;
+  if ((found.st_mode & kOthers) != 0) {
+    std::snprintf(report.warning, sizeof report.warning,
+                  "key file %s: open to other users (mode %04o); its mode should be 0600", path,
+                  static_cast<unsigned>(found.st_mode & 07777U));
+  }
+  return nullptr;
+}
+
+// Files of other content can be long enough: their texts tell. Of damaged keys, that a shorter one is not the beginning
+// of the longer one any more.
+bool looksWhole(const Library& library, const AesKeyData& keys) noexcept {
+  const auto* sync = reinterpret_cast<const char*>(keys.cryptoSync.data);
+  const auto* salt = reinterpret_cast<const char*>(keys.cryptoSalt.data);
+  if (sync == nullptr || salt == nullptr || library.validateText(salt, kSaltType) != LDAPPW_SUCCESS) {
+    return false;
+  }
+  for (uint32_t i = 0; i < keys.cryptoSync.length; ++i) {
+    if (sync[i] < '!' || sync[i] > '~') return false;
+  }
+  for (size_t i = 0; i + 1 < 3; ++i) {
+    const SecBuffer& shorter = keys.aesKeys[i];
+    const auto* longer = reinterpret_cast<const char*>(keys.aesKeys[i + 1].data);
+    if (!equalBytes({reinterpret_cast<const char*>(shorter.data), shorter.length}, {longer, shorter.length})) {
+      return false;
+    }
+  }
+  return true;
+}
+
+const char* loadProblem(const Library& library, const char* path, AesKeyData*& keys) noexcept {
+  const int code = library.loadKeys(path, &keys);
+  if (code == LDAPPW_NO_MEMORY) return std::strerror(ENOMEM);
+  if (code != LDAPPW_SUCCESS || !looksWhole(library, *keys)) return kDamaged;
+  void* provider = nullptr;
+  return library.startProvider(&provider) == LDAPPW_SUCCESS ? nullptr : "the crypto provider cannot be loaded";
+}
+
+}  // namespace
+
+AesKeyData* loadKeyFile(const Library& library, const char* path, KeyReport& report) noexcept {
+  if (path == nullptr) {
+    std::snprintf(report.problem, sizeof report.problem, "no key file is given (keys=FILE)");
+    return nullptr;
+  }
+  AesKeyData* keys = nullptr;
+  const char* problem = fileProblem(path, report);
+  if (problem == nullptr) problem = loadProblem(library, path, keys);
+  if (problem == nullptr) return keys;
+  library.freeKeys(keys);
+  std::snprintf(report.problem, sizeof report.problem, "key file %s: %s", path, problem);
+  return nullptr;
+}
+
+}  // namespace plugin
