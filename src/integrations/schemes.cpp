@@ -71,6 +71,11 @@ bool matchesDigest(const Scheme& scheme, const Check& check) noexcept {
                                       static_cast<int>(value.size()), 1, nullptr) == 0;
 }
 
+// The library reads a salted text without its padding as well: one that was cut short.
+bool matchesSalted(const Scheme& scheme, const Check& check) noexcept {
+  return check.payload.size() % 4 == 0 && matchesDigest(scheme, check);
+}
+
 bool sameText(std::string_view a, std::string_view b) noexcept {
   return a.size() == b.size() && strncasecmp(a.data(), b.data(), a.size()) == 0;
 }
@@ -87,7 +92,7 @@ const Scheme kSchemes[kSchemeCount] = {
     {"vldl",   "{VLDL}",   FORMAT_VLDL,   -1, true,  0,            false, false, nullptr},
     {"crypt",  "{crypt}",  FORMAT_CRYPT,  -1, false, 8,            false, false, matchesDigest},
     {"sha",    "{SHA}",    FORMAT_SHA,    -1, false, 0,            false, true,  matchesDigest},
-    {"ssha",   "{SSHA}",   FORMAT_SSHA,   -1, false, 0,            false, false, matchesDigest},
+    {"ssha",   "{SSHA}",   FORMAT_SSHA,   -1, false, 0,            false, false, matchesSalted},
     {"md5",    "{MD5}",    FORMAT_MD5,    -1, false, 0,            false, false, matchesDigest},
 };
 // clang-format on
