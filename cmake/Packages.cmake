@@ -1,5 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
-# The Debian packages, one a component: the libraries, what builds against them, and the command. scripts/package
+# The Debian packages, one a component: the libraries, what builds against them, the command, and the plug-ins that are
+# built. scripts/package
 # configures a tree for them; debian/stage.cmake adds what is known only when the files are in place.
 set(LDAPPW_MAINTAINER "ldappw maintainers <maintainers@ldappw.example>" CACHE STRING "Maintainer of the packages")
 set(LDAPPW_DEBIAN_ARCHITECTURE "" CACHE STRING "Architecture of the packages; that of the machine when empty")
@@ -58,4 +59,34 @@ passwords of directory exports in LDIF, the rotation of AES keys included.
 .
 Passwords come from a prompt, standard input or a file, never from the
 command line.")
+
+# Plug-ins open the library by its name, which no tool sees.
+set(ldappw_plugin_depends "libldappw1 (= ${PROJECT_VERSION}-${CPACK_DEBIAN_PACKAGE_RELEASE})")
+if(TARGET pw_ldappw)
+  list(APPEND CPACK_COMPONENTS_ALL slapd)
+  set(CPACK_DEBIAN_SLAPD_PACKAGE_NAME slapd-ldappw)
+  set(CPACK_DEBIAN_SLAPD_PACKAGE_SECTION net)
+  set(CPACK_DEBIAN_SLAPD_PACKAGE_DEPENDS "${ldappw_plugin_depends}, slapd (>= 2.5)")
+  set(CPACK_DEBIAN_SLAPD_PACKAGE_SUGGESTS ldappw)
+  set(CPACK_COMPONENT_SLAPD_DESCRIPTION "reversible password schemes for slapd
+The module teaches slapd, the server of OpenLDAP, the password schemes
+{qVEIL}, {AES128}, {AES192}, {AES256} and {VLDL}, so that the users of a
+directory that has such values keep their passwords when it moves.
+.
+The AES schemes need the key file of that directory.")
+endif()
+if(TARGET pwdstorage)
+  list(APPEND CPACK_COMPONENTS_ALL dirsrv)
+  set(CPACK_DEBIAN_DIRSRV_PACKAGE_NAME 389-ds-ldappw)
+  set(CPACK_DEBIAN_DIRSRV_PACKAGE_SECTION net)
+  set(CPACK_DEBIAN_DIRSRV_PACKAGE_DEPENDS "${ldappw_plugin_depends}, 389-ds-base (>= 2.3)")
+  set(CPACK_DEBIAN_DIRSRV_PACKAGE_SUGGESTS ldappw)
+  set(CPACK_COMPONENT_DIRSRV_DESCRIPTION "reversible password schemes for 389 Directory Server
+The plug-in teaches 389 Directory Server the password schemes {qVEIL},
+{AES128}, {AES192}, {AES256} and {VLDL}, so that the users of a directory
+that has such values keep their passwords when it moves. At the first login
+of each user the server turns the value into one of its own.
+.
+The AES schemes need the key file of that directory.")
+endif()
 include(CPack)

@@ -1,6 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
 """A small LDAP client: what no command line can send, such as passwords with NUL bytes, and fast enough for a load."""
-import re
 import socket
 
 OK, UNAVAILABLE, BUSY, REFUSED, UNWILLING = 0, 52, 51, 49, 53
@@ -85,11 +84,6 @@ class Connection:
         change = ber(0x30, ber(0x0A, b"\2"), ber(0x30, ber(4, attribute.encode()), ber(0x31, *(ber(4, v) for v in values))))
         return self.ask(ber(0x66, ber(4, dn.encode()), ber(0x30, change)))[:2]
 
-    def add(self, dn, **attributes):
-        rows = (ber(0x30, ber(4, name.encode()), ber(0x31, *(ber(4, v) for v in values)))
-                for name, values in attributes.items())
-        return self.ask(ber(0x68, ber(4, dn.encode()), ber(0x30, *rows)))[:2]
-
     def change_password(self, dn, new):
         request = ber(0x30, ber(0x80, dn.encode()), ber(0x82, new))
         return self.ask(ber(0x77, ber(0x80, PASSWORD_MODIFY), ber(0x81, request)))[:2]
@@ -110,8 +104,3 @@ class Connection:
 def bind(port, dn, password):
     with Connection(port) as connection:
         return connection.bind(dn, password)
-
-
-def unescaped(text):
-    """A password as the tables of the trials spell it."""
-    return re.sub(rb"\\x(..)", lambda m: bytes([int(m[1], 16)]), text.encode())

@@ -13,8 +13,10 @@ import tempfile
 
 ROOT = pathlib.Path(__file__).resolve().parents[2]
 BUILD = ROOT / "build/release"
-LDAPPW = BUILD / "bin/ldappw"
+INSTALLED = "LDAPPW_INSTALLED" in os.environ  # the packages are tried, not what was built
+LDAPPW = "ldappw" if INSTALLED else BUILD / "bin/ldappw"
 SUFFIX = "dc=example,dc=org"
+TOP = f"dn: {SUFFIX}\nobjectClass: domain\ndc: example"
 MADE = ("aes256", "qveil", "aes192", "aes128", "ssha", "crypt", "sha", "md5")  # the schemes that values are made of
 OWN = ("aes256", "qveil", "aes192", "aes128")
 NOBODY = dict(user="nobody", group="nogroup", extra_groups=[]) if os.geteuid() == 0 else {}
@@ -59,7 +61,8 @@ def scratch():
     with tempfile.TemporaryDirectory(prefix="ldappw-servers-") as name:
         folder = pathlib.Path(name)
         folder.chmod(0o711)
-        shutil.copytree(BUILD / "lib", folder / "lib", symlinks=True)
+        if not INSTALLED:
+            shutil.copytree(BUILD / "lib", folder / "lib", symlinks=True)
         yield folder
 
 

@@ -9,11 +9,12 @@ import subprocess
 import time
 
 import client
-from common import (LDAPPW, NOBODY, OWN, ROOT, SUFFIX, bad_key_files, make_value, one_person, own, people, run)
+from common import (INSTALLED, LDAPPW, NOBODY, OWN, ROOT, SUFFIX, TOP, bad_key_files, make_value, one_person, own,
+                    people, run)
 
 MANAGER, PASSWORD, PORT = "cn=manager", "of the trials", 38990
 DATA = pathlib.Path("/usr/share/dirsrv/data")
-ENTRIES = ROOT / "src/integrations/ldappw-schemes.ldif"
+ENTRIES = DATA / "ldappw-schemes.ldif" if INSTALLED else ROOT / "src/integrations/ldappw-schemes.ldif"
 FOLDERS = "config db run lock tmp log ldif bak inst".split()
 # In the foreground, with all that the server logs by itself; -d 0 would log nothing.
 FOREGROUND = ("-d", "266354688")
@@ -31,7 +32,9 @@ class Server389:
         shutil.copytree("/etc/dirsrv/schema", self.folder / "config/schema")
         for name in ("slapd-collations.conf", "certmap.conf"):
             shutil.copy(f"/etc/dirsrv/config/{name}", self.folder / "config")
-        self.entries = ENTRIES.read_text().replace("libldappw-pwdstorage", f"{folder}/lib/dirsrv/plugins/libldappw-pwdstorage")
+        self.entries = ENTRIES.read_text()
+        if not INSTALLED:
+            self.entries = self.entries.replace("pluginPath: ", f"pluginPath: {folder}/lib/dirsrv/plugins/")
         self.entries = re.sub("keys=.*", f"keys={keys}", self.entries) if keys else re.sub(
             "nsslapd-pluginarg0.*\n", "", self.entries)
         text = self.template("template-dse.ldif") + self.template("template-suffix-db.ldif")
@@ -101,9 +104,6 @@ def is_text(password):
         return password.decode() is not None
     except UnicodeDecodeError:
         return False
-
-
-TOP = f"dn: {SUFFIX}\nobjectClass: domain\ndc: example"
 
 
 def imports(trials, folder, units, persons):
@@ -205,5 +205,7 @@ def trials_of_389(trials, folder, keys, short):
     units, persons = people(keys)
     imports(trials, folder, units, persons[:40] if short else persons)
     added_over_ldap(trials, folder, keys)
+    if INSTALLED:
+        return
     key_files(trials, folder, keys, short)
     refusals(trials, folder)
