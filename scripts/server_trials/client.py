@@ -81,8 +81,9 @@ class Connection:
 
     def change(self, dn, attribute, *values):
         """Replaces the values of an attribute."""
-        change = ber(0x30, ber(0x0A, b"\2"), ber(0x30, ber(4, attribute.encode()), ber(0x31, *(ber(4, v) for v in values))))
-        return self.ask(ber(0x66, ber(4, dn.encode()), ber(0x30, change)))[:2]
+        row = ber(0x30, ber(4, attribute.encode()), ber(0x31, *(ber(4, value) for value in values)))
+        replace = ber(0x30, ber(0x0A, b"\2"), row)
+        return self.ask(ber(0x66, ber(4, dn.encode()), ber(0x30, replace)))[:2]
 
     def change_password(self, dn, new):
         request = ber(0x30, ber(0x80, dn.encode()), ber(0x82, new))

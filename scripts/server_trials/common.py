@@ -39,7 +39,8 @@ class Trials:
             return
         print(f"FAILED: {text}", flush=True)
         if self.log and not self.shown and self.log.exists():
-            print(f"-- the end of {self.log}:", *self.log.read_text(errors="replace").splitlines()[-40:], "--", sep="\n")
+            lines = self.log.read_text(errors="replace").splitlines()[-40:]
+            print(f"-- the end of {self.log}:", *lines, "--", sep="\n")
         self.shown = True
 
     def equal(self, got, expected, text):
@@ -139,7 +140,8 @@ def people(keys):
 
 
 def one_person(uid, value):
-    return f"dn: uid={uid},{SUFFIX}\nobjectClass: inetOrgPerson\nuid: {uid}\ncn: {uid}\nsn: {uid}\nuserPassword: {value}"
+    return (f"dn: uid={uid},{SUFFIX}\nobjectClass: inetOrgPerson\nuid: {uid}\ncn: {uid}\nsn: {uid}\n"
+            f"userPassword: {value}")
 
 
 def make_value(scheme, password, keys):

@@ -167,7 +167,8 @@ def imports(trials, folder, units, persons):
     vldl = [one_person("vldl", "{VLDL}whatever"), one_person("vldl2", "{vldl}{SHA}2jmj7l5rSw0yVb/vlWAYkK/YBwk=")]
     for style in ("slapd.conf", "cn=config"):
         server = Slapd(folder, f"keys={folder}/server.stash", style)
-        trials.step(f"slapd, {style}: {len(persons)} people of the sample export, right and wrong passwords", server.log)
+        trials.step(f"slapd, {style}: {len(persons)} people of the sample export, right and wrong passwords",
+                    server.log)
         server.load(*units, *(person.block for person in persons), *vldl)
         with server:
             try_people(trials, persons)
@@ -187,7 +188,7 @@ def changes(trials, dn):
             ("{qVEIL}", b"a\0b", False), ("{VLDL}", b"correct horse", False), ("{AES256}", long, True),
             ("{AES256}", b"a\0b", True), ("{AES256}", b"{SHA}5678901234567890123456789012", True)]
     rows += [(tag, password, True) for tag in ("{AES128}", "{AES192}", "{AES256}")
-             for password in (b"x", b"correct horse", b"s" * 16, b"l" * 751, b"l" * 752, b"l" * 2000, "Zoë€".encode())]
+             for password in (b"x", b"correct horse", b"s" * 16, b"l" * 751, b"l" * 752, "Zoë€".encode())]
     config, admin, user = administrator("cn=config"), administrator(), client.Connection(PORT)
     before = b"the one before"
     trials.equal(admin.change(dn, "userPassword", before)[0], client.OK, "a clear password")
@@ -214,9 +215,8 @@ def slappasswd(trials, folder, keys):
                     f"module-load=pw-ldappw.so keys={keys} schemes={','.join(MADE)}", "-h", tag, "-s", "horse")
         _, _, code = run(LDAPPW, "verify", "--keys", keys, value, text="horse\n", codes=None)
         trials.check(code == 0 and value.lower().startswith("{%s}" % scheme), f"{tag}: {value}")
-    for arguments, line in (("foo", 'pw-ldappw: unknown or repeated argument "foo"; there are keys=FILE and schemes=LIST'),
-                            ("keys=/a keys=/b", 'pw-ldappw: unknown or repeated argument "keys=/b"; there are keys=FILE '
-                             "and schemes=LIST"),
+    unknown = 'pw-ldappw: unknown or repeated argument "%s"; there are keys=FILE and schemes=LIST'
+    for arguments, line in (("foo", unknown % "foo"), ("keys=/a keys=/b", unknown % "keys=/b"),
                             ("schemes=qveil,foo", 'pw-ldappw: unknown scheme "foo" in schemes=qveil,foo')):
         server = Slapd(folder, arguments)
         _, error, code = run(*server.command(), "-d", "none", codes=None, **NOBODY)
@@ -281,7 +281,8 @@ authz-regexp uid=([^,@]*)[^,]*,.*cn=auth uid=$1,{SUFFIX}
                 for password in ("horse", value, value.partition("}")[2] or "none"):
                     out, error, code = run("ldapwhoami", "-Q", "-O", "none", "-H", f"ldap://127.0.0.1:{PORT}", "-Y",
                                            mechanism, "-U", uid, "-w", password, codes=None)
-                    trials.equal(code == 0, opened.get(uid) == password, f"{mechanism}, {uid}, {password}: {out}{error}")
+                    trials.equal(code == 0, opened.get(uid) == password,
+                                 f"{mechanism}, {uid}, {password}: {out}{error}")
 
 
 def background(trials, folder, keys):
@@ -325,7 +326,8 @@ def bind_until(until, people_of, seed, strict, results):
             time.sleep(0.01)
             continue
         answers += 1
-        if code != (client.OK if good else client.REFUSED) and (strict or code not in (client.BUSY, client.UNAVAILABLE)):
+        passing = not strict and code in (client.BUSY, client.UNAVAILABLE)
+        if code != (client.OK if good else client.REFUSED) and not passing:
             faults.append(f"{dn} {password!r}: {code}")
     results.put((answers, faults[:5]))
 
@@ -416,8 +418,8 @@ def compare_rates(trials, folder, keys, rounds):
         ratios = [mine / theirs for mine, theirs in zip(by_scheme[scheme], by_scheme["ssha"])]
         cost = used[scheme] / sum(by_scheme[scheme]) / (used["ssha"] / sum(by_scheme["ssha"]))
         quartiles = statistics.quantiles(ratios, n=4)
-        print(f"   {scheme}: {statistics.median(ratios):.3f} of the binds a second of {{SSHA}} (half of the rounds from "
-              f"{quartiles[0]:.3f} to {quartiles[2]:.3f}), {cost:.3f} of its processor time a bind")
+        print(f"   {scheme}: {statistics.median(ratios):.3f} of the binds a second of {{SSHA}} (half of the rounds "
+              f"from {quartiles[0]:.3f} to {quartiles[2]:.3f}), {cost:.3f} of its processor time a bind")
 
 
 def trials_of_slapd(trials, folder, keys, short):
