@@ -254,7 +254,7 @@ TEST(SlapdDeathTest, ServesWhatItsArgumentsSay) {
 // ---- 389 ----
 
 #ifdef LDAPPW_389_PLUGIN
-constexpr int kArgv = 6, kArgc = 7, kEncode = 800, kCompare = 802, kName = 810;  // of slapi-plugin.h
+constexpr int kArgv = 6, kArgc = 7, kClose = 210, kEncode = 800, kCompare = 802, kName = 810;  // of slapi-plugin.h
 std::map<int, void*> block;
 
 [[noreturn]] void run389(const char* entry, std::vector<std::string> arguments) {
@@ -270,6 +270,8 @@ std::map<int, void*> block;
   const char* payload = value == nullptr ? "horse" : std::strchr(value, '}') + 1;
   std::fprintf(stderr, "[%s %s %d %d]\n", name, value == nullptr ? "none" : std::string(value, 6).c_str(),
                compare("horse", payload), compare(payload, payload));
+  reinterpret_cast<int (*)(void*)>(block[kClose])(&block);
+  std::free(value);
   std::exit(0);
 }
 
