@@ -134,6 +134,16 @@ TEST(Passwords, WhatASchemeHolds) {
       EXPECT_TRUE(matches(scheme, payload, row.password)) << scheme.tag;
     }
   }
+  // A masked text without its terminator, or with one inside, is damaged.
+  void* handle = dlopen("libldappw.so.1", RTLD_NOW | RTLD_LOCAL);
+  const auto mask =
+      reinterpret_cast<decltype(&_morva_utils_encode_binary)>(dlsym(handle, "_morva_utils_encode_binary"));
+  for (const std::string& bytes : {std::string("cow"), std::string("cow\0x\0", 6), std::string("cow\0", 4)}) {
+    char* payload = nullptr;
+    ASSERT_EQ(mask(reinterpret_cast<const unsigned char*>(bytes.data()), static_cast<int>(bytes.size()), &payload), 0);
+    EXPECT_EQ(matches(kSchemes[plugin::kQveil], payload, "cow"), bytes.size() == 4);
+    std::free(payload);
+  }
   // A value that was cut when it was made keeps its password.
   const std::string cut = make(kSchemes[plugin::kQveil], std::string(46, 'q'), nullptr).substr(7);
   EXPECT_TRUE(matches(kSchemes[plugin::kQveil], cut, std::string(60, 'q')));
@@ -155,6 +165,7 @@ TEST(KeyFile, WhatTheLogSays) {
       {good, 0640, "", ": open to other users (mode 0640); its mode should be 0600"},
       {"", 0600, ": the file is empty", ""},
       {good.substr(0, good.size() - 1), 0600, ": not a whole key stash file", ""},
+      {std::string(4, '\0') + good.substr(good.size() - 84), 0600, ": not a whole key stash file", ""},
       {with(0, "\xff\xff\xff\xff"), 0600, ": not a whole key stash file", ""},
       {with(5, "\x80"), 0600, ": not a whole key stash file", ""},                        // the sync text
       {with(good.size() - 84, " "), 0600, ": not a whole key stash file", ""},            // the salt

@@ -16,8 +16,7 @@ namespace plugin {
 namespace {
 
 constexpr char kDamaged[] = "not a whole key stash file";
-constexpr int kSaltType = 1;            // of validateCryptoString
-constexpr off_t kBytesBesideSync = 88;  // of a stash file
+constexpr int kSaltType = 1;  // of validateCryptoString
 constexpr mode_t kOthers = S_IRWXG | S_IRWXO;
 
 class Descriptor {
@@ -35,17 +34,6 @@ class Descriptor {
   int fd_;
 };
 
-// The library believes the length that the file states, and makes room for it.
-bool holdsItsSync(int fd, off_t size) noexcept {
-  unsigned char length[4];
-  if (size <= kBytesBesideSync || pread(fd, length, sizeof length, 0) != static_cast<ssize_t>(sizeof length)) {
-    return false;
-  }
-  off_t stated = 0;
-  for (size_t i = sizeof length; i-- > 0;) stated = stated << 8U | off_t{length[i]};
-  return stated > 0 && stated <= size - kBytesBesideSync;
-}
-
 // Why the file cannot be loaded, or null.
 const char* fileProblem(const char* path, KeyReport& report) noexcept {
   const Descriptor file(path);
@@ -54,7 +42,6 @@ const char* fileProblem(const char* path, KeyReport& report) noexcept {
   if (S_ISDIR(found.st_mode)) return std::strerror(EISDIR);
   if (!S_ISREG(found.st_mode)) return "not a regular file";
   if (found.st_size == 0) return "the file is empty";
-  if (!holdsItsSync(file.get(), found.st_size)) return kDamaged;
   if ((found.st_mode & kOthers) != 0) {
     std::snprintf(report.warning, sizeof report.warning,
                   "key file %s: open to other users (mode %04o); its mode should be 0600", path,
@@ -68,7 +55,8 @@ const char* fileProblem(const char* path, KeyReport& report) noexcept {
 bool looksWhole(const Library& library, const AesKeyData& keys) noexcept {
   const auto* sync = reinterpret_cast<const char*>(keys.cryptoSync.data);
   const auto* salt = reinterpret_cast<const char*>(keys.cryptoSalt.data);
-  if (sync == nullptr || salt == nullptr || library.validateText(salt, kSaltType) != LDAPPW_SUCCESS) {
+  if (sync == nullptr || keys.cryptoSync.length == 0 || salt == nullptr ||
+      library.validateText(salt, kSaltType) != LDAPPW_SUCCESS) {
     return false;
   }
   for (uint32_t i = 0; i < keys.cryptoSync.length; ++i) {

@@ -47,6 +47,7 @@ bool drawSalt(char (&salt)[3]) noexcept {
 
 bool matches(const Scheme& scheme, const Check& check) noexcept {
   if (clearProblem(scheme, check.keys, check.presented) != nullptr) return false;
+  // The library takes a tag with nothing behind it for a clear text.
   if (check.payload.empty() || check.payload.size() > kLongest || holdsNul(check.payload)) return false;
   return scheme.matches(scheme, check);
 }
