@@ -223,7 +223,9 @@ berval bervalOf(std::string& text) {
         std::fprintf(stderr, "[%s cannot be made %d]\n", row.name->bv_val,
                      row.check(row.name, &clear, &clear, nullptr));
       } else if (row.hash(row.name, &clear, &value, &text) != 0) {
-        std::fprintf(stderr, "[%s: %s]\n", row.name->bv_val, text);
+        std::string known = make(*plugin::findScheme(row.name->bv_val), password, keys().data).substr(row.name->bv_len);
+        const berval payload = bervalOf(known);
+        std::fprintf(stderr, "[%s: %s %d]\n", row.name->bv_val, text, row.check(row.name, &payload, &clear, nullptr));
       } else {
         const berval payload{value.bv_len - row.name->bv_len, value.bv_val + row.name->bv_len};
         std::fprintf(stderr, "[%s %d %d]\n", row.name->bv_val, row.check(row.name, &payload, &clear, nullptr),
@@ -249,10 +251,14 @@ TEST(SlapdDeathTest, ServesWhatItsArgumentsSay) {
     const char* said;
   } rows[] = {
       {{file}, 0, "\\[.qVEIL. 0 -1\\](.|\n)*\\[.AES256. 0 -1\\](.|\n)*\\[.VLDL. cannot be made -1\\]"},
-      {{file, "schemes=SSHA,{crypt},md5,sha"}, 0, "\\[.AES256.: this scheme is not served\\](.|\n)*\\[.SSHA. 0 -1\\]"},
+      {{file, "schemes=SSHA,{crypt},md5,sha"},
+       0,
+       "\\[.qVEIL.: this scheme is not served -1\\](.|\n)*\\[.SSHA. 0 -1\\]"},
       {{"keys=/"},
        0,
-       "file /: Is a directory; no value of .*(.|\n)*\\[.qVEIL. 0 -1\\](.|\n)*.AES128.: the server has no"},
+       "file /: Is a directory; no value of .*(.|\n)*\\[.qVEIL. 0 -1\\](.|\n)*.AES128.: the server has no keys for "
+       "this "
+       "scheme -1\\]"},
       {{"keys="}, 0, "file : No such file or directory; no value of"},
       {{"schemes=qveil,"}, 0, "\\[.qVEIL. 0 -1\\]"},
       {{"schemes="}, 1, "unknown scheme \"\" in schemes="},

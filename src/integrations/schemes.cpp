@@ -69,6 +69,14 @@ bool matchesDigest(const Scheme& scheme, const Check& check) noexcept {
                                       static_cast<int>(value.size()), 1, nullptr) == 0;
 }
 
+// The library takes any byte for salt, and some outside the alphabet mean the same as one inside.
+bool matchesCrypt(const Scheme& scheme, const Check& check) noexcept {
+  for (const char c : check.payload) {
+    if (c != '.' && (c == '+' || !isAlphabetic(c))) return false;
+  }
+  return matchesDigest(scheme, check);
+}
+
 // The library reads a salted text without its padding as well: one that was cut short.
 bool matchesSalted(const Scheme& scheme, const Check& check) noexcept {
   return check.payload.size() % 4 == 0 && matchesDigest(scheme, check);
@@ -88,7 +96,7 @@ const Scheme kSchemes[kSchemeCount] = {
     {"aes192", "{AES192}", FORMAT_AES192,  1, true,  0,            true,  false, matchesEnciphered},
     {"aes256", "{AES256}", FORMAT_AES256,  2, true,  0,            true,  false, matchesEnciphered},
     {"vldl",   "{VLDL}",   FORMAT_VLDL,   -1, true,  0,            false, false, nullptr},
-    {"crypt",  "{crypt}",  FORMAT_CRYPT,  -1, false, 8,            false, false, matchesDigest},
+    {"crypt",  "{crypt}",  FORMAT_CRYPT,  -1, false, 8,            false, false, matchesCrypt},
     {"sha",    "{SHA}",    FORMAT_SHA,    -1, false, 0,            false, true,  matchesDigest},
     {"ssha",   "{SSHA}",   FORMAT_SSHA,   -1, false, 0,            false, false, matchesSalted},
     {"md5",    "{MD5}",    FORMAT_MD5,    -1, false, 0,            false, false, matchesDigest},
