@@ -1,124 +1,151 @@
 // SPDX-License-Identifier: Apache-2.0
-// Provider contexts: making, checking and releasing them, their values and their last failures.
+// Provider contexts, their values and failures, and their random bytes.
+#include <openssl/crypto.h>
+#include <openssl/err.h>
+#include <openssl/rand.h>
+#include <sched.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdio>
 #include <cstring>
-#include <new>
-#include <utility>
+#include <iterator>
 
-#include "algorithms.h"
+#include "call.h"
 
-namespace qel {
+using namespace qel;
+
+Refusal Call::record(Handle owner, QelStatus* status, QelReason reason, const char* text, bool isOpenssls) noexcept {
+  QelStatus failure{1, reason, ""};
+  // What was raised last. Earlier errors in the queue may be left from somebody else's work.
+  const unsigned long error = isOpenssls ? ERR_peek_last_error() : 0;
+  const char* why = error == 0 ? nullptr : ERR_reason_error_string(error);
+  if (ERR_GET_REASON(error) == ERR_R_MALLOC_FAILURE) failure.minRC = QEL_REASON_OUT_OF_MEMORY;
+  std::snprintf(failure.desc, sizeof failure.desc, why == nullptr ? "%s" : "%s: %s", text, why);
+  ERR_clear_error();
+  if (Room* own = findContext(owner) == nullptr ? nullptr : ownRoom()) {
+    own->failureOwner = owner;
+    own->failure = failure;
+  }
+  if (status != nullptr) *status = failure;
+  return {};
+}
+
 namespace {
 
-QEL_CTX* failInit(QelStatus* status, QelReason reason, const char* text, Source source = Source::kProvider) noexcept {
-  recordFailure(0, status, reason, source, text);
-  return nullptr;
-}
-
-int setPath(const Call& call, ProviderContext& provider, const char* path) noexcept {
-  const std::size_t bytes = strnlen(path, kPathBytes) + 1;
-  if (bytes > kPathBytes) return call.fail(QEL_REASON_PATH_TOO_LONG, "the load path is longer than 4095 bytes");
-  std::lock_guard<std::mutex> lock{provider.mutex};
-  std::memcpy(provider.path, path, bytes);
-  return call.succeed();
-}
-
-int setStrict(const Call& call, ProviderContext& provider, const char* value) noexcept {
-  const bool on = std::strcmp(value, "on") == 0;
-  if (!on && std::strcmp(value, "off") != 0) return call.fail(QEL_REASON_BAD_VALUE, "the value is neither on nor off");
-  provider.strict.store(on, std::memory_order_relaxed);
-  return call.succeed();
-}
-
-int copyText(const Call& call, const char* text, char* buffer, int size) noexcept {
-  const std::size_t bytes = std::strlen(text) + 1;
-  if (size < 0) return call.fail(QEL_REASON_BAD_LENGTH, "the buffer size is negative");
-  if (static_cast<std::size_t>(size) < bytes) {
-    return call.fail(QEL_REASON_BUFFER_TOO_SMALL, "the buffer is too small for the value");
+// The lock over provider contexts and their values. A fork cannot leave it taken: the child takes it over.
+struct Lock {
+  Lock() noexcept {
+    const pid_t self = getpid();
+    for (pid_t other = 0; !holder.compare_exchange_weak(other, self);) other = other == self ? sched_yield() : other;
   }
-  std::memcpy(buffer, text, bytes);
+  ~Lock() { holder.store(0); }
+  static inline std::atomic<pid_t> holder{0};
+};
+
+// Under the lock, for a provider context that is live or about to be.
+int setValue(const Call& call, Context& context, int id, const char* value) noexcept {
+  if (id < QEL_VALUE_STRICT || id > QEL_VALUE_LOAD_PATH) return call.fail(QEL_REASON_BAD_VALUE_ID, "no such value");
+  if (value == nullptr) return call.fail(QEL_REASON_NULL_ARGUMENT, "the value is null");
+  const std::size_t bytes = strnlen(value, sizeof context.values[id]) + 1;
+  if (bytes > sizeof context.values[id]) return call.fail(QEL_REASON_PATH_TOO_LONG, "the value is too long");
+  const bool isOn = std::strcmp(value, "on") == 0;
+  if (id == QEL_VALUE_STRICT && !isOn && std::strcmp(value, "off") != 0) {
+    return call.fail(QEL_REASON_BAD_VALUE, "the value is neither on nor off");
+  }
+  if (id == QEL_VALUE_STRICT) context.isStrict.store(isOn, std::memory_order_relaxed);
+  std::memcpy(context.values[id], value, bytes);
   return call.succeed();
+}
+
+// Has OpenSSL's generators work on the buffer. They must not be asked once the host has ended OpenSSL, nor when memory
+// ran out while OpenSSL made its default library context. A cancellation is held back: OpenSSL would leave locks taken.
+template <typename Work>
+int useGenerators(const Call& call, const void* buffer, int count, Work work) noexcept {
+  if (call.context() == nullptr) return 0;
+  if (count < 0) return call.fail(QEL_REASON_BAD_LENGTH, "the count is negative");
+  if (buffer == nullptr && count > 0) return call.fail(QEL_REASON_NULL_ARGUMENT, "the buffer is null");
+  int cancellation = PTHREAD_CANCEL_ENABLE;
+  pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &cancellation);
+  const bool isThere = OPENSSL_init_crypto(0, nullptr) == 1 && OSSL_LIB_CTX_get0_global_default() != nullptr;
+  const bool works = count == 0 || (isThere && work() == 1);
+  pthread_setcancelstate(cancellation, nullptr);
+  if (works) return call.succeed();
+  return call.failOpenssl(QEL_REASON_RANDOM_FAILURE, "the random generator failed");
 }
 
 }  // namespace
-}  // namespace qel
-
-using qel::Call;
-using qel::ProviderContext;
-using qel::providers;
 
 extern "C" {
 
 int QEL_GetStatus(QEL_CTX* ctx, QelStatus* status) noexcept {
   const Call call{ctx, status};
-  if (call.open() == nullptr) return 0;
-  if (status == nullptr) return call.failNull("the status record is null");
-  qel::lastFailure(call.handle(), *status);
+  if (call.context() == nullptr) return 0;
+  if (status == nullptr) return call.fail(QEL_REASON_NULL_ARGUMENT, "the status record is null");
+  const Room* own = ownRoom();
+  *status = own != nullptr && own->failureOwner == valueOf(ctx) ? own->failure : QelStatus{};
   return 1;
 }
 
 int QEL_SetValue(QEL_CTX* ctx, QelStatus* status, int id, const char* value) noexcept {
   const Call call{ctx, status};
-  const qel::ProviderPool::Slot* slot = call.open();
-  if (slot == nullptr) return 0;
-  if (id != QEL_VALUE_STRICT && id != QEL_VALUE_LOAD_PATH) {
-    return call.fail(QEL_REASON_BAD_VALUE_ID, "there is no value with this id");
-  }
-  if (value == nullptr) return call.failNull("the value is null");
-  ProviderContext& provider = *slot->value.context;
-  return id == QEL_VALUE_STRICT ? qel::setStrict(call, provider, value) : qel::setPath(call, provider, value);
+  const Lock lock;
+  Context* context = call.context();
+  return context == nullptr ? 0 : setValue(call, *context, id, value);
 }
 
 int QEL_GetValue(QEL_CTX* ctx, QelStatus* status, int id, char* buffer, int size) noexcept {
   const Call call{ctx, status};
-  const qel::ProviderPool::Slot* slot = call.open();
-  if (slot == nullptr) return 0;
-  if (id != QEL_VALUE_STRICT && id != QEL_VALUE_LOAD_PATH) {
-    return call.fail(QEL_REASON_BAD_VALUE_ID, "there is no value with this id");
-  }
-  if (buffer == nullptr) return call.failNull("the buffer is null");
-  ProviderContext& provider = *slot->value.context;
-  if (id == QEL_VALUE_STRICT) return qel::copyText(call, provider.strict ? "on" : "off", buffer, size);
-  std::lock_guard<std::mutex> lock{provider.mutex};
-  return qel::copyText(call, provider.path, buffer, size);
+  Context* context = call.context();
+  if (context == nullptr) return 0;
+  if (id < QEL_VALUE_STRICT || id > QEL_VALUE_LOAD_PATH) return call.fail(QEL_REASON_BAD_VALUE_ID, "no such value");
+  if (buffer == nullptr) return call.fail(QEL_REASON_NULL_ARGUMENT, "the buffer is null");
+  const Lock lock;
+  const int bytes = static_cast<int>(std::strlen(context->values[id])) + 1;
+  if (size < bytes) return call.fail(QEL_REASON_BUFFER_TOO_SMALL, "the value is longer");
+  std::memcpy(buffer, context->values[id], static_cast<std::size_t>(bytes));
+  return call.succeed();
 }
 
 QEL_CTX* QEL_Init(QelStatus* status, const char* path) noexcept {
-  const std::size_t pathBytes = path == nullptr ? 0 : strnlen(path, qel::kPathBytes) + 1;
-  if (pathBytes > qel::kPathBytes) {
-    return qel::failInit(status, QEL_REASON_PATH_TOO_LONG, "the load path is longer than 4095 bytes");
-  }
-  std::unique_ptr<ProviderContext> context{new (std::nothrow) ProviderContext};
-  if (context == nullptr) return qel::failInit(status, QEL_REASON_OUT_OF_MEMORY, "no memory for a provider context");
-  if (!context->libraries[0].open()) {
-    return qel::failInit(status, QEL_REASON_NOT_AVAILABLE, "OpenSSL's default provider cannot be loaded",
-                         qel::Source::kOpenssl);
-  }
-  if (path != nullptr) std::memcpy(context->path, path, pathBytes);
-  qel::ProviderPool::Slot* slot = providers.take(qel::currentLane());
-  if (slot == nullptr) return qel::failInit(status, QEL_REASON_OUT_OF_MEMORY, "no memory for a provider context");
-  slot->value.context = std::move(context);
-  qel::clearStatus(status);
-  return qel::handleOf<QEL_CTX>(providers.publish(*slot, 0));
+  const Call call{nullptr, status};
+  const Lock lock;
+  if (!startOpenssl()) return call.failOpenssl(QEL_REASON_NOT_AVAILABLE, "OpenSSL's default provider cannot be loaded");
+  Context* end = std::end(contexts);
+  Context* context = std::find_if(contexts, end, [](const Context& each) { return each.isIdle(); });
+  if (context == end) return call.fail(QEL_REASON_OUT_OF_MEMORY, "there are too many provider contexts");
+  if (setValue(call, *context, QEL_VALUE_LOAD_PATH, path == nullptr ? "" : path) == 0) return nullptr;
+  setValue(call, *context, QEL_VALUE_STRICT, "on");
+  const auto place = static_cast<std::size_t>(context - contexts) << kIndexBits;
+  if (context->next == 0) context->next = firstHandle(kContextKind, place);
+  return static_cast<QEL_CTX*>(context->publish());
 }
 
 int QEL_Attach(QEL_CTX* ctx, QelStatus* status) noexcept {
   const Call call{ctx, status};
-  const qel::ProviderPool::Slot* slot = call.open();
-  if (slot == nullptr) return 0;
-  if (OSSL_PROVIDER_available(slot->value.context->libraries[0].context.get(), "default") != 1) {
-    return call.failOpenssl(QEL_REASON_NOT_AVAILABLE, "the default provider is not active");
-  }
-  const bool ready = qel::findDigest(call, "SHA1") != nullptr && qel::findCipher(call, "AES-128-ECB") != nullptr;
-  return ready ? call.succeed() : 0;
+  if (call.context() == nullptr) return 0;
+  if (findAlgorithm(kDigest, "SHA1") && findAlgorithm(kCipher, "AES-128-ECB")) return call.succeed();
+  return call.fail(QEL_REASON_NOT_AVAILABLE, "there is no SHA1 or no AES-128-ECB");
 }
 
 int QEL_Cleanup(QEL_CTX* ctx, QelStatus* status) noexcept {
   const Call call{ctx, status};
-  qel::ProviderPool::Slot* slot = call.open();
-  if (slot == nullptr) return 0;
-  if (!providers.retire(*slot, call.handle())) return call.fail(QEL_REASON_FOREIGN_HANDLE, Call::kForeignContext);
-  qel::releaseProvider(*slot, call.handle());
+  const Lock lock;
+  Context* context = call.context();
+  if (context == nullptr) return 0;
+  context->retire();
+  freeOwn(false);
   return call.succeed();
+}
+
+int QEL_RAND_bytes(QEL_CTX* ctx, unsigned char* buffer, int count) noexcept {
+  return useGenerators(Call{ctx}, buffer, count, [=] { return RAND_bytes(buffer, count); });
+}
+int QEL_RAND_seed(QEL_CTX* ctx, const void* data, int length) noexcept {
+  return useGenerators(Call{ctx}, data, length, [=] { return RAND_seed(data, length), RAND_status(); });
+}
+int QEL_GenerateRandomSeed(QEL_CTX* ctx, QelStatus* status, unsigned char* buffer, int count) noexcept {
+  return useGenerators(Call{ctx, status}, buffer, count, [=] { return RAND_priv_bytes(buffer, count); });
 }
 
 }  // extern "C"

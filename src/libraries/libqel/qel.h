@@ -8,23 +8,26 @@
  *  2. A handle is a token, not an address. Each entry checks every handle it is given: null, a handle of another kind
  *     or of another provider context, one already released, and any other value whatever are failures. A released
  *     token does not come back to life when its place is used again (with 32-bit pointers: not before 4096 uses).
- *  3. A failure is remembered for the calling thread and the provider context, QEL_GetStatus tells the last one, and a
- *     success leaves it as it is. A thread remembers the last failure of each of the eight provider contexts that it
- *     failed with most recently. Nothing is remembered for a provider context that is not valid.
- *  4. An entry with a QelStatus argument also fills that record: the failure, or all zero after a success. It may be
- *     null. OpenSSL's error queue of the thread is empty after a failure.
- *  5. A provider context and the algorithms found through it may be used from many threads at once. A digest or cipher
- *     context belongs to one thread at a time. QEL_Cleanup comes after every other use of its context.
- *  6. Lengths and sizes are in bytes; a negative one is a failure. A null buffer with a length of 0 is fine unless the
+ *  3. A thread remembers its last failure, unless the provider context was not valid; a success leaves it as it is. An
+ *     entry with a QelStatus argument also fills that record, which may be null: with the failure, or with zeros.
+ *     OpenSSL's error queue of the thread is empty after a failure.
+ *  4. A provider context and its algorithms may be used from many threads at once. A digest or cipher context belongs
+ *     to one thread at a time, the one that made or started it last, and is released with a wipe when that ends.
+ *  5. Lengths and sizes are in bytes; a negative one is a failure. A null buffer with a length of 0 is fine unless the
  *     entry says otherwise. Texts are NUL-terminated.
+ *  6. The library stays in the process once it is loaded, as libcrypto does. So a thread that is inside when the host
+ *     closes it or exits comes to its end there, and one that comes after QEL_Cleanup is refused. Where this library
+ *     started OpenSSL, OpenSSL works until the process ends. Where the host did, its exit handler may end OpenSSL:
+ *     random bytes are refused from then on, and a thread that is drawing some is the host's to see to; digests and
+ *     ciphers go on.
+ *  7. Memory that runs out is a failure, and the call may be tried again. But OpenSSL starts once in a process: where
+ *     memory ran out in that, QEL_Init or the entries for random bytes fail for good.
+ *  8. The child of a fork may go on with what the thread had that forked.
  */
-#ifndef QEL_QEL_H
-#define QEL_QEL_H
+#pragma once
 
-#include <stddef.h>
+#include <assert.h>
 #include <stdint.h>
-
-#define QEL_API __attribute__((visibility("default")))
 
 #ifdef __cplusplus
 #define QEL_NOEXCEPT noexcept
@@ -32,6 +35,7 @@ extern "C" {
 #else
 #define QEL_NOEXCEPT
 #endif
+#pragma GCC visibility push(default)
 
 typedef struct QelContextHandle QEL_CTX;
 typedef struct QelCipherHandle QEL_CIPHER;
@@ -44,12 +48,7 @@ typedef struct QelStatus {
   int32_t minRC;  /* a QelReason; 0 after a success */
   char desc[260]; /* the failure in words, with OpenSSL's reason where there is one; empty after a success */
 } QelStatus;
-
-#ifdef __cplusplus
 static_assert(sizeof(QelStatus) == 268, "the layout is exchanged with callers");
-#else
-_Static_assert(sizeof(QelStatus) == 268, "the layout is exchanged with callers");
-#endif
 
 enum QelReason {
   QEL_REASON_UNSPECIFIED = 0,
@@ -66,7 +65,7 @@ enum QelReason {
   QEL_REASON_CIPHER_FAILURE = 11, /* wrong padding and incomplete blocks among them */
   QEL_REASON_RANDOM_FAILURE = 12,
   QEL_REASON_NOT_AVAILABLE = 13, /* OpenSSL or its default provider cannot be used */
-  QEL_REASON_OUT_OF_MEMORY = 15
+  QEL_REASON_OUT_OF_MEMORY = 15  /* also: 512 provider contexts, or 131072 digest or cipher contexts, are live */
 };
 
 /* The ids of QEL_SetValue and QEL_GetValue. */
@@ -77,74 +76,65 @@ enum QelValueId {
 };
 
 /*
- * treskqels_path tells where this library was loaded from: the absolute path of the directory that holds qellib/, as
- * the loader knows it (symbolic links are not resolved), without a slash at its end.
+ * Copies the absolute path of the directory that holds qellib/ with this library, as the loader knew it (symbolic links
+ * are not resolved), without a slash at its end. A path of PATH_MAX bytes or more is a failure. Needs no provider
+ * context.
  *
  *   buffer  out  the path; untouched after a failure
  *   size    in   bytes of buffer, the NUL included
- *
- * Returns 1; 0 for a null buffer or a size that is too small. Needs no provider context. Any thread.
  */
-QEL_API int treskqels_path(char* buffer, int size) QEL_NOEXCEPT;
+int treskqels_path(char* buffer, int size) QEL_NOEXCEPT;
 
 /* ---- Provider contexts ---- */
 
-/* Copies the last failure of the calling thread with ctx into *status, all zero when there was none. A null status is a
+/* Copies the last failure of the calling thread into *status when it was with ctx, else zeros. A null status is a
  * failure here. */
-QEL_API int QEL_GetStatus(QEL_CTX* ctx, QelStatus* status) QEL_NOEXCEPT;
+int QEL_GetStatus(QEL_CTX* ctx, QelStatus* status) QEL_NOEXCEPT;
 
-/* Sets one of the values of QelValueId to a copy of the text; after a failure the old text stands. */
-QEL_API int QEL_SetValue(QEL_CTX* ctx, QelStatus* status, int id, const char* value) QEL_NOEXCEPT;
-
-/* Copies the text of a value with its NUL into buffer of size bytes; after a failure the buffer is untouched. */
-QEL_API int QEL_GetValue(QEL_CTX* ctx, QelStatus* status, int id, char* buffer, int size) QEL_NOEXCEPT;
+/* Set one of the values of QelValueId to a copy of the text, and copy the text of one with its NUL into a buffer of
+ * size bytes. After a failure the old text stands, and the buffer is untouched. */
+int QEL_SetValue(QEL_CTX* ctx, QelStatus* status, int id, const char* value) QEL_NOEXCEPT;
+int QEL_GetValue(QEL_CTX* ctx, QelStatus* status, int id, char* buffer, int size) QEL_NOEXCEPT;
 
 /* Makes a provider context; the caller releases it with QEL_Cleanup. path may be null, which is the empty path. */
-QEL_API QEL_CTX* QEL_Init(QelStatus* status, const char* path) QEL_NOEXCEPT;
+QEL_CTX* QEL_Init(QelStatus* status, const char* path) QEL_NOEXCEPT;
 
-/* Checks that the context is ready: the default provider is active, SHA1 and AES-128-ECB can be had. Other entries do
- * not depend on it. May be repeated. */
-QEL_API int QEL_Attach(QEL_CTX* ctx, QelStatus* status) QEL_NOEXCEPT;
+/* Checks that SHA1 and AES-128-ECB can be had. Other entries do not depend on it. May be repeated. */
+int QEL_Attach(QEL_CTX* ctx, QelStatus* status) QEL_NOEXCEPT;
 
-/* Releases the provider context with its algorithms and all digest and cipher contexts that are still live in it,
- * wiped. */
-QEL_API int QEL_Cleanup(QEL_CTX* ctx, QelStatus* status) QEL_NOEXCEPT;
+/* Releases the provider context, and wipes and releases the digest and cipher contexts in it. Those that belong to
+ * another thread are refused from now on, and go when that thread ends or needs their places. */
+int QEL_Cleanup(QEL_CTX* ctx, QelStatus* status) QEL_NOEXCEPT;
 
 /* ---- Algorithms ---- */
 
 /* Find an algorithm by any name that OpenSSL's default provider has for it, in either case ("SHA1", "sha-1",
- * "AES-128-ECB"). It is fetched once for the provider context, every name of it gives the same handle, and the handle
- * stays valid until QEL_Cleanup; it is never released by itself. */
-QEL_API const QEL_CIPHER* QEL_EVP_get_cipherbyname(QEL_CTX* ctx, const char* name) QEL_NOEXCEPT;
-QEL_API const QEL_DIGEST* QEL_EVP_get_digestbyname(QEL_CTX* ctx, const char* name) QEL_NOEXCEPT;
+ * "AES-128-ECB"). Every name of it gives the same handle, which is valid until QEL_Cleanup and never released by
+ * itself. Ciphers are those that work in pieces of any size and give everything back with padding on; the others are
+ * not found: authenticated ones (GCM, CCM, OCB, SIV, Poly1305, CBC with HMAC), key wraps, XTS, and CBC-CTS. */
+const QEL_CIPHER* QEL_EVP_get_cipherbyname(QEL_CTX* ctx, const char* name) QEL_NOEXCEPT;
+const QEL_DIGEST* QEL_EVP_get_digestbyname(QEL_CTX* ctx, const char* name) QEL_NOEXCEPT;
 
-/* Sizes in bytes; 0 after a failure. */
-QEL_API int QEL_EVP_MD_block_size(QEL_CTX* ctx, const QEL_DIGEST* digest) QEL_NOEXCEPT;
-QEL_API int QEL_EVP_MD_size(QEL_CTX* ctx, const QEL_DIGEST* digest) QEL_NOEXCEPT;
-
-/* Sizes in bytes; 0 after a failure. An initial vector of 0 bytes is also what a cipher without one has, ECB say. */
-QEL_API int QEL_EVP_CIPHER_block_size(QEL_CTX* ctx, const QEL_CIPHER* cipher) QEL_NOEXCEPT;
-QEL_API int QEL_EVP_CIPHER_key_length(QEL_CTX* ctx, const QEL_CIPHER* cipher) QEL_NOEXCEPT;
-QEL_API int QEL_EVP_CIPHER_iv_length(QEL_CTX* ctx, const QEL_CIPHER* cipher) QEL_NOEXCEPT;
+/* Sizes in bytes; 0 after a failure. A cipher without an initial vector, as in ECB mode, has one of 0 bytes. */
+int QEL_EVP_MD_block_size(QEL_CTX* ctx, const QEL_DIGEST* digest) QEL_NOEXCEPT;
+int QEL_EVP_MD_size(QEL_CTX* ctx, const QEL_DIGEST* digest) QEL_NOEXCEPT;
+int QEL_EVP_CIPHER_block_size(QEL_CTX* ctx, const QEL_CIPHER* cipher) QEL_NOEXCEPT;
+int QEL_EVP_CIPHER_key_length(QEL_CTX* ctx, const QEL_CIPHER* cipher) QEL_NOEXCEPT;
+int QEL_EVP_CIPHER_iv_length(QEL_CTX* ctx, const QEL_CIPHER* cipher) QEL_NOEXCEPT;
 
 /* ---- Digests ---- */
 
-/* Makes a fresh digest context; the caller releases it with the free entry, at the latest QEL_Cleanup does. */
-QEL_API QEL_MD_CTX* QEL_EVP_MD_CTX_new(QEL_CTX* ctx) QEL_NOEXCEPT;
+/* Makes a fresh digest context; the caller releases it with the free entry, which wipes it. Init and cleanup both wipe
+ * it and make it as fresh as a new one. */
+QEL_MD_CTX* QEL_EVP_MD_CTX_new(QEL_CTX* ctx) QEL_NOEXCEPT;
+int QEL_EVP_MD_CTX_free(QEL_CTX* ctx, QEL_MD_CTX* digestCtx) QEL_NOEXCEPT;
+int QEL_EVP_MD_CTX_init(QEL_CTX* ctx, QEL_MD_CTX* digestCtx) QEL_NOEXCEPT;
+int QEL_EVP_MD_CTX_cleanup(QEL_CTX* ctx, QEL_MD_CTX* digestCtx) QEL_NOEXCEPT;
 
-/* Wipes the context and releases it. */
-QEL_API int QEL_EVP_MD_CTX_free(QEL_CTX* ctx, QEL_MD_CTX* digestCtx) QEL_NOEXCEPT;
-
-/* Both wipe the context and make it as fresh as a new one. */
-QEL_API int QEL_EVP_MD_CTX_init(QEL_CTX* ctx, QEL_MD_CTX* digestCtx) QEL_NOEXCEPT;
-QEL_API int QEL_EVP_MD_CTX_cleanup(QEL_CTX* ctx, QEL_MD_CTX* digestCtx) QEL_NOEXCEPT;
-
-/* Starts a digest, in whatever state the context is. */
-QEL_API int QEL_EVP_DigestInit(QEL_CTX* ctx, QEL_MD_CTX* digestCtx, const QEL_DIGEST* digest) QEL_NOEXCEPT;
-
-/* Adds length bytes; only between init and final. */
-QEL_API int QEL_EVP_DigestUpdate(QEL_CTX* ctx, QEL_MD_CTX* digestCtx, const void* data,
-                                 unsigned int length) QEL_NOEXCEPT;
+/* Start a digest, in whatever state the context is; add length bytes, only between init and final. After a failure of
+ * OpenSSL the context needs another init. */
+int QEL_EVP_DigestInit(QEL_CTX* ctx, QEL_MD_CTX* digestCtx, const QEL_DIGEST* digest) QEL_NOEXCEPT;
+int QEL_EVP_DigestUpdate(QEL_CTX* ctx, QEL_MD_CTX* digestCtx, const void* data, unsigned int length) QEL_NOEXCEPT;
 
 /*
  * Ends a digest; the next step is an init.
@@ -152,23 +142,22 @@ QEL_API int QEL_EVP_DigestUpdate(QEL_CTX* ctx, QEL_MD_CTX* digestCtx, const void
  *   out        out  QEL_EVP_MD_size bytes
  *   outLength  out  the number of bytes written, 0 after a failure; may be null
  */
-QEL_API int QEL_EVP_DigestFinal(QEL_CTX* ctx, QEL_MD_CTX* digestCtx, unsigned char* out,
-                                unsigned int* outLength) QEL_NOEXCEPT;
+int QEL_EVP_DigestFinal(QEL_CTX* ctx, QEL_MD_CTX* digestCtx, unsigned char* out, unsigned int* outLength) QEL_NOEXCEPT;
 
 /* ---- Ciphers ---- */
 
 /* As with digests. A fresh cipher context has padding on. */
-QEL_API QEL_CIPHER_CTX* QEL_EVP_CIPHER_CTX_new(QEL_CTX* ctx) QEL_NOEXCEPT;
-QEL_API int QEL_EVP_CIPHER_CTX_free(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx) QEL_NOEXCEPT;
-QEL_API int QEL_EVP_CIPHER_CTX_init(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx) QEL_NOEXCEPT;
-QEL_API int QEL_EVP_CIPHER_CTX_cleanup(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx) QEL_NOEXCEPT;
+QEL_CIPHER_CTX* QEL_EVP_CIPHER_CTX_new(QEL_CTX* ctx) QEL_NOEXCEPT;
+int QEL_EVP_CIPHER_CTX_free(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx) QEL_NOEXCEPT;
+int QEL_EVP_CIPHER_CTX_init(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx) QEL_NOEXCEPT;
+int QEL_EVP_CIPHER_CTX_cleanup(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx) QEL_NOEXCEPT;
 
 /* States the length of the keys to come, 1 to 64 bytes. The ciphers of the default provider have one length each, so
  * that a length other than the cipher's is refused: here when the context has a cipher, else by the next init. */
-QEL_API int QEL_EVP_CIPHER_CTX_set_key_length(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, int length) QEL_NOEXCEPT;
+int QEL_EVP_CIPHER_CTX_set_key_length(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, int length) QEL_NOEXCEPT;
 
 /* Padding on (not 0) or off (0), at once and for later inits, until the context is wiped. */
-QEL_API int QEL_EVP_CIPHER_CTX_set_padding(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, int padding) QEL_NOEXCEPT;
+int QEL_EVP_CIPHER_CTX_set_padding(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, int padding) QEL_NOEXCEPT;
 
 /*
  * Start encryption or decryption, in whatever state the context is. After a failure the context needs another init.
@@ -176,10 +165,10 @@ QEL_API int QEL_EVP_CIPHER_CTX_set_padding(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherC
  *   key  in  QEL_EVP_CIPHER_key_length bytes; not null
  *   iv   in  QEL_EVP_CIPHER_iv_length bytes; null only when that is 0
  */
-QEL_API int QEL_EVP_EncryptInit(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, const QEL_CIPHER* cipher,
-                                const unsigned char* key, const unsigned char* iv) QEL_NOEXCEPT;
-QEL_API int QEL_EVP_DecryptInit(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, const QEL_CIPHER* cipher,
-                                const unsigned char* key, const unsigned char* iv) QEL_NOEXCEPT;
+int QEL_EVP_EncryptInit(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, const QEL_CIPHER* cipher, const unsigned char* key,
+                        const unsigned char* iv) QEL_NOEXCEPT;
+int QEL_EVP_DecryptInit(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, const QEL_CIPHER* cipher, const unsigned char* key,
+                        const unsigned char* iv) QEL_NOEXCEPT;
 
 /*
  * Work on inLength more bytes, in the direction of the last init only.
@@ -187,33 +176,29 @@ QEL_API int QEL_EVP_DecryptInit(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, const Q
  *   out        out  room for inLength bytes and one block; not null; may be equal to in
  *   outLength  out  the number of bytes written, 0 after a failure; not null
  */
-QEL_API int QEL_EVP_EncryptUpdate(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char* out, int* outLength,
-                                  const unsigned char* in, int inLength) QEL_NOEXCEPT;
-QEL_API int QEL_EVP_DecryptUpdate(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char* out, int* outLength,
-                                  const unsigned char* in, int inLength) QEL_NOEXCEPT;
+int QEL_EVP_EncryptUpdate(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char* out, int* outLength,
+                          const unsigned char* in, int inLength) QEL_NOEXCEPT;
+int QEL_EVP_DecryptUpdate(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char* out, int* outLength,
+                          const unsigned char* in, int inLength) QEL_NOEXCEPT;
 
 /* Write the last block: at most one, outLength as above. Wrong padding and an incomplete block are failures. */
-QEL_API int QEL_EVP_EncryptFinal(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char* out,
-                                 int* outLength) QEL_NOEXCEPT;
-QEL_API int QEL_EVP_DecryptFinal(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char* out,
-                                 int* outLength) QEL_NOEXCEPT;
+int QEL_EVP_EncryptFinal(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char* out, int* outLength) QEL_NOEXCEPT;
+int QEL_EVP_DecryptFinal(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char* out, int* outLength) QEL_NOEXCEPT;
 
 /* The cipher of the last init; a failure without one. */
-QEL_API const QEL_CIPHER* QEL_EVP_CIPHER_CTX_cipher(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx) QEL_NOEXCEPT;
+const QEL_CIPHER* QEL_EVP_CIPHER_CTX_cipher(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx) QEL_NOEXCEPT;
 
 /* ---- Random bytes ---- */
 
-/* Fills count bytes from the thread's generator; after a failure their content is not to be used. */
-QEL_API int QEL_RAND_bytes(QEL_CTX* ctx, unsigned char* buffer, int count) QEL_NOEXCEPT;
+/* Fill count bytes from the thread's generators, the second from the one for private values; after a failure their
+ * content is not to be used. */
+int QEL_RAND_bytes(QEL_CTX* ctx, unsigned char* buffer, int count) QEL_NOEXCEPT;
+int QEL_GenerateRandomSeed(QEL_CTX* ctx, QelStatus* status, unsigned char* buffer, int count) QEL_NOEXCEPT;
 
 /* Mixes length bytes into the process's generators, in addition to the system's entropy. */
-QEL_API int QEL_RAND_seed(QEL_CTX* ctx, const void* data, int length) QEL_NOEXCEPT;
+int QEL_RAND_seed(QEL_CTX* ctx, const void* data, int length) QEL_NOEXCEPT;
 
-/* Fills count bytes of seed material from the generator for private values, which the system's entropy seeds. */
-QEL_API int QEL_GenerateRandomSeed(QEL_CTX* ctx, QelStatus* status, unsigned char* buffer, int count) QEL_NOEXCEPT;
-
+#pragma GCC visibility pop
 #ifdef __cplusplus
 }
-#endif
-
 #endif
