@@ -1,0 +1,207 @@
+// SPDX-License-Identifier: Apache-2.0
+// The built library in hosts that do what hosts do at the worst moment. Each case runs in a child process, in which
+// nothing has been used before, and has a minute.
+#include <dlfcn.h>
+#include <pthread.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <iterator>
+#include <thread>
+#include <vector>
+
+#include "crypto_provider.h"
+#include "ldtr.h"
+#include "password_schemes.h"
+
+namespace {
+
+#define CHECK(condition)                                                         \
+  do {                                                                           \
+    if (!(condition)) {                                                          \
+      std::fprintf(stderr, "line %d: %s does not hold\n", __LINE__, #condition); \
+      _exit(1);                                                                  \
+    }                                                                            \
+  } while (0)
+
+AesKeyData* newKeys() {
+  AesKeyData* keys = nullptr;
+  CHECK(initAesKeyData(&keys) == 0 && setCipherNameGlobal() == 0);
+  return keys;
+}
+
+AesKeyData* const keys = newKeys();
+
+void useEachScheme() {
+  char salt[] = "ab";
+  for (const int scheme : {FORMAT_SSHA, FORMAT_AES256, FORMAT_CRYPT, FORMAT_QVEIL, FORMAT_MD5, FORMAT_SHA}) {
+    char value[256];
+    const int length = format_password(scheme, salt, keys, "secret", 6, value, sizeof value);
+    CHECK(length > 0);
+    CHECK(verify_password("secret", 6, value, length, 1, keys) == 0);
+    CHECK(verify_password("Secret", 6, value, length, 1, keys) != 0);
+  }
+}
+
+// A thread with a cancellation pending makes the first use, writes and reads files and prints; nothing of it is cut off.
+void isCancelled() {
+  std::atomic<bool> done{false};
+  pthread_t thread;
+  const auto body = [](void* flag) -> void* {
+    pthread_cancel(pthread_self());
+    char* text = nullptr;
+    AesKeyData* loaded = nullptr;
+    QelStatus status{1, 1, ""};
+    trcEvents = 0x4011000;
+    useEachScheme();
+    CHECK(createKeyStashFiles("/dev/null", "/dev/null", "a-seed-of-characters", &text, nullptr) == 0);
+    CHECK(setAESKeyData("/dev/zero", &loaded) == 0 && qelStatusToLdap(nullptr, &status) == 1);
+    CHECK(compactToOnlyBase64("==") == nullptr && ldapLoadLib("/nowhere", 0) == nullptr);
+    trcEvents = 0;
+    freeAesKeyData(loaded);
+    std::free(text);
+    *static_cast<std::atomic<bool>*>(flag) = true;
+    pthread_testcancel();
+    return nullptr;
+  };
+  CHECK(freopen("/dev/null", "w", stderr) != nullptr && freopen("/dev/null", "w", stdout) != nullptr);
+  CHECK(pthread_create(&thread, nullptr, body, &done) == 0);
+  void* result = nullptr;
+  CHECK(pthread_join(thread, &result) == 0 && result == PTHREAD_CANCELED && done);
+}
+
+// A trace sink formats passwords itself, from inside the first use too.
+void tracesIntoItself() {
+  static int nested = 0;
+  const auto sink = [](const ldtr_record*, void*) {
+    if (nested++ == 0) useEachScheme();
+    --nested;
+  };
+  ldtr_set_sink(sink, nullptr);
+  trcEvents = 0x4011000;
+  useEachScheme();
+  trcEvents = 0;
+}
+
+void expectChildrenThatWork(int count) {
+  for (int i = 0; i < count; ++i) {
+    const pid_t child = fork();
+    if (child == 0) {
+      alarm(20);
+      useEachScheme();
+      _exit(0);
+    }
+    int status = -1;
+    CHECK(waitpid(child, &status, 0) == child && status == 0);
+    usleep(200);
+  }
+}
+
+// Other threads are in their first use, and later in the middle of everything, when the process forks.
+void forks() {
+  std::atomic<bool> stop{false};
+  std::vector<std::thread> threads;
+  for (int i = 0; i < 3; ++i) {
+    threads.emplace_back([&stop] {
+      while (!stop) useEachScheme();
+    });
+  }
+  threads.emplace_back([&stop] {
+    while (!stop) ldtr_set_sink(nullptr, nullptr);
+  });
+  expectChildrenThatWork(60);
+  stop = true;
+  for (std::thread& thread : threads) thread.join();
+}
+
+// The process exits while threads work. They may be refused, but nothing goes from under them.
+void exitsAmongThreads() {
+  for (int round = 0; round < 30; ++round) {
+    const pid_t child = fork();
+    if (child == 0) {
+      std::atomic<int> started{0};
+      for (int i = 0; i < 8; ++i) {
+        std::thread([&started] {
+          char value[64];
+          for (++started;;) format_password(FORMAT_SSHA, nullptr, nullptr, "secret", 6, value, sizeof value);
+        }).detach();
+      }
+      while (started < 8) usleep(100);
+      usleep(static_cast<useconds_t>(round) * 200);
+      std::exit(0);
+    }
+    int status = -1;
+    CHECK(waitpid(child, &status, 0) == child && status == 0);
+  }
+}
+
+// Handles of nowhere, before any provider is loaded.
+void asksTooEarly() {
+  char made_up = 0;
+  void* const handle = &made_up;
+  void* context = nullptr;
+  void* algorithm = nullptr;
+  unsigned char bytes[32] = {};
+  AesKeyData* made = nullptr;
+  QelStatus status{};
+  CHECK(initQelCipher(handle, &context, "AES-128-ECB", &algorithm) == 1 && context == nullptr);
+  CHECK(initQelDigest(handle, &context, "SHA1", &algorithm) == 1 && context == nullptr);
+  CHECK(freeQelCipher(handle, handle) == 1 && freeQelDigest(handle, handle) == 1);
+  CHECK(freeQelCrypto(handle) == 0 && qelStatusToLdap(handle, nullptr) == 0 && qelStatusToLdap(nullptr, &status) == 0);
+  CHECK(morva_rand_ascii(handle, bytes, sizeof bytes) == 1 && genKeySaltVal(handle, keys) == 1);
+  CHECK(morva_pbkdf2(handle, handle, handle, bytes, 4, bytes, 4, 2, bytes, 20) == 1);
+  CHECK(growKeysFromSeed(handle, handle, handle, "seed", keys) == 1);
+  CHECK(genKeySyncVal(handle, handle, handle, "seed", keys) == 1);
+  CHECK(genKeyDataVal(handle, handle, handle, nullptr, nullptr, &made) == 1 && made == nullptr);
+  unloadQelCrypto();
+}
+
+// What the loader has to report is still there for the host.
+void asksTheLoader() {
+  CHECK(ldapLoadLib("/nowhere/lib.so", 0) == nullptr);
+  const char* reason = dlerror();
+  CHECK(reason != nullptr && std::strstr(reason, "/nowhere/lib.so") != nullptr);
+  void** cell = ldapLoadLib("libm.so.6", 0);
+  CHECK(ldapGetSymAddress(cell, "no_such_symbol") == nullptr);
+  reason = dlerror();
+  CHECK(reason != nullptr && std::strstr(reason, "no_such_symbol") != nullptr);
+  CHECK(ldapUnloadLib(cell) == 0);
+}
+
+struct Host {
+  const char* name;
+  void (*run)();
+};
+
+constexpr Host kHosts[] = {
+    {"is cancelled", isCancelled},
+    {"traces into itself", tracesIntoItself},
+    {"forks", forks},
+    {"exits among threads", exitsAmongThreads},
+    {"asks too early", asksTooEarly},
+    {"asks the loader", asksTheLoader},
+};
+
+}  // namespace
+
+int main() {
+  int failed = 0;
+  for (const Host& host : kHosts) {
+    const pid_t child = fork();
+    if (child == 0) {
+      alarm(60);
+      host.run();
+      std::exit(0);
+    }
+    int status = -1;
+    waitpid(child, &status, 0);
+    if (status == 0) continue;
+    std::fprintf(stderr, "a host that %s: status %#x\n", host.name, static_cast<unsigned>(status));
+    failed = 1;
+  }
+  return failed;
+}
