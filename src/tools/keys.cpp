@@ -1,39 +1,36 @@
 // SPDX-License-Identifier: Apache-2.0
-// ldappw keys: the verb over the key verbs, what they share, and keys check.
+// ldappw keys: the verb over the key verbs, and what they share.
 #include "keys.h"
 
-#include <CLI/CLI.hpp>
-#include <memory>
+#include <sys/stat.h>
 
-#include "verbs.h"
+#include <algorithm>
+#include <cstdint>
+#include <iterator>
+
+#include "command_line.h"
+#include "input.h"
 
 namespace tool {
 namespace {
 
-struct CheckOptions {
-  std::string file;
-  std::string sync;
-  std::string saltFile;
-  bool json = false;
+constexpr Verb kKeyVerbs[] = {
+    {"create", "Make the two stash files, the directory's from a seed; prints the configuration's sync text",
+     setUpKeysCreate},
+    {"restore", "Make a directory stash file again from its seed and salt; prints its sync text", setUpKeysRestore},
+    {"show", "Show sync text, salt and key fingerprints of a stash file, never a key", setUpKeysShow},
+    {"check", "Report by exit code whether a stash file has this sync text and salt", setUpKeysCheck},
 };
+
+// The size that the stash file format gives to a record.
+off_t stashBytes(const KeyRecord& record) {
+  std::size_t bytes = sizeof(std::uint32_t) + record.sync().size() + record.salt().size();
+  for (const SecBuffer& key : record.get()->aesKeys) bytes += key.length;
+  return static_cast<off_t>(bytes);
+}
 
 bool acceptable(const Secret& text, int type) {
   return text.view().find('\0') == std::string_view::npos && validateCryptoString(text.c_str(), type) == LDAPPW_SUCCESS;
-}
-
-int check(const CheckOptions& options) {
-  const KeyRecord record = KeyRecord::load(options.file);
-  Secret salt;
-  const bool withSalt = !options.saltFile.empty();
-  if (withSalt) salt = readSaltFile(options.saltFile);
-  int isMatch = 0;
-  requireDone(checkKeyStashFile(withSalt ? 1 : 0, record.get(), options.sync.c_str(), salt.c_str(), &isMatch),
-              options.file);
-  Results results;
-  if (options.json) results.line(isMatch == 1 ? "{\"match\":true}" : "{\"match\":false}");
-  if (!options.json) results.line(isMatch == 1 ? "match" : "no match");
-  results.flush();
-  return isMatch == 1 ? kSuccess : kNoMatch;
 }
 
 }  // namespace
@@ -49,12 +46,23 @@ void requireSalt(const Secret& salt) {
 }
 
 Secret readSaltFile(const std::string& path) {
-  const Descriptor file = openInput(path);
-  LineReader lines(file.get(), path);
-  Secret salt;
-  if (!lines.next(salt)) throw Failure(kBadValue, "there is no salt in " + path);
+  Secret salt = firstLine(path, "salt");
   requireSalt(salt);
   return salt;
+}
+
+KeyRecord deriveRecord(const Secret& seed, std::string_view salt) {
+  AesKeyData* made = nullptr;
+  const int code = genTmpKeyDataVal(seed.c_str(), std::string(salt).c_str(), &made);
+  KeyRecord record(made);
+  requireDone(code, "the keys could not be derived");
+  return record;
+}
+
+bool sameRecord(const KeyRecord& a, const KeyRecord& b) {
+  const auto same = [](const SecBuffer& x, const SecBuffer& y) { return equalBytes(viewOf(x), viewOf(y)); };
+  return a.sync() == b.sync() && a.salt() == b.salt() &&
+         std::equal(std::begin(a.get()->aesKeys), std::end(a.get()->aesKeys), b.get()->aesKeys, same);
 }
 
 void requireDone(int code, const std::string& what) {
@@ -64,24 +72,27 @@ void requireDone(int code, const std::string& what) {
   throw Failure(kInternal, what + ": the library failed with code " + std::to_string(code));
 }
 
-void addKeysCheck(CLI::App& keys, int& exitCode) {
-  const auto options = std::make_shared<CheckOptions>();
-  CLI::App* verb = keys.add_subcommand("check", "Tell by exit code whether a stash file has this sync text and salt");
-  verb->add_option("FILE", options->file, "key stash file")->type_name("")->required();
-  verb->add_option("--sync", options->sync, "sync text")->required();
-  verb->add_option("--salt-file", options->saltFile, "compare the salt too, with the first line of this file")
-      ->type_name("FILE");
-  verb->add_flag("--json", options->json, "the result as a JSON object");
-  verb->callback([options, &exitCode] { exitCode = check(*options); });
+void requireWritten(int code, const std::string& what) {
+  if (code == LDAPPW_OPERATIONS_ERROR) throw Failure(kIoError, what + " could not be written; nothing was replaced");
+  requireDone(code, what);
 }
 
-void addKeys(CLI::App& app, int& exitCode) {
-  CLI::App* keys = app.add_subcommand("keys", "Make, restore, show and check key stash files");
-  keys->require_subcommand(1);
-  addKeysCreate(*keys, exitCode);
-  addKeysRestore(*keys, exitCode);
-  addKeysShow(*keys, exitCode);
-  addKeysCheck(*keys, exitCode);
+KeyRecord readBack(const OutputFile& file) {
+  AesKeyData* loaded = nullptr;
+  const int code = setAESKeyData(file.temporaryPath().c_str(), &loaded);
+  KeyRecord record(loaded);
+  struct stat written {};
+  struct stat made {};
+  const bool whole = code == LDAPPW_SUCCESS && stat(file.temporaryPath().c_str(), &written) == 0 &&
+                     fstat(file.fd(), &made) == 0 && written.st_dev == made.st_dev && written.st_ino == made.st_ino &&
+                     (made.st_mode & 07777) == kStashMode && made.st_size == stashBytes(record);
+  if (!whole) throw Failure(kIoError, file.target() + " could not be written whole; nothing was replaced");
+  return record;
+}
+
+void setUpKeys(CLI::App& verb, ExitCode& exitCode) {
+  verb.require_subcommand(1);
+  for (const Verb& row : kKeyVerbs) addVerb(verb, row, exitCode);
 }
 
 }  // namespace tool

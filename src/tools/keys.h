@@ -1,23 +1,24 @@
 // SPDX-License-Identifier: Apache-2.0
-// The verbs of key stash files: ldappw keys create, restore, show and check.
+// What the key verbs share: seeds, salts, records derived from them, and stash files that the library has written.
 #ifndef LDAPPW_TOOLS_KEYS_H
 #define LDAPPW_TOOLS_KEYS_H
 
 #include <string>
+#include <string_view>
 
-#include "common.h"
-#include "terminal.h"
-
-namespace CLI {
-class App;
-}
+#include "key_record.h"
+#include "output_file.h"
+#include "secret.h"
+#include "verbs.h"
 
 namespace tool {
 
-void addKeysCreate(CLI::App& keys, int& exitCode);
-void addKeysRestore(CLI::App& keys, int& exitCode);
-void addKeysShow(CLI::App& keys, int& exitCode);
-void addKeysCheck(CLI::App& keys, int& exitCode);
+constexpr mode_t kStashMode = 0600;
+
+void setUpKeysCreate(CLI::App& verb, ExitCode& exitCode);
+void setUpKeysRestore(CLI::App& verb, ExitCode& exitCode);
+void setUpKeysShow(CLI::App& verb, ExitCode& exitCode);
+void setUpKeysCheck(CLI::App& verb, ExitCode& exitCode);
 
 // Throws Failure (kBadValue) unless the text will do as a seed or a salt.
 void requireSeed(const Secret& seed);
@@ -26,8 +27,19 @@ void requireSalt(const Secret& salt);
 // The first line of a file that has to hold a salt.
 Secret readSaltFile(const std::string& path);
 
-// Throws the Failure that a library code stands for; nothing for success. what begins its message.
+KeyRecord deriveRecord(const Secret& seed, std::string_view salt);
+
+bool sameRecord(const KeyRecord& a, const KeyRecord& b);
+
+// Throw the Failure that a library code stands for; nothing for success. what begins its message. requireWritten is for
+// a code from writing a file: a failed file operation and a failed provider have one code, and the provider was asked
+// before.
 void requireDone(int code, const std::string& what);
+void requireWritten(int code, const std::string& what);
+
+// Reads what the library has written to the temporary file. Throws Failure unless that is still the file that was made
+// for it, closed to others and of the size of its record.
+KeyRecord readBack(const OutputFile& file);
 
 }  // namespace tool
 

@@ -1,11 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw keys show: what a stash file holds, with a fingerprint in place of each key.
-#include <CLI/CLI.hpp>
 #include <memory>
-#include <nlohmann/json.hpp>
+#include <vector>
 
+#include "command_line.h"
 #include "crypto_provider.h"
 #include "keys.h"
+#include "scheme.h"
+#include "text.h"
 
 namespace tool {
 namespace {
@@ -56,62 +58,60 @@ Fingerprint fingerprintOf(const Scheme& scheme, const SecBuffer& key, Sha256& sh
   static constexpr char kHex[] = "0123456789abcdef";
   unsigned char digest[kDigestBytes];
   sha256.of(key, digest);
-  std::string text;
+  Fingerprint fingerprint{scheme.name, key.length, ""};
   for (unsigned i = 0; i < kShownBytes; ++i) {
-    text += kHex[digest[i] >> 4];
-    text += kHex[digest[i] & 15U];
+    fingerprint.text += kHex[digest[i] >> 4];
+    fingerprint.text += kHex[digest[i] & 15U];
   }
-  return {scheme.name, key.length, text};
+  return fingerprint;
 }
 
 std::vector<Fingerprint> fingerprints(const KeyRecord& record) {
   Sha256 sha256;
   std::vector<Fingerprint> all;
-  for (const Scheme* scheme = kSchemes; scheme->name != nullptr; ++scheme) {
-    if (scheme->needsKey()) all.push_back(fingerprintOf(*scheme, record.get()->aesKeys[scheme->keyIndex], sha256));
+  for (const Scheme& scheme : kSchemes) {
+    if (scheme.needsKey()) all.push_back(fingerprintOf(scheme, record.get()->aesKeys[scheme.keyIndex], sha256));
   }
   return all;
 }
 
-std::string asJson(const Options& options, const KeyRecord& record) {
-  nlohmann::ordered_json object;
-  object["file"] = options.file;
-  object["sync"] = record.sync();
-  object["salt"] = record.salt();
+void showJson(const Options& options, const KeyRecord& record, Results& results) {
+  Json json;
+  json.text("file", options.file).text("sync", record.sync()).text("salt", record.salt()).openList("keys");
   for (const Fingerprint& key : fingerprints(record)) {
-    object["keys"].push_back({{"scheme", key.name}, {"bytes", key.keyBytes}, {"fingerprint", key.text}});
+    json.open("").text("scheme", key.name).number("bytes", key.keyBytes).text("fingerprint", key.text).close();
   }
-  return object.dump(-1, ' ', false, nlohmann::ordered_json::error_handler_t::replace);
+  results.line(json.closeList().end());
 }
 
-std::string asText(const Options& options, const KeyRecord& record) {
-  std::string text = "file: " + options.file + "\n";
-  text += "sync: " + std::string(record.sync()) + " (" + std::to_string(record.sync().size()) + " characters)\n";
-  text += "salt: " + std::string(record.salt()) + " (" + std::to_string(record.salt().size()) + " characters)";
+void showText(const Options& options, const KeyRecord& record, Results& results) {
+  const auto characters = [](const char* name, std::string_view text) {
+    return name + std::string(text) + " (" + std::to_string(text.size()) + " characters)";
+  };
+  results.line("file: " + printable(options.file));
+  results.line(characters("sync: ", record.sync()));
+  results.line(characters("salt: ", record.salt()));
   for (const Fingerprint& key : fingerprints(record)) {
-    text += std::string("\n") + key.name + ": " + std::to_string(key.keyBytes) + " bytes, fingerprint " + key.text;
+    results.line(std::string(key.name) + ": " + std::to_string(key.keyBytes) + " bytes, fingerprint " + key.text);
   }
-  return text;
 }
 
-int show(const Options& options) {
+ExitCode show(const Options& options) {
   requireProvider();
   const KeyRecord record = KeyRecord::load(options.file);
   Results results;
-  results.line(options.json ? asJson(options, record) : asText(options, record));
+  (options.json ? showJson : showText)(options, record, results);
   results.flush();
   return kSuccess;
 }
 
 }  // namespace
 
-void addKeysShow(CLI::App& keys, int& exitCode) {
+void setUpKeysShow(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  CLI::App* verb =
-      keys.add_subcommand("show", "Show sync text, salt and key fingerprints of a stash file, never a key");
-  verb->add_option("FILE", options->file, "key stash file")->type_name("")->required();
-  verb->add_flag("--json", options->json, "the result as a JSON object");
-  verb->callback([options, &exitCode] { exitCode = show(*options); });
+  addPath(verb, "FILE", options->file, "key stash file")->required();
+  verb.add_flag("--json", options->json, "the result as a JSON object");
+  verb.callback([options, &exitCode] { exitCode = show(*options); });
 }
 
 }  // namespace tool

@@ -1,166 +1,157 @@
 // SPDX-License-Identifier: Apache-2.0
 // The audit of an export.
-#include "ldif_audit.h"
+#include "condition.h"
+#include "ldif.h"
+#include "text.h"
+#include "values.h"
 
 namespace tool {
 namespace {
 
-std::size_t indexOf(const Scheme& scheme) noexcept {
-  return static_cast<std::size_t>(&scheme - kSchemes);
-}
+// Totals; the conditions follow the last one. Columns by scheme.
+enum Total : std::size_t { kValues, kUrls, kDeleted, kFirstCondition };
+enum Column : std::size_t { kAll, kOpened, kNotText, kUnopened };
+static_assert(kFirstCondition + kConditionCount <= Tally::kTotals);
 
-// Tries the keys on a reversible value. Without keys only what needs none is tried.
-Look openedLook(const Scheme& scheme, std::string_view value, const AuditOptions& options, SchemeTally& tally) {
-  if (!scheme.reversible || (scheme.needsKey() && !options.keys)) return Look::kFine;
-  Secret clear;
-  if (!revealValue(value, options.keys, clear).ok()) {
-    ++tally.unopened;
-    return Look::kUnopened;
-  }
-  const bool text = looksLikeText(clear.view());
-  ++(text ? tally.opened : tally.notText);
-  return text || options.allowBinary ? Look::kFine : Look::kNotText;
-}
+constexpr CountName kTotalNames[] = {{"values", "values"}, {"urls", "behind a URL"}, {"deleted", "to be deleted"}};
+constexpr CountName kColumnNames[] = {
+    {"values", "values"}, {"opened", "opened"}, {"notText", "not text"}, {"unopened", "unopened"}};
 
-// What is told of one line: a scheme or where the value is, and the finding.
+// What is said of one line: a scheme, or where the value is; the condition; what is wrong with the payload or the line.
 struct Verdict {
   const char* kind;
-  Look look;
+  Condition condition;
   const char* detail;
 };
 
-Verdict auditValue(std::string_view value, const AuditOptions& options, AuditTally& tally) {
-  Look look = lookOf(value);
-  if (look == Look::kUnknownTag) return {"unknown", look, ""};
-  const Scheme& scheme = schemeOf(value);
-  SchemeTally& counts = tally.schemes[indexOf(scheme)];
-  ++counts.values;
-  const char* problem = payloadProblem(value);
-  if (problem == nullptr) {
-    const Look opened = openedLook(scheme, value, options, counts);
-    if (look == Look::kFine) look = opened;
+// Tries the keys on a reversible value. Without keys only what needs none is tried.
+Condition tryToOpen(const StoredValue& value, const KeyRecord& keys, bool allowBinary, Tally::Row& counts) {
+  if (!value.scheme().reversible() || (value.scheme().needsKey() && !keys)) return Condition::kFine;
+  Secret clear;
+  if (!openValue(value, keys, clear).ok()) {
+    ++counts[kUnopened];
+    return Condition::kUnopened;
   }
-  return {scheme.name, look, look == Look::kMalformed && problem != nullptr ? problem : ""};
+  const bool text = looksLikeText(clear.view());
+  ++counts[text ? kOpened : kNotText];
+  return text || allowBinary ? Condition::kFine : Condition::kNotText;
 }
 
-Verdict auditLine(const PasswordLine& password, const AuditOptions& options, AuditTally& tally) {
-  ++tally.values;
+Verdict auditValue(const StoredValue& value, const KeyRecord& keys, bool allowBinary, Tally& tally) {
+  const char* problem = value.problem();
+  Condition condition = conditionOf(value, problem);
+  const Scheme& scheme = value.scheme();
+  if (condition == Condition::kUnknownTag) return {scheme.name, condition, ""};
+  Tally::Row& counts = tally.of(scheme);
+  ++counts[kAll];
+  if (problem == nullptr) {
+    const Condition opened = tryToOpen(value, keys, allowBinary, counts);
+    if (condition == Condition::kFine) condition = opened;
+  }
+  return {scheme.name, condition, condition == Condition::kMalformed ? problem : ""};
+}
+
+Verdict auditLine(const PasswordLine& password, const KeyRecord& keys, bool allowBinary, Tally& tally) {
+  ++tally.totals[kValues];
   switch (password.form) {
     case ValueForm::kUrl:
-      ++tally.urls;
-      return {"url", Look::kFine, ""};
+      ++tally.totals[kUrls];
+      return {"url", Condition::kFine, ""};
     case ValueForm::kDeleted:
-      ++tally.deleted;
-      return {"deleted", Look::kFine, ""};
+      ++tally.totals[kDeleted];
+      return {"deleted", Condition::kFine, ""};
     case ValueForm::kBroken:
-      return {"unknown", Look::kBroken, password.problem};
+      return {"unknown", Condition::kBroken, password.problem};
     case ValueForm::kBytes:
       break;
   }
-  return auditValue(password.value.view(), options, tally);
+  return auditValue(StoredValue(password.value), keys, allowBinary, tally);
 }
 
 void appendText(const RecordWalker& walker, const Verdict& verdict, Secret& out) {
   out.append("line " + std::to_string(walker.lineNumber()) + ": " + printable(walker.dn()) + ": " + verdict.kind);
-  if (verdict.look != Look::kFine) {
-    out.append(": ");
-    out.append(kLooks[static_cast<std::size_t>(verdict.look)].text);
-  }
+  if (verdict.condition != Condition::kFine) out.append(std::string(": ") + textOf(verdict.condition).text);
   if (*verdict.detail != '\0') out.append(std::string(" (") + verdict.detail + ")");
   out.append('\n');
 }
 
 void appendJson(const RecordWalker& walker, const Verdict& verdict, Secret& out) {
-  out.append("{\"line\":" + std::to_string(walker.lineNumber()) + ",\"dn\":");
-  appendJsonString(out, wellFormedUtf8(walker.dn()) ? walker.dn() : printable(walker.dn()));
-  out.append(",\"attribute\":");
-  appendJsonString(out, printable(walker.password().description));
-  out.append(std::string(",\"kind\":\"") + verdict.kind + "\"");
-  if (verdict.look != Look::kFine) {
-    out.append(std::string(",\"finding\":\"") + kLooks[static_cast<std::size_t>(verdict.look)].name + "\"");
-  }
-  if (*verdict.detail != '\0') {
-    out.append(",\"detail\":");
-    appendJsonString(out, verdict.detail);
-  }
-  out.append("}\n");
+  Json json;
+  json.number("line", walker.lineNumber()).text("dn", walker.dn()).text("attribute", walker.password().description);
+  json.text("kind", verdict.kind);
+  if (verdict.condition != Condition::kFine) json.text("finding", textOf(verdict.condition).name);
+  if (*verdict.detail != '\0') json.text("detail", verdict.detail);
+  out.append(json.end());
+  out.append('\n');
 }
 
-void writeTable(const AuditTally& tally, Results& results) {
-  results.line(leftCell("scheme", 10) + cell("values", 12) + cell("opened", 12) + cell("not text", 12) +
-               cell("unopened", 12));
-  for (std::size_t i = 0; kSchemes[i].name != nullptr; ++i) {
-    const SchemeTally& counts = tally.schemes[i];
-    if (counts.values == 0) continue;
-    results.line(leftCell(kSchemes[i].name, 10) + cell(counts.values, 12) + cell(counts.opened, 12) +
-                 cell(counts.notText, 12) + cell(counts.unopened, 12));
-  }
-  results.line("entries: " + std::to_string(tally.entries));
-  results.line("values: " + std::to_string(tally.values));
-  if (tally.urls > 0) results.line("behind a URL: " + std::to_string(tally.urls));
-  if (tally.deleted > 0) results.line("to be deleted: " + std::to_string(tally.deleted));
-  for (std::size_t i = 1; i < tally.looks.size(); ++i) {
-    if (tally.looks[i] > 0)
-      results.line("finding: " + std::string(kLooks[i].text) + ": " + std::to_string(tally.looks[i]));
+void auditBatch(RecordWalker& walker, const LdifOptions& options, const KeyRecord& keys, Part& part) {
+  while (walker.next()) {
+    if (!walker.atPassword()) continue;
+    const Verdict verdict = auditLine(walker.password(), keys, options.allowBinary, part.tally);
+    ++part.tally.totals[kFirstCondition + static_cast<std::size_t>(verdict.condition)];
+    keepFirst(part.exitCode, textOf(verdict.condition).code);
+    if (options.verbose) (options.json ? appendJson : appendText)(walker, verdict, part.out);
   }
 }
 
-std::string field(const char* name, std::uint64_t count) {
-  return '"' + std::string(name) + "\":" + std::to_string(count);
+void writeTable(const Tally& tally, Results& results) {
+  const auto write = [&](const CountName& name, std::uint64_t count, const char* prefix) {
+    results.line(prefix + std::string(name.text) + ": " + std::to_string(count));
+  };
+  std::string row = leftCell("scheme", 10);
+  for (const CountName& column : kColumnNames) row += cell(column.text, 12);
+  results.line(row);
+  for (const Scheme& scheme : kSchemes) {
+    const Tally::Row& counts = tally.of(scheme);
+    if (counts[kAll] == 0) continue;
+    row = leftCell(scheme.name, 10);
+    for (std::size_t column = kAll; column <= kUnopened; ++column) row += cell(counts[column], 12);
+    results.line(row);
+  }
+  write({"entries", "entries"}, tally.entries, "");
+  for (std::size_t total = kValues; total < kFirstCondition; ++total) {
+    if (total == kValues || tally.totals[total] > 0) write(kTotalNames[total], tally.totals[total], "");
+  }
+  for (std::size_t i = 1; i < kConditionCount; ++i) {
+    const std::uint64_t count = tally.totals[kFirstCondition + i];
+    if (count > 0) write({kConditions[i].name, kConditions[i].text}, count, "finding: ");
+  }
 }
 
-void writeObject(const AuditTally& tally, Results& results) {
-  std::string text = "{" + field("entries", tally.entries) + "," + field("values", tally.values) + "," +
-                     field("urls", tally.urls) + "," + field("deleted", tally.deleted) + ",\"schemes\":{";
-  for (std::size_t i = 0; kSchemes[i].name != nullptr; ++i) {
-    const SchemeTally& counts = tally.schemes[i];
-    text += (i == 0 ? "\"" : ",\"") + std::string(kSchemes[i].name) + "\":{" + field("values", counts.values);
-    if (kSchemes[i].reversible) {
-      text += "," + field("opened", counts.opened) + "," + field("notText", counts.notText) + "," +
-              field("unopened", counts.unopened);
-    }
-    text += "}";
+void writeObject(const Tally& tally, Results& results) {
+  Json json;
+  json.number("entries", tally.entries);
+  addCounts(json, kTotalNames, tally.totals.data());
+  json.open("schemes");
+  for (const Scheme& scheme : kSchemes) {
+    const Tally::Row& counts = tally.of(scheme);
+    json.open(scheme.name);
+    scheme.reversible() ? addCounts(json, kColumnNames, counts.data()) : (void)json.number("values", counts[kAll]);
+    json.close();
   }
-  text += "},\"findings\":{";
-  for (std::size_t i = 1; i < tally.looks.size(); ++i)
-    text += (i == 1 ? "" : ",") + field(kLooks[i].name, tally.looks[i]);
-  results.line(text + "}}");
+  json.close().open("findings");
+  for (std::size_t i = 1; i < kConditionCount; ++i) {
+    json.number(kConditions[i].name, tally.totals[kFirstCondition + i]);
+  }
+  results.line(json.close().end());
 }
 
 }  // namespace
 
-void AuditTally::add(const AuditTally& part) noexcept {
-  entries += part.entries;
-  values += part.values;
-  urls += part.urls;
-  deleted += part.deleted;
-  for (std::size_t i = 0; i < schemes.size(); ++i) {
-    schemes[i].values += part.schemes[i].values;
-    schemes[i].opened += part.schemes[i].opened;
-    schemes[i].notText += part.schemes[i].notText;
-    schemes[i].unopened += part.schemes[i].unopened;
-  }
-  for (std::size_t i = 0; i < looks.size(); ++i) looks[i] += part.looks[i];
-  if (firstProblem == kSuccess) firstProblem = part.firstProblem;
-}
-
-AuditResult auditBatch(const Batch& batch, const AttributeSet& attributes, const AuditOptions& options) {
-  AuditResult result;
-  RecordWalker walker(batch, attributes);
-  while (walker.next()) {
-    if (!walker.atPassword()) continue;
-    const Verdict verdict = auditLine(walker.password(), options, result.tally);
-    const std::size_t look = static_cast<std::size_t>(verdict.look);
-    ++result.tally.looks[look];
-    if (result.tally.firstProblem == kSuccess) result.tally.firstProblem = kLooks[look].code;
-    if (options.verbose) (options.json ? appendJson : appendText)(walker, verdict, result.out);
-  }
-  result.tally.entries = walker.entries();
-  return result;
-}
-
-void writeAudit(const AuditTally& tally, bool json, Results& results) {
-  json ? writeObject(tally, results) : writeTable(tally, results);
+ExitCode auditExport(const LdifOptions& options) {
+  requireProvider();
+  const KeyRecord keys = KeyRecord::load(options.keys);
+  Input input = openExport(options.source);
+  ExportOptions source = options.source;
+  source.resultsOnStdout = options.verbose;
+  Results results;
+  const Part sum = runExport(
+      input, source, [&](RecordWalker& walker, Part& part) { auditBatch(walker, options, keys, part); },
+      [&](std::string_view out) { results.write(out); });
+  (options.json ? writeObject : writeTable)(sum.tally, results);
+  results.flush();
+  return sum.exitCode;
 }
 
 }  // namespace tool

@@ -1,121 +1,183 @@
 // SPDX-License-Identifier: Apache-2.0
-// Making password values anew. A value that cannot be carried over unharmed stays what it was and becomes a finding:
-// the export is often the only copy of the passwords in it.
-#include "ldif_convert.h"
+// The conversion. A value that cannot be carried over unharmed stays what it was and is reported: the export is often
+// the only copy of the passwords in it.
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <optional>
+
+#include "condition.h"
+#include "ldif.h"
+#include "messages.h"
+#include "output_file.h"
+#include "password_schemes.h"
+#include "text.h"
+#include "values.h"
 
 namespace tool {
 namespace {
 
-using Counter = std::uint64_t ConvertTally::*;
+// Totals. What becomes of a value is one of those from kMade on.
+enum Total : std::size_t {
+  kValues,
+  kMade,
+  kCut,
+  kAsTheyAre,
+  kOneWay,
+  kUrls,
+  kDeleted,
+  kUnknownTags,
+  kMalformed,
+  kFailed
+};
 
-// What became of one value: the counter that it goes to, and the finding if there is one.
+constexpr CountName kNames[] = {
+    {"values", "password values"},         {"made", "made again"},
+    {"cut", "of these cut by the scheme"}, {"asTheyAre", "clear already, kept"},
+    {"oneWay", "one-way, kept"},           {"urls", "behind a URL, kept"},
+    {"deleted", "to be deleted, kept"},    {"unknownTags", "with an unknown tag, kept"},
+    {"malformed", "malformed, kept"},      {"failed", "failed, kept"},
+};
+
+struct Conversion {
+  const Scheme& target;
+  KeyRecord oldKeys;
+  KeyRecord newKeys;
+  bool allowBinary;
+};
+
+// What became of one value, and the problem if there is one.
 struct Outcome {
-  Counter counter;
+  Total total;
   Status status;
 };
 
-Outcome failed(Status status) {
-  return {&ConvertTally::failed, status};
+Status openSource(const StoredValue& value, const Conversion& conversion, Secret& clear) {
+  const Status status = openValue(value, conversion.oldKeys, clear);
+  if (!status.ok() || value.scheme().isClear() || conversion.allowBinary || looksLikeText(clear.view())) return status;
+  return {kBadKey, "opens into bytes that are not text: a wrong key, or a binary password (--allow-binary)"};
 }
 
-Status targetProblem(const Scheme& target, std::string_view clear) {
-  if (target.code == FORMAT_QVEIL && clear.size() > target.cutBytes) {
+// The new value takes the place of the only copy, so the server's own check has to accept it first, where it knows the
+// scheme.
+Status makeTarget(const Secret& clear, const Conversion& conversion, Secret& made) {
+  const Scheme& target = conversion.target;
+  if (target.reversible() && target.cuts(clear.size())) {
     return {kBadValue, "the password has more bytes than the scheme holds"};
   }
-  return passwordProblem(target, clear);
+  const Status status = makeValue(target, conversion.newKeys, clear, made);
+  if (!status.ok() || target.code == FORMAT_NONE || serverAccepts(made, conversion.newKeys, clear)) return status;
+  return {kBadValue, "the new value does not verify"};
 }
 
-// The new value takes the place of the only copy, so the server's own check has to accept it first.
-Status checkMade(const Secret& made, const Secret& clear, const ConvertOptions& options) {
-  if (options.target->code == FORMAT_NONE) return {};
-  const int different = verify_password(clear.c_str(), static_cast<int>(clear.size()), made.c_str(),
-                                        static_cast<int>(made.size()), 1, options.newKeys.get());
-  if (different != 0) return {kBadValue, "the new value does not verify"};
-  return {};
-}
-
-Outcome convertValue(const Secret& value, const ConvertOptions& options, Secret& made) {
-  const Scheme& source = schemeOf(value.view());
-  const Scheme& target = *options.target;
-  const bool clearSource = source.code == FORMAT_NONE;
-  if (unknownTag(value.view())) return {&ConvertTally::unknownTags, {kBadValue, "unknown tag; the value is kept"}};
-  if (!clearSource && !source.reversible) {
-    const LookText& look = kLooks[static_cast<int>(lookOf(value.view()))];
-    if (look.code != kSuccess) return {&ConvertTally::malformed, {look.code, look.text}};
-    return {&ConvertTally::oneWay, {}};
+Outcome convertValue(const Secret& whole, const Conversion& conversion, Secret& made) {
+  const StoredValue value(whole);
+  const Scheme& source = value.scheme();
+  if (source.kind == Kind::kUnknown) return {kUnknownTags, {kBadValue, "unknown tag; the value is kept"}};
+  if (source.kind == Kind::kOneWay) {
+    const ConditionText& condition = textOf(conditionOf(value, value.problem()));
+    return {condition.code == kSuccess ? kOneWay : kMalformed, {condition.code, condition.text}};
   }
-  if (clearSource && target.code == FORMAT_NONE) return {&ConvertTally::asTheyAre, {}};
-
+  if (source.isClear() && conversion.target.isClear()) return {kAsTheyAre, {}};
   Secret clear;
-  Status status = revealValue(value.view(), options.oldKeys, clear);
-  if (!status.ok()) return failed(status);
-  if (!clearSource && !options.allowBinary && !looksLikeText(clear.view())) {
-    return failed({kBadKey, "opens into bytes that are not text: a wrong key, or a binary password (--allow-binary)"});
-  }
-  status = targetProblem(target, clear.view());
-  if (status.ok()) status = formatPassword(target, options.newKeys, clear, made);
-  if (status.ok()) status = checkMade(made, clear, options);
-  if (!status.ok()) return failed(status);
-  return {target.cutBytes != 0 && clear.size() > target.cutBytes ? &ConvertTally::cut : &ConvertTally::made, {}};
+  Status status = openSource(value, conversion, clear);
+  if (status.ok()) status = makeTarget(clear, conversion, made);
+  if (!status.ok()) return {kFailed, status};
+  return {conversion.target.cuts(clear.size()) ? kCut : kMade, {}};
 }
 
-Outcome outcomeOf(const PasswordLine& password, const ConvertOptions& options, Secret& made) {
+Outcome outcomeOf(const PasswordLine& password, const Conversion& conversion, Secret& made) {
   switch (password.form) {
     case ValueForm::kUrl:
-      return {&ConvertTally::urls, {}};
+      return {kUrls, {}};
     case ValueForm::kDeleted:
-      return {&ConvertTally::deleted, {}};
+      return {kDeleted, {}};
     case ValueForm::kBroken:
-      return failed({kBadValue, password.problem});
+      return {kFailed, {kBadValue, password.problem}};
     case ValueForm::kBytes:
       break;
   }
-  return convertValue(password.value, options, made);
+  return convertValue(password.value, conversion, made);
 }
 
-void convertLine(const RecordWalker& walker, const ConvertOptions& options, ConvertResult& result) {
+void convertLine(const RecordWalker& walker, const Conversion& conversion, Part& part) {
   Secret made;
-  const Outcome outcome = outcomeOf(walker.password(), options, made);
-  ++result.tally.values;
-  ++(result.tally.*outcome.counter);
-  if (outcome.counter == &ConvertTally::cut) ++result.tally.made;
-  if (!outcome.status.ok()) result.findings.push_back(findingAt(walker, outcome.status));
-  if (outcome.counter == &ConvertTally::made || outcome.counter == &ConvertTally::cut) {
-    writeChanged(walker.line(), walker.password().description, made, result.out);
+  const Outcome outcome = outcomeOf(walker.password(), conversion, made);
+  ++part.tally.totals[kValues];
+  ++part.tally.totals[outcome.total];
+  if (outcome.total == kCut) ++part.tally.totals[kMade];
+  if (!outcome.status.ok()) part.report(walker.lineNumber(), walker.dn(), outcome.status.code, outcome.status.text);
+  if (outcome.total == kMade || outcome.total == kCut) {
+    writeChanged(walker.line(), walker.password().description, made, part.out);
   } else {
-    result.out.append(walker.line().raw);
+    part.out.append(walker.line().raw);
+  }
+}
+
+void convertBatch(RecordWalker& walker, const Conversion& conversion, Part& part) {
+  while (walker.next()) {
+    walker.atPassword() ? convertLine(walker, conversion, part) : part.out.append(walker.line().raw);
+  }
+}
+
+const Scheme& targetOf(const LdifOptions& options) {
+  const Scheme* scheme = findScheme(options.to);
+  if (scheme == nullptr || scheme->make == nullptr) {
+    throw Failure(kUsage, options.to + " is no scheme that can be made");
+  }
+  if (scheme->isClear() && !options.allowClear) {
+    throw Failure(kUsage, "passwords are written in the clear with --allow-clear only");
+  }
+  if (scheme->needsKey() && options.newKeys.empty()) throw Failure(kUsage, options.to + " needs --new-keys");
+  return *scheme;
+}
+
+// A file that is replaced keeps its mode; a new one is closed to others.
+mode_t modeFor(const std::string& path) {
+  struct stat old {};
+  return stat(path.c_str(), &old) == 0 ? old.st_mode & 07777 : 0600;
+}
+
+void showSummary(const Tally& tally, const Scheme& target, bool json) {
+  if (tally.totals[kCut] > 0) {
+    warning(std::to_string(tally.totals[kCut]) + " passwords are longer than the " + std::to_string(target.cutBytes) +
+            " bytes that " + target.name + " uses: only their beginnings will be checked");
+  }
+  if (json) {
+    Results results;
+    Json object;
+    object.number("entries", tally.entries);
+    addCounts(object, kNames, tally.totals.data());
+    results.line(object.end());
+    return results.flush();
+  }
+  message("entries: " + std::to_string(tally.entries));
+  for (std::size_t total = kValues; total <= kFailed; ++total) {
+    const std::uint64_t count = tally.totals[total];
+    if (total <= kMade || count > 0) message(std::string(kNames[total].text) + ": " + std::to_string(count));
   }
 }
 
 }  // namespace
 
-const std::array<ConvertField, 11> kConvertFields = {{
-    {"entries", "entries", &ConvertTally::entries},
-    {"values", "password values", &ConvertTally::values},
-    {"made", "made anew", &ConvertTally::made},
-    {"cut", "of these cut by the scheme", &ConvertTally::cut},
-    {"asTheyAre", "clear already, kept", &ConvertTally::asTheyAre},
-    {"oneWay", "one-way, kept", &ConvertTally::oneWay},
-    {"urls", "behind a URL, kept", &ConvertTally::urls},
-    {"deleted", "to be deleted, kept", &ConvertTally::deleted},
-    {"unknownTags", "with an unknown tag, kept", &ConvertTally::unknownTags},
-    {"malformed", "malformed, kept", &ConvertTally::malformed},
-    {"failed", "failed, kept", &ConvertTally::failed},
-}};
-
-ConvertResult convertBatch(const Batch& batch, const AttributeSet& attributes, const ConvertOptions& options) {
-  ConvertResult result;
-  result.out.reserve(batch.text.size() + batch.text.size() / 4);
-  RecordWalker walker(batch, attributes);
-  while (walker.next()) {
-    if (walker.atPassword()) {
-      convertLine(walker, options, result);
-    } else {
-      result.out.append(walker.line().raw);
-    }
-  }
-  result.tally.entries = walker.entries();
-  return result;
+ExitCode convertExport(const LdifOptions& options) {
+  const Scheme& target = targetOf(options);
+  requireProvider();
+  const Conversion conversion{target, KeyRecord::load(options.keys), KeyRecord::load(options.newKeys),
+                              options.allowBinary};
+  Input input = openExport(options.source);
+  std::optional<OutputFile> file;
+  if (options.out != "-") file.emplace(options.out, modeFor(options.out), options.force);
+  const auto deliver = [&](std::string_view out) {
+    file ? file->write(out) : writeAll(STDOUT_FILENO, out, "standard output");
+  };
+  ExportOptions source = options.source;
+  source.resultsOnStdout = !file;
+  const Part sum = runExport(
+      input, source, [&](RecordWalker& walker, Part& part) { convertBatch(walker, conversion, part); }, deliver);
+  if (file) file->commit();
+  showSummary(sum.tally, target, options.json);
+  return sum.exitCode;
 }
 
 }  // namespace tool

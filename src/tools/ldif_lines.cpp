@@ -2,12 +2,11 @@
 // Splitting LDIF into batches of records and into logical lines; see the header.
 #include "ldif_lines.h"
 
-#include <unistd.h>
-
 #include <algorithm>
-#include <cerrno>
+#include <cstring>
+#include <string>
 
-#include "common.h"
+#include "failure.h"
 
 namespace tool {
 namespace {
@@ -35,14 +34,14 @@ std::string_view contentOf(std::string_view line) noexcept {
 }
 
 // The offset just behind the last blank line whose newline is at or after from, or kNone. A blank line at the very
-// start ends no record.
+// start ends no record. Nothing before from is searched, so that a record of any size costs linear time.
 std::size_t lastBorder(std::string_view text, std::size_t from) noexcept {
-  std::size_t newline = text.rfind('\n');
-  while (newline != kNone && newline >= from && newline > 0) {
-    std::size_t before = newline - 1;
-    if (text[before] == '\r' && before > 0) --before;
-    if (text[before] == '\n') return newline + 1;
-    newline = text.rfind('\n', newline - 1);
+  while (const void* found = memrchr(text.data() + from, '\n', text.size() - from)) {
+    const auto newline = static_cast<std::size_t>(static_cast<const char*>(found) - text.data());
+    text = text.substr(0, newline);
+    if (!text.empty() && text.back() == '\r') text.remove_suffix(1);
+    if (!text.empty() && text.back() == '\n') return newline + 1;
+    text = {text.data(), newline};
   }
   return kNone;
 }
@@ -80,32 +79,18 @@ void foldInto(std::string_view text, std::string_view lineEnd, Secret& out) {
   }
 }
 
-// Appends what one read delivers; false at the end of the input.
-bool RecordReader::fill(Secret& text) {
-  const std::size_t size = text.size();
-  text.resize(size + kBatchBytes);
-  ssize_t got = 0;
-  do {
-    got = ::read(fd_, text.data() + size, kBatchBytes);
-  } while (got < 0 && errno == EINTR);
-  if (got < 0) throw Failure(kIoError, systemText(name_, errno));
-  text.resize(size + static_cast<std::size_t>(got));
-  return got > 0;
-}
-
 bool RecordReader::next(Batch& batch) {
   batch.text.clear();
   batch.text.append(ahead_.view());
   ahead_.clear();
-  // Only what has not been searched is searched, so that a record of any size costs linear time.
   std::size_t searched = 0;
   std::size_t border = kNone;
   while (!ended_ && border == kNone) {
     if (batch.text.size() > kMaxRecordBytes) {
-      throw Failure(kBadValue, name_ + ": the record in line " + std::to_string(lines_ + 1) +
+      throw Failure(kBadValue, input_.name() + ": the record in line " + std::to_string(lines_ + 1) +
                                    " is larger than 256 MiB: no blank line ends it");
     }
-    ended_ = !fill(batch.text);
+    ended_ = !input_.more(batch.text, kBatchBytes);
     if (batch.text.size() < kBatchBytes) continue;
     border = lastBorder(batch.text.view(), searched);
     searched = batch.text.size();

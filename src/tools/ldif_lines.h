@@ -1,15 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
 // Byte-exact splitting of LDIF text (RFC 2849): an input into batches of whole records, a batch into logical lines.
-// The LDAP library's record reader is no help here: it joins folded lines and drops comments and carriage returns, and
-// what is not changed has to come out as it came in.
+// The LDAP library's record reader will not do: it joins folded lines and drops comments and carriage returns, and what
+// is not changed has to come out as it came in.
 #ifndef LDAPPW_TOOLS_LDIF_LINES_H
 #define LDAPPW_TOOLS_LDIF_LINES_H
 
 #include <cstddef>
 #include <cstdint>
-#include <string>
 #include <string_view>
 
+#include "input.h"
 #include "secret.h"
 
 namespace tool {
@@ -49,23 +49,20 @@ struct Batch {
   Secret text;
 };
 
-// Cuts what a descriptor delivers into batches. Used by one thread at a time; the descriptor stays the caller's.
+// Cuts an input into batches. Used by one thread at a time; the input stays the caller's.
 class RecordReader {
  public:
   static constexpr std::size_t kBatchBytes = std::size_t{256} << 10;
   // A record larger than this is refused: memory must not follow a file that has no records in it.
   static constexpr std::size_t kMaxRecordBytes = std::size_t{256} << 20;
 
-  RecordReader(int fd, std::string name) : fd_(fd), name_(std::move(name)) {}
+  explicit RecordReader(Input& input) noexcept : input_(input) {}
 
   // False at the end of the input. Throws Failure: kIoError, or kBadValue for a record that is too large.
   bool next(Batch& batch);
 
  private:
-  bool fill(Secret& text);
-
-  int fd_;
-  std::string name_;
+  Input& input_;
   Secret ahead_;  // read already, but of the next batch
   std::uint64_t batches_ = 0;
   std::uint64_t lines_ = 0;

@@ -3,28 +3,13 @@
 // checked first, because a value that two readers take differently must not be replaced.
 #include "ldif_record.h"
 
-#include <ldap.h>
-
-#include <cstdio>  // ldif.h uses FILE without including it
-
-#include <ldif.h>
-
-#include "common.h"
+#include "ldif_library.h"
+#include "text.h"
 
 namespace tool {
 namespace {
 
 constexpr std::size_t kNone = std::string_view::npos;
-
-char lower(char c) noexcept {
-  return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
-}
-
-std::string_view trimSpaces(std::string_view text) noexcept {
-  while (!text.empty() && text.front() == ' ') text.remove_prefix(1);
-  while (!text.empty() && text.back() == ' ') text.remove_suffix(1);
-  return text;
-}
 
 // Why the text behind "attribute:" is not to be taken for a value, or null.
 const char* valueProblem(std::string_view text) noexcept {
@@ -41,26 +26,17 @@ const char* valueProblem(std::string_view text) noexcept {
 bool parseValue(Secret& text, Secret& value) {
   value.clear();
   const std::string_view spec = text.view().substr(text.view().find(':') + 1);
-  if (!spec.empty() && spec.front() == ':' && trimSpaces(spec) == ":")
-    return true;  // the library refuses base64 of nothing
+  if (!spec.empty() && spec.front() == ':' && trimSpaces(spec) == ":") return true;  // refused by the library
   berval type{};
   berval parsed{};
   int mustFree = 0;
-  if (ldif_parse_line2(text.data(), &type, &parsed, &mustFree) != 0) return false;
+  if (ldifLibrary().parseLine(text.data(), &type, &parsed, &mustFree) != 0) return false;
   if (parsed.bv_val != nullptr) value.append(std::string_view(parsed.bv_val, parsed.bv_len));
-  if (mustFree != 0) ber_memfree(parsed.bv_val);
+  if (mustFree != 0) ldifLibrary().release(parsed.bv_val);
   return true;
 }
 
 }  // namespace
-
-bool equalNames(std::string_view a, std::string_view b) noexcept {
-  if (a.size() != b.size()) return false;
-  for (std::size_t i = 0; i < a.size(); ++i) {
-    if (lower(a[i]) != lower(b[i])) return false;
-  }
-  return true;
-}
 
 AttributeSet::AttributeSet(std::vector<std::string> names) : names_(std::move(names)) {
   if (names_.empty()) names_ = {"userPassword", "2.5.4.35"};
@@ -69,7 +45,7 @@ AttributeSet::AttributeSet(std::vector<std::string> names) : names_(std::move(na
 bool AttributeSet::matches(std::string_view description) const noexcept {
   const std::string_view type = trimSpaces(description.substr(0, description.find(';')));
   for (const std::string& name : names_) {
-    if (equalNames(type, name)) return true;
+    if (sameName(type, name)) return true;
   }
   return false;
 }
@@ -79,10 +55,10 @@ void RecordWalker::startRecord() noexcept {
   modify_ = inBlock_ = deleting_ = false;
 }
 
-// Most lines are told to be none of ours without undoing their folding.
+// Most lines are found to be none of ours without undoing their folding.
 bool RecordWalker::matters(std::string_view description) const noexcept {
   const std::string_view name = trimSpaces(description);
-  return modify_ || attributes_.matches(name) || equalNames(name, "dn") || equalNames(name, "changetype");
+  return modify_ || attributes_.matches(name) || sameName(name, "dn") || sameName(name, "changetype");
 }
 
 void RecordWalker::readName(std::string_view text) {
@@ -96,30 +72,31 @@ void RecordWalker::readName(std::string_view text) {
 
 // Follows the lines that say which record and which change the others belong to.
 void RecordWalker::readControl(std::string_view name, std::string_view text) {
-  if (equalNames(name, "dn")) return readName(text);
-  if (equalNames(name, "changetype")) {
-    modify_ = equalNames(trimSpaces(text), "modify");
+  if (sameName(name, "dn")) return readName(text);
+  if (sameName(name, "changetype")) {
+    modify_ = sameName(trimSpaces(text), "modify");
     return;
   }
   if (!modify_ || inBlock_) return;
   inBlock_ = true;
-  deleting_ = equalNames(name, "delete");
+  deleting_ = sameName(name, "delete");
 }
 
 void RecordWalker::readPassword(std::string_view description) {
+  atPassword_ = true;
   unfold(line_, text_);
   password_.description.assign(description);
-  const std::string_view text = text_.view().substr(description.size() + 1);
-  atPassword_ = true;
   password_.problem = "";
-  password_.form = ValueForm::kUrl;
-  if (!text.empty() && text.front() == '<') return;
-  password_.form = ValueForm::kDeleted;
-  if (inBlock_ && deleting_) return;
-  password_.problem = valueProblem(text);
-  const bool parsed = password_.problem == nullptr && parseValue(text_, password_.value);
-  if (password_.problem == nullptr) password_.problem = parsed ? "" : "the line cannot be parsed";
-  password_.form = parsed ? ValueForm::kBytes : ValueForm::kBroken;
+  password_.form = readValue(text_.view().substr(description.size() + 1));
+}
+
+ValueForm RecordWalker::readValue(std::string_view text) {
+  if (!text.empty() && text.front() == '<') return ValueForm::kUrl;
+  if (inBlock_ && deleting_) return ValueForm::kDeleted;
+  const char* problem = valueProblem(text);
+  if (problem == nullptr && parseValue(text_, password_.value)) return ValueForm::kBytes;
+  password_.problem = problem != nullptr ? problem : "the line cannot be parsed";
+  return ValueForm::kBroken;
 }
 
 bool RecordWalker::next() {
@@ -149,21 +126,18 @@ bool RecordWalker::next() {
 }
 
 void writeChanged(const LogicalLine& line, const std::string& description, const Secret& value, Secret& out) {
-  const bool asText = value.empty() || ldif_is_not_printable(value.c_str(), value.size()) == 0;
+  const LdifLibrary& library = ldifLibrary();
+  const bool asText = value.empty() || library.isNotPrintable(value.c_str(), value.size()) == 0;
   Secret text;
   text.resize(LDIF_SIZE_NEEDED_WRAP(description.size(), value.size(), LDIF_LINE_WIDTH_MAX) + 1);
   char* end = text.data();
   // Folding is done below: the library would end every line in a bare newline.
-  ldif_sput_wrap(&end, asText ? LDIF_PUT_TEXT : LDIF_PUT_BINARY, description.c_str(), value.c_str(), value.size(),
-                 LDIF_LINE_WIDTH_MAX);
+  library.putLine(&end, asText ? LDIF_PUT_TEXT : LDIF_PUT_BINARY, description.c_str(), value.c_str(), value.size(),
+                  LDIF_LINE_WIDTH_MAX);
   text.resize(static_cast<std::size_t>(end - text.data()));
   std::string_view written = text.view();
   if (!written.empty() && written.back() == '\n') written.remove_suffix(1);
-  if (line.folded()) {
-    foldInto(written, line.firstEnd, out);
-  } else {
-    out.append(written);
-  }
+  line.folded() ? foldInto(written, line.firstEnd, out) : out.append(written);
   out.append(line.lastEnd);
 }
 

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Finding password values in LDIF records: which attributes are meant, the entry and the change that a line belongs to,
-// the value that a line stands for, and writing a changed value in the line's place.
+// Finding password values in LDIF records: the attributes that hold them, the entry and the change that a line belongs
+// to, the value that a line stands for, and writing a changed value in the line's place.
 #ifndef LDAPPW_TOOLS_LDIF_RECORD_H
 #define LDAPPW_TOOLS_LDIF_RECORD_H
 
@@ -13,8 +13,6 @@
 #include "secret.h"
 
 namespace tool {
-
-bool equalNames(std::string_view a, std::string_view b) noexcept;  // in any case (ASCII)
 
 // The attributes whose values are passwords. A description matches by its type: "userPassword;x-tag" is userPassword.
 class AttributeSet {
@@ -64,6 +62,7 @@ class RecordWalker {
   void readControl(std::string_view name, std::string_view text);
   void readName(std::string_view text);
   void readPassword(std::string_view description);
+  ValueForm readValue(std::string_view text);
 
   LineCursor cursor_;
   const AttributeSet& attributes_;

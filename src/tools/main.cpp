@@ -6,18 +6,30 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
-#include <CLI/CLI.hpp>
 #include <memory>
 #include <new>
 
-#include "common.h"
-#include "verbs.h"
+#include "command_line.h"
+#include "messages.h"
 
 namespace tool {
 namespace {
 
-// A descriptor 0, 1 or 2 that is not open would go to the next file that is: results would land in a stash file. The
-// direction is the wrong one, so that using the descriptor still fails.
+constexpr Verb kVerbs[] = {
+    {"identify", "Show the scheme of stored values and whether they are well formed", setUpIdentify},
+    {"format", "Make stored values of passwords, which are asked for or read one a line", setUpFormat},
+    {"verify", "Check a password, which is asked for or read, against a stored value", setUpVerify},
+    {"reveal", "Turn reversible values back into clear passwords, one a line", setUpReveal},
+    {"keys", "Make, restore, show and check key stash files", setUpKeys},
+#ifdef LDAPPW_WITH_LDIF
+    {"ldif", "Convert or audit the password values of a directory export (LDIF)", setUpLdif},
+    {"trial", "Put the clear passwords of an export through every scheme and compare", setUpTrial},
+#endif
+};
+
+// A descriptor 0, 1 or 2 that is not open would go to the next file that is opened, and messages would be written into
+// it: tool_test and ldif_test run with all three closed. The direction is the wrong one, so that using the descriptor
+// still fails.
 void occupyStandardDescriptors() {
   for (int fd = STDIN_FILENO; fd <= STDERR_FILENO; ++fd) {
     if (fcntl(fd, F_GETFD) >= 0 || errno != EBADF) continue;
@@ -32,7 +44,7 @@ void prepareProcess() {
   setrlimit(RLIMIT_CORE, &noCore);  // a core file would hold passwords and keys
 }
 
-// Usage lines without the arguments that are there to be refused.
+// Usage lines without the arguments that exist only to be refused.
 class HelpFormatter : public CLI::Formatter {
  public:
   std::string make_option_usage(const CLI::Option* option) const override {
@@ -42,41 +54,40 @@ class HelpFormatter : public CLI::Formatter {
   }
 };
 
-// Shows of unexpected arguments only the names of options: the rest may be a secret.
-int tellUsage(const CLI::App& app, const CLI::ParseError& error) {
+// Of unexpected arguments only the names of options are shown: what follows a name may be a secret, and so may all
+// else.
+std::string optionName(const std::string& argument) {
+  if (argument.size() < 2 || argument.front() != '-') return "";
+  return argument[1] == '-' ? argument.substr(0, argument.find('=')) : argument.substr(0, 2);
+}
+
+ExitCode reportUsage(const CLI::App& app, const CLI::ParseError& error) {
   if (dynamic_cast<const CLI::ExtrasError*>(&error) == nullptr) {
     message(error.what());
     return kUsage;
   }
   std::string names;
   for (const std::string& argument : app.remaining(true)) {
-    if (argument.size() > 1 && argument.front() == '-') names += " " + argument.substr(0, argument.find('='));
+    const std::string name = optionName(argument);
+    if (!name.empty()) names += " " + name;
   }
   message(names.empty() ? "there is an argument too many (--help shows what is taken)" : "unknown option:" + names);
   return kUsage;
 }
 
-int parseAndRun(int argc, char** argv) {
-  int exitCode = kSuccess;
+ExitCode parseAndRun(int argc, char** argv) {
+  ExitCode exitCode = kSuccess;
   CLI::App app("Password protection for an LDAP directory server: stored values, key stash files, directory exports",
                "ldappw");
   app.set_version_flag("--version", "ldappw " LDAPPW_VERSION);
   app.require_subcommand(1);
   app.formatter(std::make_shared<HelpFormatter>());
-  app.footer("Results go to standard output, messages to standard error. \"ldappw VERB --help\" tells more.");
-  addIdentify(app, exitCode);
-  addFormat(app, exitCode);
-  addVerify(app, exitCode);
-  addReveal(app, exitCode);
-  addKeys(app, exitCode);
-#ifdef LDAPPW_WITH_LDIF
-  addLdif(app, exitCode);
-  addTrial(app, exitCode);
-#endif
+  app.footer("Results go to standard output, messages to standard error. \"ldappw VERB --help\" says more.");
+  for (const Verb& row : kVerbs) addVerb(app, row, exitCode);
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& error) {
-    if (error.get_exit_code() != 0) return tellUsage(app, error);
+    if (error.get_exit_code() != 0) return reportUsage(app, error);
     app.exit(error);  // --help or --version
     std::cout.flush();
     return std::cout ? kSuccess : kIoError;
@@ -84,7 +95,7 @@ int parseAndRun(int argc, char** argv) {
   return exitCode;
 }
 
-int guarded(int argc, char** argv) {
+ExitCode guarded(int argc, char** argv) {
   try {
     return parseAndRun(argc, argv);
   } catch (const Failure& failure) {

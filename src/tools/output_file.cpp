@@ -10,9 +10,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <memory>
-
-#include "common.h"
+#include "failure.h"
+#include "messages.h"
+#include "secret.h"
 #include "signals.h"
 
 namespace tool {
@@ -20,16 +20,8 @@ namespace {
 
 constexpr std::size_t kShownNameBytes = 200;  // of the target, so that the temporary name is not too long
 
-struct Free {
-  void operator()(char* text) const noexcept { free(text); }
-};
-
-Failure ioFailure(const std::string& what) {
-  return Failure(kIoError, systemText(what, errno));
-}
-
 std::string realPath(const std::string& path) {
-  const std::unique_ptr<char, Free> resolved(realpath(path.c_str(), nullptr));
+  const AllocatedText resolved(realpath(path.c_str(), nullptr));
   if (!resolved) throw ioFailure(path);
   return resolved.get();
 }
@@ -40,7 +32,7 @@ std::string folderOf(const std::string& path) {
   return slash == 0 ? "/" : path.substr(0, slash);
 }
 
-// The path of a file that need not be there, with its folder resolved.
+// The path of a file that need not exist, with its folder resolved.
 std::string canonical(const std::string& path) {
   const std::size_t slash = path.rfind('/');
   const std::string name = slash == std::string::npos ? path : path.substr(slash + 1);
@@ -50,11 +42,11 @@ std::string canonical(const std::string& path) {
 }
 
 Failure existsFailure(const std::string& path) {
-  return Failure(kUsage, path + " is there already; --force replaces it");
+  return Failure(kUsage, path + " exists already; --force replaces it");
 }
 
-// Renames without replacing a file that came up meanwhile. File systems that cannot do that in one step are asked
-// first.
+// Renames without replacing a file that has appeared meanwhile. On a file system that cannot do that in one step, it
+// looks first.
 int renameToNew(const std::string& from, const std::string& to) {
   if (renameat2(AT_FDCWD, from.c_str(), AT_FDCWD, to.c_str(), RENAME_NOREPLACE) == 0) return 0;
   if (errno != EINVAL && errno != ENOSYS) return -1;
@@ -73,22 +65,14 @@ OutputFile::OutputFile(const std::string& target, mode_t mode, bool overwrite) :
   const bool replaces = stat(target_.c_str(), &old) == 0;
   const std::size_t slash = target_.rfind('/');
   std::string path = target_.substr(0, slash + 1) + "." + target_.substr(slash + 1, kShownNameBytes) + ".XXXXXX";
-  {
-    const SignalBlock block;
-    fd_ = Descriptor(mkostemp(path.data(), O_CLOEXEC));
-    if (!fd_.valid()) throw ioFailure("a new file beside " + target_);
-    temporary_ = path;
-    cleanupSlot_ = removeOnSignal(path);
-  }
+  const SignalBlock block;  // until the file is on the list of what a signal removes
+  fd_ = Descriptor(mkostemp(path.data(), O_CLOEXEC));
+  if (!fd_.valid()) throw ioFailure("a new file beside " + target_);
+  temporary_ = TemporaryFile(path);
   if (replaces && fchown(fd_.get(), old.st_uid, old.st_gid) != 0) {
-    warning(target_ + " will not keep its owner: " + systemText("chown", errno));
+    warning(target_ + " will not keep its owner: " + strerror(errno));
   }
-  if (fchmod(fd_.get(), mode) != 0) {
-    const Failure failure = ioFailure(temporary_);
-    unlink(temporary_.c_str());
-    forgetFile(cleanupSlot_);
-    throw failure;
-  }
+  if (fchmod(fd_.get(), mode) != 0) throw ioFailure(path);
 }
 
 void OutputFile::resolveTarget(const std::string& target, bool overwrite) {
@@ -103,19 +87,9 @@ void OutputFile::resolveTarget(const std::string& target, bool overwrite) {
   if (!overwrite && lstat(target_.c_str(), &found) == 0) throw existsFailure(target);
 }
 
-OutputFile::~OutputFile() {
-  if (!temporary_.empty()) unlink(temporary_.c_str());
-  forgetFile(cleanupSlot_);
-}
-
 void OutputFile::write(std::string_view bytes) {
   synced_ = false;
-  while (!bytes.empty()) {
-    const ssize_t count = ::write(fd_.get(), bytes.data(), bytes.size());
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) throw ioFailure(target_);
-    bytes.remove_prefix(static_cast<std::size_t>(count));
-  }
+  writeAll(fd_.get(), bytes, target_);
 }
 
 void OutputFile::sync() {
@@ -125,19 +99,18 @@ void OutputFile::sync() {
 
 void OutputFile::commit() {
   if (!synced_) sync();
-  const int renamed = overwrite_ ? rename(temporary_.c_str(), target_.c_str()) : renameToNew(temporary_, target_);
+  const std::string& from = temporary_.path();
+  const int renamed = overwrite_ ? rename(from.c_str(), target_.c_str()) : renameToNew(from, target_);
   if (renamed != 0 && errno == EEXIST) throw existsFailure(target_);
   if (renamed != 0) throw ioFailure(target_);
-  forgetFile(cleanupSlot_);
-  cleanupSlot_ = -1;
-  temporary_.clear();
-  fd_.reset();
+  temporary_.forget();
+  fd_ = Descriptor();
   syncFolder();
 }
 
-// The name has changed already: a folder that cannot be synced (some file systems refuse) is told, not taken back.
+// The name has changed already: that a folder cannot be synced is reported, not undone. Some file systems refuse.
 void OutputFile::syncFolder() {
-  const Descriptor folder(open(folderOf(target_).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  const Descriptor folder = openPath(folderOf(target_), O_RDONLY | O_DIRECTORY);
   if (folder.valid() && fsync(folder.get()) == 0) return;
   if (errno != EINVAL && errno != EACCES) throw ioFailure(folderOf(target_));
 }

@@ -1,16 +1,16 @@
 // SPDX-License-Identifier: Apache-2.0
 // A file that appears under its name only when it is complete: written to a new file in the same folder, brought to the
-// disk, then renamed. The temporary file goes on every failure and when a signal ends the process.
+// disk, then renamed. The temporary file is removed on every failure and when a signal ends the process.
 #ifndef LDAPPW_TOOLS_OUTPUT_FILE_H
 #define LDAPPW_TOOLS_OUTPUT_FILE_H
 
 #include <sys/types.h>
 
-#include <cstddef>
 #include <string>
 #include <string_view>
 
-#include "secret.h"
+#include "descriptor.h"
+#include "signals.h"
 
 namespace tool {
 
@@ -18,21 +18,18 @@ namespace tool {
 // Used by one thread.
 class OutputFile {
  public:
-  // Makes the temporary file with the given mode. A target that is a symbolic link is followed; one that is there keeps
+  // Makes the temporary file with the given mode. A target that is a symbolic link is followed; one that exists keeps
   // its owner and group where the process may set them. Anything but a regular file is refused.
   OutputFile(const std::string& target, mode_t mode, bool overwrite);
-  OutputFile(const OutputFile&) = delete;
-  OutputFile& operator=(const OutputFile&) = delete;
-  ~OutputFile();
 
   const std::string& target() const noexcept { return target_; }
-  const std::string& temporaryPath() const noexcept { return temporary_; }
+  const std::string& temporaryPath() const noexcept { return temporary_.path(); }
   int fd() const noexcept { return fd_.get(); }
 
   void write(std::string_view bytes);
   // Brings the content to the disk. Nothing has appeared under the target's name yet.
   void sync();
-  // sync, then gives the file its name and brings the folder to the disk.
+  // Does that where it has not been done, then gives the file its name and brings the folder to the disk.
   void commit();
 
  private:
@@ -40,9 +37,8 @@ class OutputFile {
   void syncFolder();
 
   std::string target_;
-  std::string temporary_;
+  TemporaryFile temporary_;
   Descriptor fd_;
-  int cleanupSlot_ = -1;
   bool overwrite_;
   bool synced_ = false;
 };

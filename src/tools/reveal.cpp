@@ -1,14 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
-// ldappw reveal: the clear text of reversible values. JSON is written by hand here, so that clear text stays in memory
-// that is wiped.
-#include <unistd.h>
-
-#include <CLI/CLI.hpp>
+// ldappw reveal: the clear text of reversible values.
 #include <memory>
 
 #include "command_line.h"
-#include "common.h"
-#include "verbs.h"
+#include "messages.h"
+#include "text.h"
+#include "values.h"
 
 namespace tool {
 namespace {
@@ -19,88 +16,53 @@ struct Options {
   bool json = false;
 };
 
-class Revealer {
- public:
-  explicit Revealer(const Options& options) : options_(options), key_(KeyRecord::load(options.keys)) {}
+bool isOneLine(const Secret& clear) {
+  return clear.view().find_first_of(std::string_view("\n\0", 2)) == std::string_view::npos;
+}
 
-  void one(std::string_view value) {
-    ++index_;
-    Status status = revealValue(value, key_, clear_);
-    if (status.ok() && !oneLine() && !options_.json) {
+void showJson(const Scheme& scheme, const Secret& clear, std::size_t index, Results& results) {
+  Json json;
+  json.number("index", index).text("scheme", scheme.name);
+  isOneLine(clear) && wellFormedUtf8(clear.view()) ? json.text("password", clear.view())
+                                                   : json.base64("password_base64", clear.view());
+  results.line(json.end());
+}
+
+ExitCode reveal(const Options& options) {
+  if (!options.keys.empty()) requireProvider();  // no value can be opened by it without keys
+  const KeyRecord key = KeyRecord::load(options.keys);
+  ExitCode exitCode = kSuccess;
+  Results results;
+  std::size_t index = 0;
+  forEachValue(*options.values, results, [&](const Secret& whole) {
+    const StoredValue value(whole);
+    Secret clear;
+    Status status = openValue(value, key, clear);
+    if (status.ok() && !options.json && !isOneLine(clear)) {
       status = {kBadValue, "the password is not one line of text: --json shows it"};
     }
+    keepFirst(exitCode, status.code);
+    ++index;
     if (!status.ok()) {
-      tellProblem(status);
-    } else if (options_.json) {
-      showJson(schemeOf(value));
+      message("value " + std::to_string(index) + ": " + status.text);
+      if (options.json) results.line(problemJson(index, status).end());
     } else {
-      results_.line(clear_.view());
+      options.json ? showJson(value.scheme(), clear, index, results) : results.line(clear.view());
     }
-    clear_.clear();
-  }
-
-  void flush() { results_.flush(); }
-  int exitCode() const noexcept { return exitCode_; }
-
- private:
-  bool oneLine() const { return clear_.view().find_first_of(std::string_view("\n\0", 2)) == std::string_view::npos; }
-
-  void tellProblem(const Status& status) {
-    message("value " + std::to_string(index_) + ": " + status.text);
-    keepFirst(exitCode_, status.code);
-    if (options_.json) results_.line(problemJson(index_, status));
-  }
-
-  void showJson(const Scheme& scheme) {
-    Secret line("{\"index\":" + std::to_string(index_) + ",\"scheme\":\"" + scheme.name + "\",\"password");
-    if (oneLine() && wellFormedUtf8(clear_.view())) {
-      line.append("\":");
-      appendJsonString(line, clear_.view());
-    } else {
-      line.append("_base64\":\"");
-      appendBase64(line, clear_.view());
-      line.append('"');
-    }
-    line.append('}');
-    results_.line(line.view());
-  }
-
-  const Options& options_;
-  const KeyRecord key_;
-  Results results_;
-  Secret clear_;
-  std::size_t index_ = 0;
-  int exitCode_ = kSuccess;
-};
-
-int reveal(const Options& options) {
-  requireProvider();
-  Revealer revealer(options);
-  if (!options.values->empty()) {
-    for (const std::string& value : options.values->results()) revealer.one(value);
-  } else {
-    LineReader lines(STDIN_FILENO, "standard input");
-    Secret value;
-    while (lines.next(value)) {
-      revealer.one(value.view());
-      if (!lines.lineBuffered()) revealer.flush();
-    }
-  }
-  revealer.flush();
-  return revealer.exitCode();
+  });
+  return exitCode;
 }
 
 }  // namespace
 
-void addReveal(CLI::App& app, int& exitCode) {
+void setUpReveal(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  CLI::App* verb = app.add_subcommand("reveal", "Turn reversible values back into clear passwords, one a line");
-  options->values = addValues(*verb, "VALUE", "stored values; without any, one a line from standard input");
-  verb->add_option("--keys", options->keys, "key stash file, for the AES schemes")->type_name("FILE");
-  verb->add_flag(
+  options->values = addValues(verb, "VALUE", "stored values; without any, one a line from standard input");
+  addPath(verb, "--keys", options->keys, "key stash file, for the AES schemes");
+  verb.add_flag(
       "--json", options->json,
       "one JSON object a line: the password as text, or as password_base64 where it is not one line of UTF-8");
-  verb->callback([options, &exitCode] { exitCode = reveal(*options); });
+  verb.callback([options, &exitCode] { exitCode = reveal(*options); });
 }
 
 }  // namespace tool

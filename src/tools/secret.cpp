@@ -1,25 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
-// Owners of bytes that are wiped, and of descriptors.
 #include "secret.h"
 
-#include <errno.h>
-#include <fcntl.h>
-#include <string.h>
-#include <unistd.h>
-
 #include <algorithm>
+#include <cstdint>
 #include <cstdlib>
+#include <cstring>
 #include <new>
 #include <utility>
 
-#include "common.h"
-
 namespace tool {
-namespace {
-
-constexpr std::size_t kReadBytes = std::size_t{1} << 16;
-
-}  // namespace
 
 Secret::Secret(Secret&& other) noexcept
     : data_(std::exchange(other.data_, nullptr)),
@@ -80,6 +69,11 @@ void Secret::clear() noexcept {
   size_ = 0;
 }
 
+void WipeAndFree::operator()(char* text) const noexcept {
+  explicit_bzero(text, strlen(text));
+  free(text);
+}
+
 bool equalBytes(std::string_view a, std::string_view b) noexcept {
   if (a.size() != b.size()) return false;
   volatile unsigned char difference = 0;
@@ -87,75 +81,6 @@ bool equalBytes(std::string_view a, std::string_view b) noexcept {
     difference = static_cast<unsigned char>(difference | (a[i] ^ b[i]));
   }
   return difference == 0;
-}
-
-Descriptor& Descriptor::operator=(Descriptor&& other) noexcept {
-  if (this != &other) {
-    reset();
-    fd_ = other.release();
-  }
-  return *this;
-}
-
-int Descriptor::release() noexcept {
-  return std::exchange(fd_, -1);
-}
-
-void Descriptor::reset() noexcept {
-  if (fd_ >= 0) close(fd_);
-  fd_ = -1;
-}
-
-Descriptor openInput(const std::string& path) {
-  Descriptor file(open(path.c_str(), O_RDONLY | O_NOCTTY | O_CLOEXEC));
-  if (!file.valid()) throw Failure(kIoError, systemText(path, errno));
-  return file;
-}
-
-bool LineReader::lineBuffered() const noexcept {
-  return ended_ || buffer_.view().find('\n', position_) != std::string_view::npos;
-}
-
-// Drops what was handed out and reads once more; false at the end of the input.
-bool LineReader::fill() {
-  if (ended_) return false;
-  if (position_ > 0) {
-    const std::size_t rest = buffer_.size() - position_;
-    memmove(buffer_.data(), buffer_.data() + position_, rest);
-    buffer_.resize(rest);
-    position_ = 0;
-  }
-  const std::size_t before = buffer_.size();
-  buffer_.resize(before + kReadBytes);
-  ssize_t count = 0;
-  do {
-    count = read(fd_, buffer_.data() + before, kReadBytes);
-  } while (count < 0 && errno == EINTR);
-  const int error = errno;
-  buffer_.resize(before + static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
-  if (count < 0) throw Failure(kIoError, systemText(name_, error));
-  ended_ = count == 0;
-  return !ended_;
-}
-
-bool LineReader::next(Secret& line) {
-  line.clear();
-  std::size_t searched = position_;
-  for (;;) {
-    const std::size_t end = buffer_.view().find('\n', searched);
-    if (end != std::string_view::npos) {
-      line.append(buffer_.view().substr(position_, end - position_));
-      position_ = end + 1;
-      return true;
-    }
-    const std::size_t pending = buffer_.size() - position_;
-    if (!fill()) break;
-    searched = pending;
-  }
-  if (position_ == buffer_.size()) return false;
-  line.append(buffer_.view().substr(position_));
-  position_ = buffer_.size();
-  return true;
 }
 
 }  // namespace tool

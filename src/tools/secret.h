@@ -1,11 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
-// Bytes that are wiped before their memory is released, and reading them from a file descriptor without a copy that
-// nobody wipes.
+// Owners of bytes that are wiped before their memory is released.
 #ifndef LDAPPW_TOOLS_SECRET_H
 #define LDAPPW_TOOLS_SECRET_H
 
 #include <cstddef>
-#include <string>
+#include <memory>
 #include <string_view>
 
 namespace tool {
@@ -41,50 +40,14 @@ class Secret {
   char none_ = '\0';
 };
 
+// A text that a C function allocated: wiped up to its NUL, then released with free().
+struct WipeAndFree {
+  void operator()(char* text) const noexcept;
+};
+using AllocatedText = std::unique_ptr<char, WipeAndFree>;
+
 // True when both hold the same bytes. The time depends on the two lengths alone.
 bool equalBytes(std::string_view a, std::string_view b) noexcept;
-
-// An open file descriptor, closed on destruction.
-class Descriptor {
- public:
-  Descriptor() noexcept = default;
-  explicit Descriptor(int fd) noexcept : fd_(fd) {}
-  Descriptor(Descriptor&& other) noexcept : fd_(other.release()) {}
-  Descriptor& operator=(Descriptor&& other) noexcept;
-  ~Descriptor() { reset(); }
-  int get() const noexcept { return fd_; }
-  bool valid() const noexcept { return fd_ >= 0; }
-  int release() noexcept;
-  void reset() noexcept;
-
- private:
-  int fd_ = -1;
-};
-
-// Opens a file to be read; throws Failure with kIoError.
-Descriptor openInput(const std::string& path);
-
-// Splits what a descriptor delivers into lines. The newline is no part of a line, a carriage return stays, and a last
-// line without a newline counts. The descriptor stays the caller's.
-class LineReader {
- public:
-  // name is what messages call the input.
-  LineReader(int fd, std::string name) : fd_(fd), name_(std::move(name)) {}
-
-  // Puts the next line into line; false at the end of the input. Throws Failure with kIoError.
-  bool next(Secret& line);
-  // False when next() may have to wait for input: the moment to flush results.
-  bool lineBuffered() const noexcept;
-
- private:
-  bool fill();
-
-  int fd_;
-  std::string name_;
-  Secret buffer_;
-  std::size_t position_ = 0;
-  bool ended_ = false;
-};
 
 }  // namespace tool
 

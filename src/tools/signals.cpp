@@ -8,6 +8,10 @@
 #include <unistd.h>
 
 #include <cstring>
+#include <utility>
+
+#include "descriptor.h"
+#include "failure.h"
 
 namespace tool {
 namespace {
@@ -47,23 +51,25 @@ void undoAll() noexcept {
   if (terminal.quiet != 0) tcsetattr(terminal.fd, TCSANOW, &terminal.normal);
 }
 
-// The signal is blocked while its handler runs: raised again, it takes its default effect on the return.
-extern "C" void onEnd(int number) {
-  undoAll();
-  signal(number, SIG_DFL);
-  raise(number);
-}
-
-extern "C" void onSuspend(int number);
-
-void handle(int number, void (*handler)(int)) noexcept {
-  struct sigaction before;
-  if (sigaction(number, nullptr, &before) != 0 || before.sa_handler == SIG_IGN) return;  // as of nohup: stays ignored
+void install(int number, void (*handler)(int)) noexcept {
   struct sigaction action {};
   action.sa_handler = handler;
   action.sa_mask = endingSet();
   action.sa_flags = SA_RESTART;
   sigaction(number, &action, nullptr);
+}
+
+void handle(int number, void (*handler)(int)) noexcept {
+  struct sigaction before;
+  if (sigaction(number, nullptr, &before) != 0 || before.sa_handler == SIG_IGN) return;  // as of nohup: stays ignored
+  install(number, handler);
+}
+
+// The signal is blocked while its handler runs: raised again, it takes its default effect on the return.
+extern "C" void onEnd(int number) {
+  undoAll();
+  signal(number, SIG_DFL);
+  raise(number);
 }
 
 // Stops with the terminal as it was found, and goes on with echo off.
@@ -77,13 +83,9 @@ extern "C" void onSuspend(int number) {
   sigaddset(&only, number);
   pthread_sigmask(SIG_UNBLOCK, &only, nullptr);  // the process stops here
   pthread_sigmask(SIG_BLOCK, &only, nullptr);
-  struct sigaction action {};
-  action.sa_handler = onSuspend;
-  action.sa_mask = endingSet();
-  action.sa_flags = SA_RESTART;
-  sigaction(number, &action, nullptr);
+  install(number, onSuspend);
   tcsetattr(terminal.fd, TCSANOW, &terminal.silent);
-  if (write(terminal.promptFd, terminal.prompt, strlen(terminal.prompt)) < 0) errno = savedErrno;
+  tryWrite(terminal.promptFd, {terminal.prompt, strlen(terminal.prompt)});
   errno = savedErrno;
 }
 
@@ -102,42 +104,52 @@ SignalBlock::~SignalBlock() {
   pthread_sigmask(SIG_SETMASK, &before_, nullptr);
 }
 
-int removeOnSignal(const std::string& path) noexcept {
-  const SignalBlock block;
-  if (path.size() >= PATH_MAX) return -1;
-  for (int i = 0; i < kFileSlots; ++i) {
-    FileSlot& slot = fileSlots[i];
-    if (slot.used != 0) continue;
-    memcpy(slot.path, path.c_str(), path.size() + 1);
-    slot.used = 1;
-    handleEndings();
-    return i;
+TemporaryFile::TemporaryFile(std::string path) noexcept : path_(std::move(path)) {
+  if (path_.size() >= PATH_MAX) return;
+  for (int i = 0; i < kFileSlots && slot_ < 0; ++i) {
+    if (fileSlots[i].used == 0) slot_ = i;
   }
-  return -1;
+  if (slot_ < 0) return;
+  memcpy(fileSlots[slot_].path, path_.c_str(), path_.size() + 1);
+  fileSlots[slot_].used = 1;
+  handleEndings();
 }
 
-void forgetFile(int slot) noexcept {
-  if (slot >= 0) fileSlots[slot].used = 0;
+TemporaryFile& TemporaryFile::operator=(TemporaryFile&& other) noexcept {
+  std::swap(path_, other.path_);
+  std::swap(slot_, other.slot_);
+  return *this;
 }
 
-bool quietTerminal(int fd, const termios& normal, const termios& quiet, int promptFd, const char* prompt) noexcept {
+TemporaryFile::~TemporaryFile() {
+  if (!path_.empty()) unlink(path_.c_str());
+  forget();
+}
+
+void TemporaryFile::forget() noexcept {
+  if (slot_ >= 0) fileSlots[slot_].used = 0;
+  slot_ = -1;
+  path_.clear();
+}
+
+QuietTerminal::QuietTerminal(int fd, const termios& normal, int promptFd, const char* prompt) {
   const SignalBlock block;
   terminal.fd = fd;
   terminal.promptFd = promptFd;
   terminal.prompt = prompt;
   terminal.normal = normal;
-  terminal.silent = quiet;
+  terminal.silent = normal;
+  terminal.silent.c_lflag &= ~static_cast<tcflag_t>(ECHO | ECHOE | ECHOK | ECHONL | ICANON);
+  terminal.silent.c_cc[VMIN] = 1;
+  terminal.silent.c_cc[VTIME] = 0;
+  if (tcsetattr(fd, TCSANOW, &terminal.silent) != 0) throw ioFailure("the terminal's echo cannot be switched off");
   terminal.quiet = 1;
   handleEndings();
   handle(SIGTSTP, onSuspend);
-  if (tcsetattr(fd, TCSANOW, &quiet) == 0) return true;
-  restoreTerminal();
-  return false;
 }
 
-void restoreTerminal() noexcept {
+QuietTerminal::~QuietTerminal() {
   const SignalBlock block;
-  if (terminal.quiet == 0) return;
   tcsetattr(terminal.fd, TCSANOW, &terminal.normal);
   terminal.quiet = 0;
   struct sigaction before;

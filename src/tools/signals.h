@@ -23,16 +23,34 @@ class SignalBlock {
   sigset_t before_;
 };
 
-// Has the file removed when a signal ends the process. Returns a slot for forgetFile, or -1 when the path is too long
-// or all slots are taken.
-int removeOnSignal(const std::string& path) noexcept;
-void forgetFile(int slot) noexcept;
+// A file that is removed on destruction and when a signal ends the process, where its path is not too long for that and
+// not too many others are waiting for it. Made while signals are held back, so that none finds the file unknown.
+class TemporaryFile {
+ public:
+  TemporaryFile() noexcept = default;
+  explicit TemporaryFile(std::string path) noexcept;
+  TemporaryFile(const TemporaryFile&) = delete;
+  TemporaryFile& operator=(TemporaryFile&& other) noexcept;
+  ~TemporaryFile();
 
-// Puts the terminal into the mode quiet and has the mode normal restored when a signal ends or suspends the process;
-// after a suspension quiet is set again and prompt (a static text) written to promptFd. False when the mode cannot be
-// set. One terminal at a time.
-bool quietTerminal(int fd, const termios& normal, const termios& quiet, int promptFd, const char* prompt) noexcept;
-void restoreTerminal() noexcept;
+  const std::string& path() const noexcept { return path_; }
+  void forget() noexcept;  // it has another name now
+
+ private:
+  std::string path_;
+  int slot_ = -1;
+};
+
+// Keeps echo and line editing of a terminal off while it exists. The mode normal comes back on destruction and when a
+// signal ends or suspends the process; after a suspension echo is off again and prompt (a static text) is written to
+// promptFd. One at a time. Throws Failure with kIoError.
+class QuietTerminal {
+ public:
+  QuietTerminal(int fd, const termios& normal, int promptFd, const char* prompt);
+  QuietTerminal(const QuietTerminal&) = delete;
+  QuietTerminal& operator=(const QuietTerminal&) = delete;
+  ~QuietTerminal();
+};
 
 }  // namespace tool
 

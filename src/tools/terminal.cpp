@@ -3,41 +3,17 @@
 // a line at 4095 bytes without a word.
 #include "terminal.h"
 
-#include <errno.h>
 #include <fcntl.h>
 #include <termios.h>
 #include <unistd.h>
 
-#include <cstring>
-
-#include "common.h"
+#include "failure.h"
 #include "signals.h"
 
 namespace tool {
 namespace {
 
 constexpr int kInput = STDIN_FILENO;
-
-class QuietTerminal {
- public:
-  QuietTerminal(const termios& normal, int promptFd, const char* prompt) {
-    termios quiet = normal;
-    quiet.c_lflag &= ~static_cast<tcflag_t>(ECHO | ECHOE | ECHOK | ECHONL | ICANON);
-    quiet.c_cc[VMIN] = 1;
-    quiet.c_cc[VTIME] = 0;
-    if (!quietTerminal(kInput, normal, quiet, promptFd, prompt)) {
-      throw Failure(kIoError, systemText("the terminal's echo cannot be switched off", errno));
-    }
-  }
-  ~QuietTerminal() { restoreTerminal(); }
-  QuietTerminal(const QuietTerminal&) = delete;
-  QuietTerminal& operator=(const QuietTerminal&) = delete;
-};
-
-void show(int fd, const char* text) noexcept {
-  const ssize_t written = write(fd, text, strlen(text));
-  static_cast<void>(written);  // without a prompt the answer can be typed all the same
-}
 
 void eraseCharacter(Secret& line) {
   auto continues = [](char byte) { return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U; };
@@ -63,39 +39,34 @@ Key edit(const termios& normal, char byte, Secret& line) {
   return Key::kByte;
 }
 
-char readByte() {
-  for (;;) {
-    char byte = 0;
-    const ssize_t count = read(kInput, &byte, 1);
-    if (count == 1) return byte;
-    if (count == 0) throw Failure(kIoError, "the terminal was closed");
-    if (errno != EINTR) throw Failure(kIoError, systemText("the terminal cannot be read", errno));
-  }
+char readByte(Secret& byte) {
+  byte.clear();
+  if (!Input().more(byte, 1)) throw Failure(kIoError, "the terminal was closed");
+  return byte.view().front();
 }
 
 }  // namespace
 
 Secret promptSecret(const char* prompt) {
   termios normal;
-  if (tcgetattr(kInput, &normal) != 0) throw Failure(kIoError, systemText("the terminal's mode is not known", errno));
-  const Descriptor own(open("/dev/tty", O_WRONLY | O_NOCTTY | O_CLOEXEC));
+  if (tcgetattr(kInput, &normal) != 0) throw ioFailure("the terminal's mode is not known");
+  const Descriptor own = openPath("/dev/tty", O_WRONLY);
   const int promptFd = own.valid() ? own.get() : STDERR_FILENO;
+  Secret byte;
   Secret line;
   Key key = Key::kByte;
   {
-    const QuietTerminal quiet(normal, promptFd, prompt);
-    show(promptFd, prompt);
-    while (key == Key::kByte) key = edit(normal, readByte(), line);
+    const QuietTerminal quiet(kInput, normal, promptFd, prompt);
+    tryWrite(promptFd, prompt);  // without a prompt the answer can be typed all the same
+    while (key == Key::kByte) key = edit(normal, readByte(byte), line);
   }
-  show(promptFd, "\n");
+  tryWrite(promptFd, "\n");
   if (key == Key::kEndOfInput) throw Failure(kUsage, "nothing was entered");
   return line;
 }
 
 SecretSource::SecretSource(const std::string& path)
-    : file_(path.empty() ? Descriptor() : openInput(path)),
-      interactive_(path.empty() && isatty(kInput) == 1),
-      lines_(file_.valid() ? file_.get() : kInput, path.empty() ? "standard input" : path) {}
+    : interactive_(path.empty() && isatty(kInput) == 1), lines_(path.empty() ? Input() : Input(path)) {}
 
 bool SecretSource::next(const char* prompt, Secret& out) {
   if (!interactive_) return lines_.next(out);

@@ -6,6 +6,7 @@
 
 #include <string>
 
+#include "input.h"
 #include "secret.h"
 
 namespace tool {
@@ -30,7 +31,6 @@ class SecretSource {
   bool lineBuffered() const noexcept { return !interactive_ && lines_.lineBuffered(); }
 
  private:
-  Descriptor file_;
   bool interactive_;
   LineReader lines_;
 };

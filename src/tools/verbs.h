@@ -1,8 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
-// The verbs of the command. Each function adds one verb to the command line; when the verb has run, its callback leaves
-// the exit code (an ExitCode of common.h) in exitCode. A Failure that leaves a callback is told by main.
+// The verbs of the command: each in a file of its own, and a row in main.cpp. A verb's function adds its options and
+// the callback that runs it and leaves the exit code. Failure may leave a callback; main reports it.
 #ifndef LDAPPW_TOOLS_VERBS_H
 #define LDAPPW_TOOLS_VERBS_H
+
+#include "failure.h"
 
 namespace CLI {
 class App;
@@ -10,13 +12,19 @@ class App;
 
 namespace tool {
 
-void addIdentify(CLI::App& app, int& exitCode);
-void addFormat(CLI::App& app, int& exitCode);
-void addVerify(CLI::App& app, int& exitCode);
-void addReveal(CLI::App& app, int& exitCode);
-void addKeys(CLI::App& app, int& exitCode);
-void addLdif(CLI::App& app, int& exitCode);
-void addTrial(CLI::App& app, int& exitCode);
+struct Verb {
+  const char* name;
+  const char* help;
+  void (*setUp)(CLI::App& verb, ExitCode& exitCode);
+};
+
+void setUpIdentify(CLI::App& verb, ExitCode& exitCode);
+void setUpFormat(CLI::App& verb, ExitCode& exitCode);
+void setUpVerify(CLI::App& verb, ExitCode& exitCode);
+void setUpReveal(CLI::App& verb, ExitCode& exitCode);
+void setUpKeys(CLI::App& verb, ExitCode& exitCode);
+void setUpLdif(CLI::App& verb, ExitCode& exitCode);
+void setUpTrial(CLI::App& verb, ExitCode& exitCode);
 
 }  // namespace tool
 

@@ -1,0 +1,125 @@
+// SPDX-License-Identifier: Apache-2.0
+// The threads of a pass. A thread reads its next batch itself and waits until its part is due, so there are never more
+// batches in memory than threads.
+#include "export_run.h"
+
+#include <algorithm>
+#include <condition_variable>
+#include <exception>
+#include <mutex>
+#include <system_error>
+#include <thread>
+
+#include "ldif_library.h"
+#include "messages.h"
+#include "progress.h"
+
+namespace tool {
+namespace {
+
+class Run {
+ public:
+  Run(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
+      const std::function<void(std::string_view)>& deliver)
+      : reader_(input),
+        attributes_(options.attributes),
+        progress_(input.fd(), options.resultsOnStdout),
+        work_(work),
+        deliver_(deliver) {}
+
+  Part all(unsigned threads) {
+    std::vector<std::thread> helpers;
+    helpers.reserve(threads);
+    try {
+      for (unsigned i = 1; i < threads; ++i) helpers.emplace_back([this] { loop(); });
+    } catch (const std::system_error&) {
+      // Fewer threads do the same work.
+    }
+    loop();
+    for (std::thread& helper : helpers) helper.join();
+    progress_.hide();
+    if (failure_) std::rethrow_exception(failure_);
+    return std::move(sum_);
+  }
+
+ private:
+  void loop() noexcept {
+    try {
+      Batch batch;
+      Part part;
+      while (take(batch)) {
+        RecordWalker walker(batch, attributes_);
+        work_(walker, part);
+        part.tally.entries = walker.entries();
+        if (!hand(batch, part)) return;
+        part.out.clear();
+        part = {std::move(part.out), {}, {}, kSuccess};
+      }
+    } catch (...) {
+      stop(std::current_exception());
+    }
+  }
+
+  bool take(Batch& batch) {
+    const std::lock_guard<std::mutex> lock(input_);
+    return !stopped() && reader_.next(batch);
+  }
+
+  bool hand(const Batch& batch, const Part& part) {
+    std::unique_lock<std::mutex> lock(output_);
+    turn_.wait(lock, [&] { return failure_ || due_ == batch.number; });
+    if (failure_) return false;
+    deliver_(part.out.view());
+    if (!part.messages.empty()) progress_.hide();
+    for (const std::string& text : part.messages) message(text);
+    keepFirst(sum_.exitCode, part.exitCode);
+    sum_.tally.add(part.tally);
+    progress_.advance(part.tally.entries, batch.text.size());
+    ++due_;
+    turn_.notify_all();
+    return true;
+  }
+
+  bool stopped() {
+    const std::lock_guard<std::mutex> lock(output_);
+    return static_cast<bool>(failure_);
+  }
+
+  void stop(std::exception_ptr failure) {
+    const std::lock_guard<std::mutex> lock(output_);
+    if (!failure_) failure_ = std::move(failure);
+    turn_.notify_all();
+  }
+
+  RecordReader reader_;
+  const AttributeSet attributes_;
+  Progress progress_;
+  const std::function<void(RecordWalker&, Part&)>& work_;
+  const std::function<void(std::string_view)>& deliver_;
+  std::mutex input_;
+  std::mutex output_;
+  std::condition_variable turn_;
+  std::uint64_t due_ = 0;
+  std::exception_ptr failure_;
+  Part sum_;
+};
+
+}  // namespace
+
+void Part::report(std::uint64_t line, const std::string& dn, ExitCode code, const std::string& text) {
+  messages.push_back("line " + std::to_string(line) + ": " + (dn.empty() ? "(no dn)" : dn) + ": " + text);
+  keepFirst(exitCode, code);
+}
+
+Input openExport(const ExportOptions& options) {
+  ldifLibrary();
+  return options.in == "-" ? Input() : Input(options.in);
+}
+
+Part runExport(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
+               const std::function<void(std::string_view out)>& deliver) {
+  const unsigned threads = options.threads > 0 ? options.threads : std::max(1U, std::thread::hardware_concurrency());
+  return Run(input, options, work, deliver).all(threads);
+}
+
+}  // namespace tool

@@ -1,0 +1,48 @@
+// SPDX-License-Identifier: Apache-2.0
+// Runs a pass over a directory export: batches of records through several threads, and what comes of them in the order
+// of the input. A pass is a work, which makes a part of one batch, and a delivery, which takes the output of the parts.
+#ifndef LDAPPW_TOOLS_EXPORT_RUN_H
+#define LDAPPW_TOOLS_EXPORT_RUN_H
+
+#include <cstdint>
+#include <functional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "failure.h"
+#include "input.h"
+#include "ldif_record.h"
+#include "tally.h"
+
+namespace tool {
+
+// What comes of one batch, and in sum of all.
+struct Part {
+  Secret out;
+  std::vector<std::string> messages;
+  Tally tally;
+  ExitCode exitCode = kSuccess;  // of the first problem
+
+  // Reports a problem with a value of an entry.
+  void report(std::uint64_t line, const std::string& dn, ExitCode code, const std::string& text);
+};
+
+struct ExportOptions {
+  std::string in = "-";                 // "-" for standard input
+  std::vector<std::string> attributes;  // none: userPassword
+  unsigned threads = 0;                 // 0: one a processor
+  bool resultsOnStdout = false;         // the progress line stays away from them
+};
+
+// Opens the export, and the library that its lines need. Throws Failure.
+Input openExport(const ExportOptions& options);
+
+// work runs on many threads at once; deliver, and all reporting, on one at a time, in order. An exception of either
+// ends all and leaves runExport. Returns the sum of the parts, without their output and messages.
+Part runExport(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
+               const std::function<void(std::string_view out)>& deliver);
+
+}  // namespace tool
+
+#endif

@@ -1,0 +1,57 @@
+// SPDX-License-Identifier: Apache-2.0
+// Bytes that come in, read without a copy that nobody wipes, and their lines.
+#ifndef LDAPPW_TOOLS_INPUT_H
+#define LDAPPW_TOOLS_INPUT_H
+
+#include <cstddef>
+#include <string>
+#include <utility>
+
+#include "descriptor.h"
+#include "secret.h"
+
+namespace tool {
+
+// A file, or standard input. Every operation throws Failure with kIoError.
+class Input {
+ public:
+  Input() : name_("standard input") {}
+  explicit Input(const std::string& path);
+
+  int fd() const noexcept;
+  const std::string& name() const noexcept { return name_; }  // for messages
+
+  // Appends what one read of at most so many bytes delivers; false at the end of the input.
+  bool more(Secret& buffer, std::size_t bytes);
+
+ private:
+  Descriptor file_;
+  std::string name_;
+};
+
+// Splits an input into lines. The newline is no part of a line, a carriage return stays, and a last line without a
+// newline counts.
+class LineReader {
+ public:
+  explicit LineReader(Input input) : input_(std::move(input)) {}
+
+  // Puts the next line into line; false at the end of the input.
+  bool next(Secret& line);
+  // False when next() may have to wait for input: the moment to flush results.
+  bool lineBuffered() const noexcept;
+
+ private:
+  bool fill();
+
+  Input input_;
+  Secret buffer_;
+  std::size_t position_ = 0;
+  bool ended_ = false;
+};
+
+// The first line of a file; throws Failure with kBadValue when there is none. what names it in the message.
+Secret firstLine(const std::string& path, const char* what);
+
+}  // namespace tool
+
+#endif

@@ -1,0 +1,46 @@
+// SPDX-License-Identifier: Apache-2.0
+// The record of one key stash file, and the provider that keys and digests need.
+#ifndef LDAPPW_TOOLS_KEY_RECORD_H
+#define LDAPPW_TOOLS_KEY_RECORD_H
+
+#include <string>
+#include <string_view>
+#include <utility>
+
+#include "aes_keys.h"
+
+namespace tool {
+
+// Move-only.
+class KeyRecord {
+ public:
+  KeyRecord() noexcept = default;
+  explicit KeyRecord(AesKeyData* record) noexcept : record_(record) {}
+  KeyRecord(KeyRecord&& other) noexcept : record_(std::exchange(other.record_, nullptr)) {}
+  KeyRecord& operator=(KeyRecord&& other) noexcept {
+    std::swap(record_, other.record_);
+    return *this;
+  }
+  ~KeyRecord() { freeAesKeyData(record_); }
+
+  // Loads a stash file and warns when others can read it; an empty path gives no record. Throws Failure: kIoError when
+  // the file cannot be opened, kBadKey when it is no stash file.
+  static KeyRecord load(const std::string& path);
+
+  AesKeyData* get() const noexcept { return record_; }
+  explicit operator bool() const noexcept { return record_ != nullptr; }
+  std::string_view sync() const noexcept;
+  std::string_view salt() const noexcept;
+
+ private:
+  AesKeyData* record_ = nullptr;
+};
+
+std::string_view viewOf(const SecBuffer& buffer) noexcept;
+
+// Loads the crypto provider; throws Failure with kInternal when it cannot be loaded. Call it before threads start.
+void requireProvider();
+
+}  // namespace tool
+
+#endif

@@ -1,0 +1,43 @@
+// SPDX-License-Identifier: Apache-2.0
+// ldappw keys check: compares a stash file with a sync text and a salt.
+#include <memory>
+
+#include "command_line.h"
+#include "keys.h"
+
+namespace tool {
+namespace {
+
+struct Options {
+  std::string file;
+  std::string sync;
+  std::string saltFile;
+  bool json = false;
+};
+
+ExitCode check(const Options& options) {
+  const KeyRecord record = KeyRecord::load(options.file);
+  Secret salt;
+  const bool withSalt = !options.saltFile.empty();
+  if (withSalt) salt = readSaltFile(options.saltFile);
+  int isMatch = 0;
+  requireDone(checkKeyStashFile(withSalt ? 1 : 0, record.get(), options.sync.c_str(), salt.c_str(), &isMatch),
+              options.file);
+  Results results;
+  results.line(options.json ? Json().flag("match", isMatch == 1).end() : isMatch == 1 ? "match" : "no match");
+  results.flush();
+  return isMatch == 1 ? kSuccess : kNoMatch;
+}
+
+}  // namespace
+
+void setUpKeysCheck(CLI::App& verb, ExitCode& exitCode) {
+  const auto options = std::make_shared<Options>();
+  addPath(verb, "FILE", options->file, "key stash file")->required();
+  verb.add_option("--sync", options->sync, "sync text")->required();
+  addPath(verb, "--salt-file", options->saltFile, "compare the salt too, with the first line of this file");
+  verb.add_flag("--json", options->json, "the result as a JSON object");
+  verb.callback([options, &exitCode] { exitCode = check(*options); });
+}
+
+}  // namespace tool

@@ -1,0 +1,108 @@
+// SPDX-License-Identifier: Apache-2.0
+// ldappw keys create: makes the two stash files.
+#include <sys/stat.h>
+
+#include <memory>
+
+#include "command_line.h"
+#include "keys.h"
+#include "terminal.h"
+
+namespace tool {
+namespace {
+
+struct Options {
+  std::string config;
+  std::string directory;
+  std::string seedFile;
+  std::string saltFile;
+  CLI::Option* secrets = nullptr;
+  bool force = false;
+  bool json = false;
+};
+
+bool sameFile(const std::string& a, const std::string& b) {
+  struct stat first {};
+  struct stat second {};
+  return a == b || (stat(a.c_str(), &first) == 0 && stat(b.c_str(), &second) == 0 && first.st_dev == second.st_dev &&
+                    first.st_ino == second.st_ino);
+}
+
+Secret askSeedTwice(const std::string& seedFile) {
+  SecretSource source(seedFile);
+  Secret seed = source.require("Seed: ", "seed");
+  if (source.interactive()) {
+    const Secret again = source.require("Seed again: ", "seed");
+    if (!equalBytes(seed.view(), again.view())) throw Failure(kUsage, "the two seeds are not the same");
+  }
+  requireSeed(seed);
+  return seed;
+}
+
+void showCreated(const Options& options, const KeyRecord& config, const KeyRecord& directory) {
+  Results results;
+  if (options.json) {
+    Json json;
+    json.text("config", options.config).text("directory", options.directory).text("sync", config.sync());
+    json.text("directory_sync", directory.sync()).text("directory_salt", directory.salt());
+    results.line(json.end());
+  } else {
+    results.line(config.sync());
+  }
+  results.flush();
+}
+
+// The directory's file first: its keys can be made again from seed and salt, the configuration's never.
+void commitBoth(OutputFile& config, OutputFile& directory) {
+  config.sync();
+  directory.sync();
+  directory.commit();
+  try {
+    config.commit();
+  } catch (const Failure& failure) {
+    throw Failure(failure.code(), std::string(failure.what()) + "; " + directory.target() + " has been replaced");
+  }
+}
+
+ExitCode create(const Options& options) {
+  refuseSecrets(options.secrets, "seed");
+  const Failure sameTarget(kUsage, "--config and --directory are the same file");
+  if (sameFile(options.config, options.directory)) throw sameTarget;
+  requireProvider();
+  Secret salt;
+  if (!options.saltFile.empty()) salt = readSaltFile(options.saltFile);
+  const Secret seed = askSeedTwice(options.seedFile);
+  OutputFile config(options.config, kStashMode, options.force);
+  OutputFile directory(options.directory, kStashMode, options.force);
+  if (config.target() == directory.target()) throw sameTarget;
+  char* syncText = nullptr;
+  const int code = createKeyStashFiles(config.temporaryPath().c_str(), directory.temporaryPath().c_str(), seed.c_str(),
+                                       &syncText, salt.empty() ? nullptr : salt.c_str());
+  const AllocatedText sync(syncText);
+  requireWritten(code, "the stash file " + options.config + " or " + options.directory);
+  const KeyRecord configRecord = readBack(config);
+  const KeyRecord directoryRecord = readBack(directory);
+  if (!sync || configRecord.sync() != sync.get() ||
+      !sameRecord(directoryRecord, deriveRecord(seed, directoryRecord.salt()))) {
+    throw Failure(kIoError, "the stash files do not hold what was to be written; nothing was replaced");
+  }
+  commitBoth(config, directory);
+  showCreated(options, configRecord, directoryRecord);
+  return kSuccess;
+}
+
+}  // namespace
+
+void setUpKeysCreate(CLI::App& verb, ExitCode& exitCode) {
+  const auto options = std::make_shared<Options>();
+  addPath(verb, "--config", options->config, "configuration stash file to make")->required();
+  addPath(verb, "--directory", options->directory, "directory stash file to make")->required();
+  addPath(verb, "--seed-file", options->seedFile, "read the seed from the first line of this file");
+  addPath(verb, "--salt-file", options->saltFile, "read the directory's salt from this file instead of drawing one");
+  verb.add_flag("--force", options->force, "replace files that exist");
+  verb.add_flag("--json", options->json, "the result as a JSON object");
+  options->secrets = addRefusedSecrets(verb, "SEED");
+  verb.callback([options, &exitCode] { exitCode = create(*options); });
+}
+
+}  // namespace tool

@@ -1,0 +1,76 @@
+// SPDX-License-Identifier: Apache-2.0
+// ldappw keys restore: makes a directory's stash file again.
+#include <memory>
+
+#include "command_line.h"
+#include "keys.h"
+#include "messages.h"
+#include "terminal.h"
+
+namespace tool {
+namespace {
+
+struct Options {
+  std::string file;
+  std::string seedFile;
+  std::string saltFile;
+  std::string expectSync;
+  CLI::Option* secrets = nullptr;
+  bool force = false;
+  bool json = false;
+};
+
+Secret readSalt(const Options& options, SecretSource& seedSource) {
+  if (!options.saltFile.empty()) return readSaltFile(options.saltFile);
+  SecretSource input("");
+  SecretSource& source = options.seedFile.empty() ? seedSource : input;
+  Secret salt = source.require("Salt: ", "salt");
+  requireSalt(salt);
+  return salt;
+}
+
+bool syncMatches(const KeyRecord& record, const std::string& sync) {
+  int isMatch = 0;
+  requireDone(checkKeyStashFile(0, record.get(), sync.c_str(), "", &isMatch), "the sync text could not be compared");
+  return isMatch == 1;
+}
+
+ExitCode restore(const Options& options) {
+  refuseSecrets(options.secrets, "seed");
+  requireProvider();
+  SecretSource source(options.seedFile);
+  const Secret seed = source.require("Seed: ", "seed");
+  requireSeed(seed);
+  const Secret salt = readSalt(options, source);
+  const KeyRecord expected = deriveRecord(seed, salt.view());
+  if (!options.expectSync.empty() && !syncMatches(expected, options.expectSync)) {
+    message("seed and salt do not give the expected sync text; nothing was written");
+    return kNoMatch;
+  }
+  OutputFile file(options.file, kStashMode, options.force);
+  requireWritten(restoreKeyStashFile(file.temporaryPath().c_str(), seed.c_str(), salt.c_str()), options.file);
+  if (!sameRecord(readBack(file), expected)) {
+    throw Failure(kIoError, options.file + " could not be written whole; nothing was replaced");
+  }
+  file.commit();
+  Results results;
+  results.line(options.json ? Json().text("sync", expected.sync()).end() : expected.sync());
+  results.flush();
+  return kSuccess;
+}
+
+}  // namespace
+
+void setUpKeysRestore(CLI::App& verb, ExitCode& exitCode) {
+  const auto options = std::make_shared<Options>();
+  addPath(verb, "FILE", options->file, "key stash file to make")->required();
+  addPath(verb, "--seed-file", options->seedFile, "read the seed from the first line of this file");
+  addPath(verb, "--salt-file", options->saltFile, "read the salt from the first line of this file");
+  verb.add_option("--expect-sync", options->expectSync, "write nothing unless seed and salt give this sync text");
+  verb.add_flag("--force", options->force, "replace a file that exists");
+  verb.add_flag("--json", options->json, "the result as a JSON object");
+  options->secrets = addRefusedSecrets(verb, "SEED");
+  verb.callback([options, &exitCode] { exitCode = restore(*options); });
+}
+
+}  // namespace tool

@@ -1,0 +1,65 @@
+// SPDX-License-Identifier: Apache-2.0
+// ldappw ldif: the command line of the conversion and the audit of a directory export.
+#include "ldif.h"
+
+#include <memory>
+
+#include "command_line.h"
+
+namespace tool {
+namespace {
+
+constexpr char kFooter[] =
+    "Conversion (--to) makes every clear or reversible value again and leaves all other bytes of the export as they "
+    "are. A\n"
+    "changed line keeps the spelling of its attribute, its options and its line ends; it is written as text or as "
+    "base64,\n"
+    "as the value needs, and folded at 76 columns only if the line was folded before. One-way values and values behind "
+    "a\n"
+    "URL are kept and counted. In change records the values of add and replace blocks are treated like those of "
+    "entries;\n"
+    "the values of delete blocks are kept, because they name what is stored.\n"
+    "What cannot be carried over unharmed is kept as it was and listed by DN on standard error, and the exit code is "
+    "not 0:\n"
+    "3 for an unknown tag, a malformed value or a password that the scheme cannot hold, 4 for a value that the old "
+    "keys do\n"
+    "not open; 5 when a file cannot be read or written, and then --out has not changed.\n"
+    "An audit (--audit) exits with 0 when it has no finding, else with the code of the first one. With --json it "
+    "writes one\n"
+    "object; with --verbose a line (with --json an object) for each value comes before it.";
+
+ExitCode run(const LdifOptions& options) {
+  if (options.audit == !options.to.empty()) throw Failure(kUsage, "give either --to or --audit");
+  if (options.audit && (!options.newKeys.empty() || options.out != "-")) {
+    throw Failure(kUsage, "--new-keys and --out go with --to");
+  }
+  if (!options.audit && options.json && options.out == "-") {
+    throw Failure(kUsage, "--json needs --out: the export goes to standard output");
+  }
+  return options.audit ? auditExport(options) : convertExport(options);
+}
+
+}  // namespace
+
+void setUpLdif(CLI::App& verb, ExitCode& exitCode) {
+  const auto options = std::make_shared<LdifOptions>();
+  verb.add_option("--to", options->to, "scheme to make the values again under");
+  verb.add_flag("--audit", options->audit, "count schemes and findings instead");
+  addPath(verb, "--keys", options->keys, "key stash file that opens the AES values of the export");
+  addPath(verb, "--new-keys", options->newKeys, "key stash file for the new values");
+  verb.add_option("--attribute", options->source.attributes, "attributes that hold passwords (default: userPassword)");
+  addPath(verb, "--in", options->source.in, "export to read (default: standard input)");
+  addPath(verb, "--out", options->out, "file to write (default: standard output); may be the one that is read");
+  verb.add_flag("--force", options->force, "replace the file of --out");
+  verb.add_flag("--allow-clear", options->allowClear, "allow --to clear");
+  verb.add_flag("--allow-binary", options->allowBinary,
+                "accept values that open into bytes that are not text; a wrong key gives such bytes now and then");
+  verb.add_option("--threads", options->source.threads, "threads to work with (default: one a processor)")
+      ->check(CLI::Range(1U, 256U));
+  verb.add_flag("--verbose", options->verbose, "in an audit, report every value");
+  verb.add_flag("--json", options->json, "counts as JSON, on standard output");
+  verb.footer(kFooter);
+  verb.callback([options, &exitCode] { exitCode = run(*options); });
+}
+
+}  // namespace tool

@@ -1,0 +1,34 @@
+// SPDX-License-Identifier: Apache-2.0
+// The two passes of ldappw ldif.
+#ifndef LDAPPW_TOOLS_LDIF_H
+#define LDAPPW_TOOLS_LDIF_H
+
+#include <string>
+
+#include "export_run.h"
+
+namespace tool {
+
+struct LdifOptions {
+  ExportOptions source;
+  std::string to;
+  std::string keys;
+  std::string newKeys;
+  std::string out = "-";
+  bool audit = false;
+  bool force = false;
+  bool allowClear = false;
+  bool allowBinary = false;  // what opens into bytes that are not text is taken for right
+  bool verbose = false;
+  bool json = false;
+};
+
+// Makes the password values again under another scheme or other keys, and leaves every other byte alone.
+ExitCode convertExport(const LdifOptions& options);
+
+// Counts which schemes the password values use, and what is wrong with them.
+ExitCode auditExport(const LdifOptions& options);
+
+}  // namespace tool
+
+#endif

@@ -1,0 +1,39 @@
+// SPDX-License-Identifier: Apache-2.0
+// Opening the LDAP client library.
+#include "ldif_library.h"
+
+#include <dlfcn.h>
+
+#include <cstring>
+#include <string>
+
+#include "failure.h"
+
+namespace tool {
+namespace {
+
+template <class Function>
+void resolve(void* library, const char* name, Function& function) {
+  void* address = library != nullptr ? dlsym(library, name) : nullptr;
+  if (address == nullptr) throw Failure(kInternal, std::string("directory exports cannot be read: ") + dlerror());
+  memcpy(&function, &address, sizeof function);
+}
+
+LdifLibrary openLibrary() {
+  void* library = dlopen(LDAPPW_LDAP_SONAME, RTLD_NOW | RTLD_LOCAL);
+  LdifLibrary functions{};
+  resolve(library, "ldif_parse_line2", functions.parseLine);
+  resolve(library, "ldif_sput_wrap", functions.putLine);
+  resolve(library, "ldif_is_not_printable", functions.isNotPrintable);
+  resolve(library, "ber_memfree", functions.release);
+  return functions;
+}
+
+}  // namespace
+
+const LdifLibrary& ldifLibrary() {
+  static const LdifLibrary library = openLibrary();
+  return library;
+}
+
+}  // namespace tool

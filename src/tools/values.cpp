@@ -1,0 +1,60 @@
+// SPDX-License-Identifier: Apache-2.0
+// What all schemes have in common when values are made, checked and opened; the rest is in their rows.
+#include "values.h"
+
+#include "password_schemes.h"
+
+namespace tool {
+namespace {
+
+// Beyond this a password is a mistake, and stored values stay within the library's int lengths.
+constexpr std::size_t kMaxPasswordBytes = std::size_t{1} << 28;
+constexpr std::size_t kMaxValueBytes = kMaxPasswordBytes * 2;
+
+constexpr Status kNoKey{kBadKey, "an AES value needs the key stash (--keys)"};
+
+Status valueProblem(const StoredValue& value, const KeyRecord& key) {
+  const Scheme& scheme = value.scheme();
+  if (value.whole().size() > kMaxValueBytes) return {kBadValue, "the value is too long"};
+  if (const char* problem = value.problem()) return {kBadValue, problem};
+  if (scheme.check == nullptr) return {kBadValue, "a value of this scheme can only be recognised"};
+  if (scheme.needsKey() && !key) return kNoKey;
+  return {};
+}
+
+}  // namespace
+
+Status passwordProblem(const Scheme& scheme, std::string_view password) {
+  if (scheme.make == nullptr) return {kBadValue, "values of this scheme cannot be made"};
+  if (password.find('\0') != std::string_view::npos) return {kBadValue, "the password holds a NUL byte"};
+  if (password.size() > kMaxPasswordBytes) return {kBadValue, "the password is longer than 256 MiB"};
+  const char* problem = scheme.passwordProblem != nullptr ? scheme.passwordProblem(password) : nullptr;
+  return problem != nullptr ? Status{kBadValue, problem} : Status{};
+}
+
+Status makeValue(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out) {
+  const Status problem = passwordProblem(scheme, password.view());
+  if (!problem.ok()) return problem;
+  if (scheme.needsKey() && !key) return kNoKey;
+  return scheme.make(scheme, key, password, out);
+}
+
+Status openValue(const StoredValue& value, const KeyRecord& key, Secret& out) {
+  const Status problem = valueProblem(value, key);
+  if (!problem.ok()) return problem;
+  out.clear();
+  if (value.scheme().open != nullptr) return value.scheme().open(value, key, out);
+  return {kBadValue, "the scheme is one-way: the password cannot be recovered from the value"};
+}
+
+Status checkValue(const StoredValue& value, const KeyRecord& key, const Secret& password) {
+  const Status problem = valueProblem(value, key);
+  return problem.ok() ? value.scheme().check(value, key, password) : problem;
+}
+
+bool serverAccepts(const Secret& value, const KeyRecord& key, const Secret& password) noexcept {
+  return verify_password(password.c_str(), static_cast<int>(password.size()), value.c_str(),
+                         static_cast<int>(value.size()), 1, key.get()) == LDAPPW_SUCCESS;
+}
+
+}  // namespace tool

@@ -1,0 +1,36 @@
+// SPDX-License-Identifier: Apache-2.0
+// Making, checking and opening stored values under any scheme. May be called from many threads at once, with one
+// KeyRecord for all of them.
+#ifndef LDAPPW_TOOLS_VALUES_H
+#define LDAPPW_TOOLS_VALUES_H
+
+#include <string_view>
+
+#include "failure.h"
+#include "key_record.h"
+#include "scheme.h"
+#include "secret.h"
+
+namespace tool {
+
+// Why the scheme cannot hold the password unharmed. A cut (see cutBytes) is no such reason.
+Status passwordProblem(const Scheme& scheme, std::string_view password);
+
+// Makes the stored value of a password; for clear text that is the password. The AES schemes need key (kBadKey
+// otherwise). Each call draws a salt of its own.
+Status makeValue(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out);
+
+// Turns a stored value into clear text; clear text comes back as it is. kBadValue for an unknown tag, a malformed
+// payload or a one-way scheme; kBadKey for an AES value when there is no key, or when the key does not open it.
+Status openValue(const StoredValue& value, const KeyRecord& key, Secret& out);
+
+// Checks a password against a stored value: kSuccess, kNoMatch, or the problem (as of openValue, one-way schemes
+// being fine). Bytes beyond comparedBytes do not count.
+Status checkValue(const StoredValue& value, const KeyRecord& key, const Secret& password);
+
+// The check that the server makes, which has no room for the AES value of a long password.
+bool serverAccepts(const Secret& value, const KeyRecord& key, const Secret& password) noexcept;
+
+}  // namespace tool
+
+#endif
