@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the verbs add to the command line in common: rows of verbs, paths, positional values taken as they are, and the
-// refusal of secrets among the arguments.
+// The verbs, each in a file of its own and a row in main.cpp, and what they add to the command line in common: paths,
+// positional values taken as they are, and the refusal of secrets among the arguments.
 #ifndef LDAPPW_TOOLS_COMMAND_LINE_H
 #define LDAPPW_TOOLS_COMMAND_LINE_H
 
@@ -8,11 +8,27 @@
 #include <functional>
 #include <string>
 
+#include "failure.h"
 #include "results.h"
 #include "secret.h"
-#include "verbs.h"
 
 namespace tool {
+
+// setUp adds the options of a verb and the callback that runs it and leaves the exit code. Failure may leave a
+// callback; main reports it.
+struct Verb {
+  const char* name;
+  const char* help;
+  void (*setUp)(CLI::App& verb, ExitCode& exitCode);
+};
+
+void setUpIdentify(CLI::App& verb, ExitCode& exitCode);
+void setUpFormat(CLI::App& verb, ExitCode& exitCode);
+void setUpVerify(CLI::App& verb, ExitCode& exitCode);
+void setUpReveal(CLI::App& verb, ExitCode& exitCode);
+void setUpKeys(CLI::App& verb, ExitCode& exitCode);
+void setUpLdif(CLI::App& verb, ExitCode& exitCode);
+void setUpTrial(CLI::App& verb, ExitCode& exitCode);
 
 void addVerb(CLI::App& app, const Verb& row, ExitCode& exitCode);
 

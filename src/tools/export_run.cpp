@@ -3,7 +3,11 @@
 // batches in memory than threads.
 #include "export_run.h"
 
+#include <sys/stat.h>
+#include <unistd.h>
+
 #include <algorithm>
+#include <chrono>
 #include <condition_variable>
 #include <exception>
 #include <mutex>
@@ -12,10 +16,68 @@
 
 #include "ldif_library.h"
 #include "messages.h"
-#include "progress.h"
 
 namespace tool {
 namespace {
+
+constexpr std::chrono::milliseconds kStep{200};
+constexpr char kClearLine[] = "\r\033[K";
+
+std::string whole(double number) {
+  return std::to_string(static_cast<std::uint64_t>(number));
+}
+
+// A line on standard error with entries, rate and time left, when that is a terminal. Used by one thread at a time.
+class Progress {
+ public:
+  // inputFd says how much there is to come, when it is a file. Results that go to a terminal are not disturbed.
+  Progress(int inputFd, bool resultsOnStdout);
+  ~Progress() { hide(); }
+  Progress(const Progress&) = delete;
+  Progress& operator=(const Progress&) = delete;
+
+  void advance(std::uint64_t entries, std::uint64_t bytes);
+  // Takes the line away, so that a message can be written.
+  void hide() noexcept;
+
+ private:
+  using Clock = std::chrono::steady_clock;
+
+  bool shown_;
+  bool visible_ = false;
+  std::uint64_t total_ = 0;
+  std::uint64_t entries_ = 0;
+  std::uint64_t bytes_ = 0;
+  Clock::time_point start_ = Clock::now();
+  Clock::time_point next_ = start_;
+};
+
+Progress::Progress(int inputFd, bool resultsOnStdout)
+    : shown_(isatty(STDERR_FILENO) == 1 && !(resultsOnStdout && isatty(STDOUT_FILENO) == 1)) {
+  struct stat status {};
+  if (fstat(inputFd, &status) == 0 && S_ISREG(status.st_mode)) total_ = static_cast<std::uint64_t>(status.st_size);
+}
+
+void Progress::advance(std::uint64_t entries, std::uint64_t bytes) {
+  entries_ += entries;
+  bytes_ += bytes;
+  const Clock::time_point now = Clock::now();
+  if (!shown_ || now < next_) return;
+  next_ = now + kStep;
+  const double seconds = std::chrono::duration<double>(now - start_).count();
+  const double rate = seconds > 0 ? static_cast<double>(entries_) / seconds : 0;
+  std::string line = kClearLine + std::to_string(entries_) + " entries, " + whole(rate) + " a second";
+  if (total_ > bytes_ && bytes_ > 0) {
+    line += ", " + whole(seconds * static_cast<double>(total_ - bytes_) / static_cast<double>(bytes_)) + " s left";
+  }
+  tryWrite(STDERR_FILENO, line);
+  visible_ = true;
+}
+
+void Progress::hide() noexcept {
+  if (visible_) tryWrite(STDERR_FILENO, kClearLine);
+  visible_ = false;
+}
 
 class Run {
  public:

@@ -6,9 +6,8 @@
 
 #include <cerrno>
 #include <cstring>
-#include <exception>
+#include <stdexcept>
 #include <string>
-#include <utility>
 
 namespace tool {
 
@@ -29,15 +28,13 @@ struct Status {
   bool ok() const noexcept { return code == kSuccess; }
 };
 
-class Failure : public std::exception {
+class Failure : public std::runtime_error {
  public:
-  Failure(ExitCode code, std::string text) : code_(code), text_(std::move(text)) {}
+  Failure(ExitCode code, const std::string& text) : std::runtime_error(text), code_(code) {}
   ExitCode code() const noexcept { return code_; }
-  const char* what() const noexcept override { return text_.c_str(); }
 
  private:
   ExitCode code_;
-  std::string text_;
 };
 
 // "what: <the system's text>" with kIoError, for a system call that failed.

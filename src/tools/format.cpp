@@ -1,7 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw format: makes stored values of clear passwords.
-#include <memory>
-
 #include "command_line.h"
 #include "messages.h"
 #include "terminal.h"

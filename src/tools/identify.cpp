@@ -1,8 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw identify: what a stored value is, without opening it. Values are never repeated in the output: they may be
 // clear text.
-#include <memory>
-
 #include "command_line.h"
 #include "scheme.h"
 #include "text.h"
@@ -15,18 +13,10 @@ struct Options {
   bool json = false;
 };
 
-const char* kindName(Kind kind) {
-  switch (kind) {
-    case Kind::kClear:
-      return "clear";
-    case Kind::kOneWay:
-      return "one-way";
-    case Kind::kReversible:
-      return "reversible";
-    case Kind::kUnknown:
-      break;
-  }
-  return "unknown";
+constexpr const char* kKindNames[] = {"clear", "one-way", "reversible", "unknown"};  // in the order of Kind
+
+const char* kindName(const Scheme& scheme) {
+  return kKindNames[static_cast<int>(scheme.kind)];
 }
 
 void showText(const StoredValue& value, const char* problem, Results& results) {
@@ -34,7 +24,7 @@ void showText(const StoredValue& value, const char* problem, Results& results) {
   const bool unknown = scheme.kind == Kind::kUnknown;
   const bool untagged = !scheme.isClear() && value.tag().empty();
   results.line(scheme.name + (unknown ? " " + printable(value.tag()) : "") + "\t" + std::to_string(scheme.code) + "\t" +
-               kindName(scheme.kind) + "\t" + (problem != nullptr ? problem : "well formed") +
+               kindName(scheme) + "\t" + (problem != nullptr ? problem : "well formed") +
                (untagged ? ", untagged" : ""));
 }
 
@@ -43,7 +33,7 @@ void showJson(const StoredValue& value, const char* problem, std::size_t index, 
   Json json;
   json.number("index", index);
   scheme.kind == Kind::kUnknown ? json.null("scheme") : json.text("scheme", scheme.name);
-  json.number("code", static_cast<unsigned>(scheme.code)).text("kind", kindName(scheme.kind));
+  json.number("code", static_cast<unsigned>(scheme.code)).text("kind", kindName(scheme));
   value.tag().empty() ? json.null("tag") : json.text("tag", printable(value.tag()));
   json.flag("well_formed", problem == nullptr);
   if (problem != nullptr) json.text("problem", problem);

@@ -28,7 +28,7 @@ std::string_view viewOf(const SecBuffer& buffer) noexcept {
 }
 
 KeyRecord KeyRecord::load(const std::string& path) {
-  if (path.empty()) return {};
+  if (path.empty()) return KeyRecord();
   const Input file(path);
   struct stat found {};
   if (fstat(file.fd(), &found) != 0) throw ioFailure(path);
@@ -47,11 +47,11 @@ KeyRecord KeyRecord::load(const std::string& path) {
 }
 
 std::string_view KeyRecord::sync() const noexcept {
-  return record_ != nullptr ? viewOf(record_->cryptoSync) : std::string_view();
+  return viewOf(record_->cryptoSync);
 }
 
 std::string_view KeyRecord::salt() const noexcept {
-  return record_ != nullptr ? viewOf(record_->cryptoSalt) : std::string_view();
+  return viewOf(record_->cryptoSalt);
 }
 
 void requireProvider() {

@@ -3,9 +3,9 @@
 #ifndef LDAPPW_TOOLS_KEY_RECORD_H
 #define LDAPPW_TOOLS_KEY_RECORD_H
 
+#include <memory>
 #include <string>
 #include <string_view>
-#include <utility>
 
 #include "aes_keys.h"
 
@@ -14,26 +14,22 @@ namespace tool {
 // Move-only.
 class KeyRecord {
  public:
-  KeyRecord() noexcept = default;
-  explicit KeyRecord(AesKeyData* record) noexcept : record_(record) {}
-  KeyRecord(KeyRecord&& other) noexcept : record_(std::exchange(other.record_, nullptr)) {}
-  KeyRecord& operator=(KeyRecord&& other) noexcept {
-    std::swap(record_, other.record_);
-    return *this;
-  }
-  ~KeyRecord() { freeAesKeyData(record_); }
+  explicit KeyRecord(AesKeyData* record = nullptr) noexcept : record_(record) {}
 
   // Loads a stash file and warns when others can read it; an empty path gives no record. Throws Failure: kIoError when
   // the file cannot be opened, kBadKey when it is no stash file.
   static KeyRecord load(const std::string& path);
 
-  AesKeyData* get() const noexcept { return record_; }
+  AesKeyData* get() const noexcept { return record_.get(); }
   explicit operator bool() const noexcept { return record_ != nullptr; }
-  std::string_view sync() const noexcept;
+  std::string_view sync() const noexcept;  // of a record that is there
   std::string_view salt() const noexcept;
 
  private:
-  AesKeyData* record_ = nullptr;
+  struct Free {
+    void operator()(AesKeyData* record) const noexcept { freeAesKeyData(record); }
+  };
+  std::unique_ptr<AesKeyData, Free> record_;
 };
 
 std::string_view viewOf(const SecBuffer& buffer) noexcept;

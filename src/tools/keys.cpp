@@ -8,7 +8,6 @@
 #include <cstdint>
 #include <iterator>
 
-#include "command_line.h"
 #include "input.h"
 
 namespace tool {
@@ -34,6 +33,14 @@ bool acceptable(const Secret& text, int type) {
 }
 
 }  // namespace
+
+void addSeedOptions(CLI::App& verb, SeedOptions& options, const std::string& saltHelp) {
+  addPath(verb, "--seed-file", options.seedFile, "read the seed from the first line of this file");
+  addPath(verb, "--salt-file", options.saltFile, saltHelp);
+  verb.add_flag("--force", options.force, "replace what exists");
+  verb.add_flag("--json", options.json, "the result as a JSON object");
+  options.secrets = addRefusedSecrets(verb, "SEED");
+}
 
 void requireSeed(const Secret& seed) {
   if (acceptable(seed, 0)) return;

@@ -6,10 +6,9 @@
 #include <string>
 #include <string_view>
 
+#include "command_line.h"
 #include "key_record.h"
 #include "output_file.h"
-#include "secret.h"
-#include "verbs.h"
 
 namespace tool {
 
@@ -19,6 +18,16 @@ void setUpKeysCreate(CLI::App& verb, ExitCode& exitCode);
 void setUpKeysRestore(CLI::App& verb, ExitCode& exitCode);
 void setUpKeysShow(CLI::App& verb, ExitCode& exitCode);
 void setUpKeysCheck(CLI::App& verb, ExitCode& exitCode);
+
+// The options of the verbs that make keys from a seed.
+struct SeedOptions {
+  std::string seedFile;
+  std::string saltFile;
+  CLI::Option* secrets = nullptr;
+  bool force = false;
+  bool json = false;
+};
+void addSeedOptions(CLI::App& verb, SeedOptions& options, const std::string& saltHelp);
 
 // Throws Failure (kBadValue) unless the text will do as a seed or a salt.
 void requireSeed(const Secret& seed);

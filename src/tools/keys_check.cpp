@@ -1,8 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw keys check: compares a stash file with a sync text and a salt.
-#include <memory>
-
-#include "command_line.h"
 #include "keys.h"
 
 namespace tool {

@@ -1,31 +1,20 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw keys create: makes the two stash files.
-#include <sys/stat.h>
-
-#include <memory>
-
-#include "command_line.h"
+#include <filesystem>
 #include "keys.h"
 #include "terminal.h"
 
 namespace tool {
 namespace {
 
-struct Options {
+struct Options : SeedOptions {
   std::string config;
   std::string directory;
-  std::string seedFile;
-  std::string saltFile;
-  CLI::Option* secrets = nullptr;
-  bool force = false;
-  bool json = false;
 };
 
 bool sameFile(const std::string& a, const std::string& b) {
-  struct stat first {};
-  struct stat second {};
-  return a == b || (stat(a.c_str(), &first) == 0 && stat(b.c_str(), &second) == 0 && first.st_dev == second.st_dev &&
-                    first.st_ino == second.st_ino);
+  std::error_code missing;
+  return a == b || std::filesystem::equivalent(a, b, missing);
 }
 
 Secret askSeedTwice(const std::string& seedFile) {
@@ -97,11 +86,7 @@ void setUpKeysCreate(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
   addPath(verb, "--config", options->config, "configuration stash file to make")->required();
   addPath(verb, "--directory", options->directory, "directory stash file to make")->required();
-  addPath(verb, "--seed-file", options->seedFile, "read the seed from the first line of this file");
-  addPath(verb, "--salt-file", options->saltFile, "read the directory's salt from this file instead of drawing one");
-  verb.add_flag("--force", options->force, "replace files that exist");
-  verb.add_flag("--json", options->json, "the result as a JSON object");
-  options->secrets = addRefusedSecrets(verb, "SEED");
+  addSeedOptions(verb, *options, "read the directory's salt from this file instead of drawing one");
   verb.callback([options, &exitCode] { exitCode = create(*options); });
 }
 

@@ -1,8 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw keys restore: makes a directory's stash file again.
-#include <memory>
-
-#include "command_line.h"
 #include "keys.h"
 #include "messages.h"
 #include "terminal.h"
@@ -10,14 +7,9 @@
 namespace tool {
 namespace {
 
-struct Options {
+struct Options : SeedOptions {
   std::string file;
-  std::string seedFile;
-  std::string saltFile;
   std::string expectSync;
-  CLI::Option* secrets = nullptr;
-  bool force = false;
-  bool json = false;
 };
 
 Secret readSalt(const Options& options, SecretSource& seedSource) {
@@ -64,12 +56,8 @@ ExitCode restore(const Options& options) {
 void setUpKeysRestore(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
   addPath(verb, "FILE", options->file, "key stash file to make")->required();
-  addPath(verb, "--seed-file", options->seedFile, "read the seed from the first line of this file");
-  addPath(verb, "--salt-file", options->saltFile, "read the salt from the first line of this file");
   verb.add_option("--expect-sync", options->expectSync, "write nothing unless seed and salt give this sync text");
-  verb.add_flag("--force", options->force, "replace a file that exists");
-  verb.add_flag("--json", options->json, "the result as a JSON object");
-  options->secrets = addRefusedSecrets(verb, "SEED");
+  addSeedOptions(verb, *options, "read the salt from the first line of this file");
   verb.callback([options, &exitCode] { exitCode = restore(*options); });
 }
 

@@ -1,9 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw keys show: what a stash file holds, with a fingerprint in place of each key.
-#include <memory>
-#include <vector>
-
-#include "command_line.h"
+#include <cstdio>
 #include "crypto_provider.h"
 #include "keys.h"
 #include "scheme.h"
@@ -18,12 +15,6 @@ constexpr unsigned kShownBytes = 8;
 struct Options {
   std::string file;
   bool json = false;
-};
-
-struct Fingerprint {
-  const char* name;
-  std::size_t keyBytes;
-  std::string text;
 };
 
 // A digest context of the provider.
@@ -54,33 +45,27 @@ class Sha256 {
   void* digest_ = nullptr;
 };
 
-Fingerprint fingerprintOf(const Scheme& scheme, const SecBuffer& key, Sha256& sha256) {
-  static constexpr char kHex[] = "0123456789abcdef";
-  unsigned char digest[kDigestBytes];
-  sha256.of(key, digest);
-  Fingerprint fingerprint{scheme.name, key.length, ""};
-  for (unsigned i = 0; i < kShownBytes; ++i) {
-    fingerprint.text += kHex[digest[i] >> 4];
-    fingerprint.text += kHex[digest[i] & 15U];
-  }
-  return fingerprint;
-}
-
-std::vector<Fingerprint> fingerprints(const KeyRecord& record) {
+// Calls work with the name, the bytes and the fingerprint of each key.
+template <class Work>
+void forEachKey(const KeyRecord& record, Work work) {
   Sha256 sha256;
-  std::vector<Fingerprint> all;
   for (const Scheme& scheme : kSchemes) {
-    if (scheme.needsKey()) all.push_back(fingerprintOf(scheme, record.get()->aesKeys[scheme.keyIndex], sha256));
+    if (!scheme.needsKey()) continue;
+    const SecBuffer& key = record.get()->aesKeys[scheme.keyIndex];
+    unsigned char digest[kDigestBytes];
+    sha256.of(key, digest);
+    char shown[2 * kShownBytes + 1];
+    for (unsigned i = 0; i < kShownBytes; ++i) snprintf(shown + 2 * i, 3, "%02x", static_cast<unsigned>(digest[i]));
+    work(scheme.name, key.length, shown);
   }
-  return all;
 }
 
 void showJson(const Options& options, const KeyRecord& record, Results& results) {
   Json json;
   json.text("file", options.file).text("sync", record.sync()).text("salt", record.salt()).openList("keys");
-  for (const Fingerprint& key : fingerprints(record)) {
-    json.open("").text("scheme", key.name).number("bytes", key.keyBytes).text("fingerprint", key.text).close();
-  }
+  forEachKey(record, [&](const char* name, unsigned bytes, const char* fingerprint) {
+    json.open("").text("scheme", name).number("bytes", bytes).text("fingerprint", fingerprint).close();
+  });
   results.line(json.closeList().end());
 }
 
@@ -91,9 +76,9 @@ void showText(const Options& options, const KeyRecord& record, Results& results)
   results.line("file: " + printable(options.file));
   results.line(characters("sync: ", record.sync()));
   results.line(characters("salt: ", record.salt()));
-  for (const Fingerprint& key : fingerprints(record)) {
-    results.line(std::string(key.name) + ": " + std::to_string(key.keyBytes) + " bytes, fingerprint " + key.text);
-  }
+  forEachKey(record, [&](const char* name, unsigned bytes, const char* fingerprint) {
+    results.line(name + (": " + std::to_string(bytes)) + " bytes, fingerprint " + fingerprint);
+  });
 }
 
 ExitCode show(const Options& options) {

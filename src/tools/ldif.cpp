@@ -2,31 +2,22 @@
 // ldappw ldif: the command line of the conversion and the audit of a directory export.
 #include "ldif.h"
 
-#include <memory>
-
 #include "command_line.h"
 
 namespace tool {
 namespace {
 
 constexpr char kFooter[] =
-    "Conversion (--to) makes every clear or reversible value again and leaves all other bytes of the export as they "
-    "are. A\n"
-    "changed line keeps the spelling of its attribute, its options and its line ends; it is written as text or as "
-    "base64,\n"
-    "as the value needs, and folded at 76 columns only if the line was folded before. One-way values and values behind "
-    "a\n"
-    "URL are kept and counted. In change records the values of add and replace blocks are treated like those of "
-    "entries;\n"
-    "the values of delete blocks are kept, because they name what is stored.\n"
-    "What cannot be carried over unharmed is kept as it was and listed by DN on standard error, and the exit code is "
-    "not 0:\n"
-    "3 for an unknown tag, a malformed value or a password that the scheme cannot hold, 4 for a value that the old "
-    "keys do\n"
-    "not open; 5 when a file cannot be read or written, and then --out has not changed.\n"
-    "An audit (--audit) exits with 0 when it has no finding, else with the code of the first one. With --json it "
-    "writes one\n"
-    "object; with --verbose a line (with --json an object) for each value comes before it.";
+    R"(Conversion (--to) makes every clear or reversible value again and leaves all other bytes of the export as they are. A
+changed line keeps the spelling of its attribute, its options and its line ends; it is written as text or as base64,
+as the value needs, and folded at 76 columns only if the line was folded before. One-way values and values behind a
+URL are kept and counted. In change records the values of add and replace blocks are treated like those of entries;
+the values of delete blocks are kept, because they name what is stored.
+What cannot be carried over unharmed is kept as it was and listed by DN on standard error, and the exit code is not 0:
+3 for an unknown tag, a malformed value or a password that the scheme cannot hold, 4 for a value that the old keys do
+not open; 5 when a file cannot be read or written, and then --out has not changed.
+An audit (--audit) exits with 0 when it has no finding, else with the code of the first one. With --json it writes one
+object; with --verbose a line (with --json an object) for each value comes before it.)";
 
 ExitCode run(const LdifOptions& options) {
   if (options.audit == !options.to.empty()) throw Failure(kUsage, "give either --to or --audit");

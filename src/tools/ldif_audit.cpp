@@ -53,19 +53,11 @@ Verdict auditValue(const StoredValue& value, const KeyRecord& keys, bool allowBi
 
 Verdict auditLine(const PasswordLine& password, const KeyRecord& keys, bool allowBinary, Tally& tally) {
   ++tally.totals[kValues];
-  switch (password.form) {
-    case ValueForm::kUrl:
-      ++tally.totals[kUrls];
-      return {"url", Condition::kFine, ""};
-    case ValueForm::kDeleted:
-      ++tally.totals[kDeleted];
-      return {"deleted", Condition::kFine, ""};
-    case ValueForm::kBroken:
-      return {"unknown", Condition::kBroken, password.problem};
-    case ValueForm::kBytes:
-      break;
-  }
-  return auditValue(StoredValue(password.value), keys, allowBinary, tally);
+  if (password.form == ValueForm::kBytes) return auditValue(StoredValue(password.value), keys, allowBinary, tally);
+  if (password.form == ValueForm::kBroken) return {"unknown", Condition::kBroken, password.problem};
+  const bool url = password.form == ValueForm::kUrl;
+  ++tally.totals[url ? kUrls : kDeleted];
+  return {url ? "url" : "deleted", Condition::kFine, ""};
 }
 
 void appendText(const RecordWalker& walker, const Verdict& verdict, Secret& out) {

@@ -87,17 +87,9 @@ Outcome convertValue(const Secret& whole, const Conversion& conversion, Secret& 
 }
 
 Outcome outcomeOf(const PasswordLine& password, const Conversion& conversion, Secret& made) {
-  switch (password.form) {
-    case ValueForm::kUrl:
-      return {kUrls, {}};
-    case ValueForm::kDeleted:
-      return {kDeleted, {}};
-    case ValueForm::kBroken:
-      return {kFailed, {kBadValue, password.problem}};
-    case ValueForm::kBytes:
-      break;
-  }
-  return convertValue(password.value, conversion, made);
+  if (password.form == ValueForm::kBytes) return convertValue(password.value, conversion, made);
+  if (password.form == ValueForm::kBroken) return {kFailed, {kBadValue, password.problem}};
+  return {password.form == ValueForm::kUrl ? kUrls : kDeleted, {}};
 }
 
 void convertLine(const RecordWalker& walker, const Conversion& conversion, Part& part) {

@@ -48,18 +48,18 @@ std::size_t lastBorder(std::string_view text, std::size_t from) noexcept {
 
 }  // namespace
 
-bool LineCursor::next(LogicalLine& line) noexcept {
-  if (rest_.empty()) return false;
-  const std::string_view start = rest_;
-  const std::string_view first = takeLine(rest_);
+bool takeLogicalLine(std::string_view& text, LogicalLine& line) noexcept {
+  if (text.empty()) return false;
+  const std::string_view start = text;
+  const std::string_view first = takeLine(text);
   line.first = contentOf(first);
   line.firstEnd = line.lastEnd = endOf(first);
   line.physicalLines = 1;
-  while (!line.blank() && !rest_.empty() && rest_.front() == ' ') {
-    line.lastEnd = endOf(takeLine(rest_));
+  while (!line.blank() && !text.empty() && text.front() == ' ') {
+    line.lastEnd = endOf(takeLine(text));
     ++line.physicalLines;
   }
-  line.raw = start.substr(0, start.size() - rest_.size());
+  line.raw = start.substr(0, start.size() - text.size());
   return true;
 }
 

@@ -25,16 +25,9 @@ struct LogicalLine {
   bool blank() const noexcept { return first.empty(); }
 };
 
-// Walks over the logical lines of a text. A blank line stands alone; a continuation line without a line before it is a
-// logical line of its own.
-class LineCursor {
- public:
-  explicit LineCursor(std::string_view text) noexcept : rest_(text) {}
-  bool next(LogicalLine& line) noexcept;
-
- private:
-  std::string_view rest_;
-};
+// Cuts the first logical line off the text; false when there is none. A blank line stands alone; a continuation line
+// without a line before it is a logical line of its own.
+bool takeLogicalLine(std::string_view& text, LogicalLine& line) noexcept;
 
 // The text of a logical line with the folding undone and without its line end.
 void unfold(const LogicalLine& line, Secret& out);

@@ -101,7 +101,7 @@ ValueForm RecordWalker::readValue(std::string_view text) {
 
 bool RecordWalker::next() {
   atPassword_ = false;
-  if (!cursor_.next(line_)) return false;
+  if (!takeLogicalLine(rest_, line_)) return false;
   lineNumber_ = nextLineNumber_;
   nextLineNumber_ += line_.physicalLines;
   if (line_.blank()) startRecord();

@@ -44,7 +44,7 @@ struct PasswordLine {
 class RecordWalker {
  public:
   RecordWalker(const Batch& batch, const AttributeSet& attributes) noexcept
-      : cursor_(batch.text.view()), attributes_(attributes), nextLineNumber_(batch.firstLine) {}
+      : rest_(batch.text.view()), attributes_(attributes), nextLineNumber_(batch.firstLine) {}
 
   // False at the end of the batch.
   bool next();
@@ -64,7 +64,7 @@ class RecordWalker {
   void readPassword(std::string_view description);
   ValueForm readValue(std::string_view text);
 
-  LineCursor cursor_;
+  std::string_view rest_;
   const AttributeSet& attributes_;
   std::uint64_t nextLineNumber_;
   std::uint64_t lineNumber_ = 0;

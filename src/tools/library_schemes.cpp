@@ -16,18 +16,18 @@ namespace tool {
 namespace {
 
 constexpr std::size_t kLeastOutBytes = 1024;
+constexpr char kCryptCharacters[] = "./0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz";
 constexpr Status kNoMatchStatus{kNoMatch, "the password does not match"};
 
 bool drawCryptSalt(char (&salt)[3]) noexcept {
-  static constexpr char kSaltCharacters[] = "./0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz";
   unsigned char random[2];
   ssize_t count = 0;
   do {
     count = getrandom(random, sizeof random, 0);
   } while (count < 0 && errno == EINTR);
   if (count != static_cast<ssize_t>(sizeof random)) return false;
-  salt[0] = kSaltCharacters[random[0] & 63U];
-  salt[1] = kSaltCharacters[random[1] & 63U];
+  salt[0] = kCryptCharacters[random[0] & 63U];
+  salt[1] = kCryptCharacters[random[1] & 63U];
   salt[2] = '\0';
   return true;
 }
@@ -53,9 +53,8 @@ const char* base64Problem(const PayloadRule& rule, std::string_view payload) {
 }
 
 const char* cryptProblem(const PayloadRule& rule, std::string_view payload) {
-  const bool ours =
-      std::all_of(payload.begin(), payload.end(), [](char c) { return c == '.' || (isBase64(c) && c != '+'); });
-  return ours && payload.size() == 13 ? nullptr : rule.text;
+  const bool ours = payload.size() == 13 && payload.find_first_not_of(kCryptCharacters) == std::string_view::npos;
+  return ours ? nullptr : rule.text;
 }
 
 const char* maskedProblem(const PayloadRule& rule, std::string_view payload) {

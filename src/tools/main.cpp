@@ -6,7 +6,6 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
-#include <memory>
 #include <new>
 
 #include "command_line.h"

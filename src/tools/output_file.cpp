@@ -4,15 +4,15 @@
 
 #include <errno.h>
 #include <fcntl.h>
-#include <limits.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <filesystem>
+
 #include "failure.h"
 #include "messages.h"
-#include "secret.h"
 #include "signals.h"
 
 namespace tool {
@@ -20,41 +20,22 @@ namespace {
 
 constexpr std::size_t kShownNameBytes = 200;  // of the target, so that the temporary name is not too long
 
-std::string realPath(const std::string& path) {
-  const AllocatedText resolved(realpath(path.c_str(), nullptr));
-  if (!resolved) throw ioFailure(path);
-  return resolved.get();
-}
-
-std::string folderOf(const std::string& path) {
-  const std::size_t slash = path.rfind('/');
-  if (slash == std::string::npos) return ".";
-  return slash == 0 ? "/" : path.substr(0, slash);
-}
-
-// The path of a file that need not exist, with its folder resolved.
-std::string canonical(const std::string& path) {
-  const std::size_t slash = path.rfind('/');
-  const std::string name = slash == std::string::npos ? path : path.substr(slash + 1);
-  if (name.empty() || name == "." || name == "..") throw Failure(kUsage, "'" + path + "' does not name a file");
-  const std::string folder = realPath(folderOf(path));
-  return folder == "/" ? folder + name : folder + "/" + name;
+// The absolute path of a file that need not exist, links followed.
+std::string resolved(const std::string& path) {
+  std::error_code error;
+  const std::filesystem::path whole = std::filesystem::weakly_canonical(std::filesystem::absolute(path), error);
+  if (error) throw ioFailure(path, error.value());
+  return whole;
 }
 
 Failure existsFailure(const std::string& path) {
   return Failure(kUsage, path + " exists already; --force replaces it");
 }
 
-// Renames without replacing a file that has appeared meanwhile. On a file system that cannot do that in one step, it
-// looks first.
-int renameToNew(const std::string& from, const std::string& to) {
-  if (renameat2(AT_FDCWD, from.c_str(), AT_FDCWD, to.c_str(), RENAME_NOREPLACE) == 0) return 0;
-  if (errno != EINVAL && errno != ENOSYS) return -1;
-  if (access(to.c_str(), F_OK) == 0) {
-    errno = EEXIST;
-    return -1;
-  }
-  return rename(from.c_str(), to.c_str());
+// Renames without replacing a file that has appeared meanwhile. A file system that has no such step has links.
+bool renameToNew(const std::string& from, const std::string& to) {
+  if (renameat2(AT_FDCWD, from.c_str(), AT_FDCWD, to.c_str(), RENAME_NOREPLACE) == 0) return true;
+  return (errno == EINVAL || errno == ENOSYS) && link(from.c_str(), to.c_str()) == 0 && unlink(from.c_str()) == 0;
 }
 
 }  // namespace
@@ -76,15 +57,13 @@ OutputFile::OutputFile(const std::string& target, mode_t mode, bool overwrite) :
 }
 
 void OutputFile::resolveTarget(const std::string& target, bool overwrite) {
+  const std::string name = std::filesystem::path(target).filename();
   struct stat found {};
-  if (stat(target.c_str(), &found) == 0) {
-    if (!S_ISREG(found.st_mode)) throw Failure(kIoError, target + " is not a regular file");
-    if (!overwrite) throw existsFailure(target);
-    target_ = realPath(target);
-    return;
-  }
-  target_ = canonical(target);
-  if (!overwrite && lstat(target_.c_str(), &found) == 0) throw existsFailure(target);
+  const bool exists = stat(target.c_str(), &found) == 0;
+  if (exists && !S_ISREG(found.st_mode)) throw Failure(kIoError, target + " is not a regular file");
+  if (name.empty() || name == "." || name == "..") throw Failure(kUsage, "'" + target + "' does not name a file");
+  if (!overwrite && lstat(target.c_str(), &found) == 0) throw existsFailure(target);
+  target_ = resolved(target);
 }
 
 void OutputFile::write(std::string_view bytes) {
@@ -100,9 +79,9 @@ void OutputFile::sync() {
 void OutputFile::commit() {
   if (!synced_) sync();
   const std::string& from = temporary_.path();
-  const int renamed = overwrite_ ? rename(from.c_str(), target_.c_str()) : renameToNew(from, target_);
-  if (renamed != 0 && errno == EEXIST) throw existsFailure(target_);
-  if (renamed != 0) throw ioFailure(target_);
+  if (overwrite_ ? rename(from.c_str(), target_.c_str()) != 0 : !renameToNew(from, target_)) {
+    throw errno == EEXIST ? existsFailure(target_) : ioFailure(target_);
+  }
   temporary_.forget();
   fd_ = Descriptor();
   syncFolder();
@@ -110,9 +89,10 @@ void OutputFile::commit() {
 
 // The name has changed already: that a folder cannot be synced is reported, not undone. Some file systems refuse.
 void OutputFile::syncFolder() {
-  const Descriptor folder = openPath(folderOf(target_), O_RDONLY | O_DIRECTORY);
+  const std::string path = std::filesystem::path(target_).parent_path();
+  const Descriptor folder = openPath(path, O_RDONLY | O_DIRECTORY);
   if (folder.valid() && fsync(folder.get()) == 0) return;
-  if (errno != EINVAL && errno != EACCES) throw ioFailure(folderOf(target_));
+  if (errno != EINVAL && errno != EACCES) throw ioFailure(path);
 }
 
 }  // namespace tool

@@ -1,7 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw reveal: the clear text of reversible values.
-#include <memory>
-
 #include "command_line.h"
 #include "messages.h"
 #include "text.h"

@@ -4,7 +4,7 @@
 #ifndef LDAPPW_TOOLS_SCHEME_H
 #define LDAPPW_TOOLS_SCHEME_H
 
-#include <cstddef>
+#include <initializer_list>
 #include <string_view>
 
 #include "failure.h"
@@ -52,14 +52,8 @@ struct Scheme {
   bool cuts(std::size_t bytes) const noexcept { return cutBytes != 0 && bytes > cutBytes; }
 };
 
-// All schemes, clear text first, for a range loop.
-struct SchemeTable {
-  const Scheme* begin() const noexcept;
-  const Scheme* end() const noexcept;
-  std::size_t size() const noexcept { return static_cast<std::size_t>(end() - begin()); }
-  std::size_t indexOf(const Scheme& scheme) const noexcept { return static_cast<std::size_t>(&scheme - begin()); }
-};
-inline constexpr SchemeTable kSchemes;
+// All schemes, clear text first.
+extern const std::initializer_list<Scheme> kSchemes;
 
 // By name, in any case, with or without braces ("ssha", "{SSHA}", "clear"); null when there is none.
 const Scheme* findScheme(std::string_view name) noexcept;

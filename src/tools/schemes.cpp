@@ -5,7 +5,6 @@
 #include <limits.h>
 
 #include <algorithm>
-#include <iterator>
 
 #include "library_schemes.h"
 #include "password_schemes.h"
@@ -19,7 +18,13 @@ constexpr PayloadRule kAny{nullptr, 0, 0, 0, nullptr};
 constexpr PayloadRule kBlocks{base64Problem, 16, LONG_MAX, 16, "the payload is not a whole number of 16-byte blocks"};
 
 // clang-format off
-constexpr Scheme kRows[] = {
+// Outside the table: a tag of no known scheme.
+constexpr Scheme kUnknownScheme = {"unknown", "", FORMAT_NONE, Kind::kUnknown, 0, 0, kNoKey, false, kAny, "",
+    nullptr, nullptr, nullptr, nullptr};
+
+}  // namespace
+
+const std::initializer_list<Scheme> kSchemes = {
     // name, tag, code, kind, cut and compared bytes, key, provider, payload, foreign marks,
     //     passwords refused, made, checked, opened
     {"clear", "", FORMAT_NONE, Kind::kClear, 0, 46, kNoKey, false, kAny, "",
@@ -49,9 +54,9 @@ constexpr Scheme kRows[] = {
          nullptr, nullptr, nullptr, nullptr},
 };
 
-constexpr Scheme kUnknownScheme{
-    "unknown", "", FORMAT_NONE, Kind::kUnknown, 0, 0, kNoKey, false, kAny, "", nullptr, nullptr, nullptr, nullptr};
 // clang-format on
+
+namespace {
 
 const Scheme* schemeOfTag(std::string_view value) noexcept {
   const Scheme* found = nullptr;
@@ -72,14 +77,6 @@ const Scheme& schemeOfUntagged(std::string_view value) noexcept {
 }
 
 }  // namespace
-
-const Scheme* SchemeTable::begin() const noexcept {
-  return std::begin(kRows);
-}
-
-const Scheme* SchemeTable::end() const noexcept {
-  return std::end(kRows);
-}
 
 const Scheme* findScheme(std::string_view name) noexcept {
   for (const Scheme& scheme : kSchemes) {

@@ -4,6 +4,7 @@
 #ifndef LDAPPW_TOOLS_TALLY_H
 #define LDAPPW_TOOLS_TALLY_H
 
+#include <algorithm>
 #include <array>
 #include <cstdint>
 #include <string>
@@ -22,11 +23,21 @@ struct Tally {
 
   std::uint64_t entries = 0;
   std::array<std::uint64_t, kTotals> totals{};
-  std::vector<Row> schemes{kSchemes.size()};
+  std::vector<Row> schemes = std::vector<Row>(kSchemes.size());
 
-  Row& of(const Scheme& scheme) { return schemes[kSchemes.indexOf(scheme)]; }
-  const Row& of(const Scheme& scheme) const { return schemes[kSchemes.indexOf(scheme)]; }
-  void add(const Tally& part) noexcept;
+  Row& of(const Scheme& scheme) { return schemes[static_cast<std::size_t>(&scheme - kSchemes.begin())]; }
+  const Row& of(const Scheme& scheme) const { return const_cast<Tally*>(this)->of(scheme); }
+  void add(const Tally& part) noexcept {
+    entries += part.entries;
+    addRow(totals, part.totals);
+    for (std::size_t i = 0; i < schemes.size(); ++i) addRow(schemes[i], part.schemes[i]);
+  }
+
+ private:
+  template <std::size_t N>
+  static void addRow(std::array<std::uint64_t, N>& sum, const std::array<std::uint64_t, N>& part) noexcept {
+    for (std::size_t i = 0; i < N; ++i) sum[i] += part[i];
+  }
 };
 
 // The name of a total or column as a JSON field, and as text.
@@ -35,10 +46,16 @@ struct CountName {
   const char* text;
 };
 
-// Cells of a table: text filled up to width with blanks, before it or, for a left cell, after it.
-std::string cell(std::string_view text, std::size_t width);
-std::string cell(std::uint64_t number, std::size_t width);
-std::string leftCell(std::string_view text, std::size_t width);
+// Cells of a table: filled up to width with blanks, before a number or heading and after the name of a row.
+inline std::string cell(std::string_view text, std::size_t width) {
+  return std::string(width - std::min(width, text.size()), ' ').append(text);
+}
+inline std::string cell(std::uint64_t number, std::size_t width) {
+  return cell(std::to_string(number), width);
+}
+inline std::string leftCell(std::string_view text, std::size_t width) {
+  return std::string(text).append(width - std::min(width, text.size()), ' ');
+}
 
 // The fields of consecutive counts.
 template <std::size_t N>

@@ -45,8 +45,6 @@ char readByte(Secret& byte) {
   return byte.view().front();
 }
 
-}  // namespace
-
 Secret promptSecret(const char* prompt) {
   termios normal;
   if (tcgetattr(kInput, &normal) != 0) throw ioFailure("the terminal's mode is not known");
@@ -64,6 +62,8 @@ Secret promptSecret(const char* prompt) {
   if (key == Key::kEndOfInput) throw Failure(kUsage, "nothing was entered");
   return line;
 }
+
+}  // namespace
 
 SecretSource::SecretSource(const std::string& path)
     : interactive_(path.empty() && isatty(kInput) == 1), lines_(path.empty() ? Input() : Input(path)) {}

@@ -11,10 +11,6 @@
 
 namespace tool {
 
-// Writes prompt (a static text) to the terminal and reads one line of any length from standard input, a terminal,
-// without echo. Throws Failure: kUsage when the input ends without a line, kIoError otherwise.
-Secret promptSecret(const char* prompt);
-
 // Secrets that the user hands over one after the other: the lines of a file, or of standard input, or answers to
 // prompts when standard input is a terminal.
 class SecretSource {
@@ -23,7 +19,8 @@ class SecretSource {
   explicit SecretSource(const std::string& path);
 
   bool interactive() const noexcept { return interactive_; }
-  // The next secret, or false at the end; at a terminal prompt asks for it.
+  // The next secret, or false at the end. At a terminal, prompt (a static text) asks for it and a line of any length is
+  // read without echo. Throws Failure: kUsage when the terminal's input ends without a line, kIoError otherwise.
   bool next(const char* prompt, Secret& out);
   // The same where there has to be one: what names it in the message.
   Secret require(const char* prompt, const char* what);

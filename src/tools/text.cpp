@@ -16,6 +16,10 @@ std::uint32_t byteAt(std::string_view text, std::size_t i) noexcept {
   return static_cast<unsigned char>(text[i]);
 }
 
+bool isBase64(char c) noexcept {
+  return (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9') || c == '+' || c == '/';
+}
+
 }  // namespace
 
 bool sameName(std::string_view a, std::string_view b) noexcept {
@@ -86,10 +90,6 @@ std::string printable(std::string_view text) {
     ++i;
   }
   return shown;
-}
-
-bool isBase64(char c) noexcept {
-  return (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9') || c == '+' || c == '/';
 }
 
 long base64Bytes(std::string_view text) noexcept {

@@ -28,7 +28,6 @@ bool looksLikeText(std::string_view bytes) noexcept;
 // The text with control characters, and bytes that are not UTF-8, as \xNN.
 std::string printable(std::string_view text);
 
-bool isBase64(char c) noexcept;
 // The number of bytes that base64 text (RFC 4648, padded, no other characters) stands for, or -1 when it is none.
 long base64Bytes(std::string_view text) noexcept;
 

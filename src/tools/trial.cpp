@@ -4,7 +4,6 @@
 // which serves longer passwords.
 #include <time.h>
 
-#include <memory>
 #include <optional>
 
 #include "command_line.h"
@@ -34,11 +33,10 @@ constexpr CountName kColumnNames[] = {{"values", "values"},
                                       {"skipped", "skipped"}};
 
 constexpr char kNotes[] =
-    "verified: accepted by the server's check. refused: a password that differs in the first byte is not accepted.\n"
-    "recovered: read back and equal. values/s: made, checked twice and read back, per second of processor time.\n"
-    "crypt looks at the first 8 bytes of a password and qveil holds the first 46. ssha, md5 and crypt end at a NUL "
-    "byte.\n"
-    "skipped: a password with a NUL byte, or under sha one that begins with {SHA}, which no value can stand for.";
+    R"(verified: accepted by the server's check. refused: a password that differs in the first byte is not accepted.
+recovered: read back and equal. values/s: made, checked twice and read back, per second of processor time.
+crypt looks at the first 8 bytes of a password and qveil holds the first 46. ssha, md5 and crypt end at a NUL byte.
+skipped: a password with a NUL byte, or under sha one that begins with {SHA}, which no value can stand for.)";
 
 struct Options {
   ExportOptions source;

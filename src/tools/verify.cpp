@@ -1,7 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw verify: checks a password against a stored value and reports the result by its exit code.
-#include <memory>
-
 #include "command_line.h"
 #include "input.h"
 #include "messages.h"
