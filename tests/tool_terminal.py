@@ -19,12 +19,14 @@ PATIENCE = 60  # seconds until something that should come counts as missing
 
 
 class Terminal:
-    """A command on a terminal of its own."""
+    """A command on a terminal of its own. Whatever goes wrong, nothing is waited for without an end, and the command
+    does not outlive the test."""
 
     def __init__(self, *arguments, shell=None):
         self.seen = b""
         # The slave stays open here: the terminal's mode can be read after the command has gone.
         self.master, self.slave = pty.openpty()
+        os.set_blocking(self.master, False)
         self.pid = os.fork()
         if self.pid == 0:
             os.setsid()
@@ -35,32 +37,55 @@ class Terminal:
             command = ["bash", "-c", shell] if shell else [TOOL, *arguments]
             os.execvp(command[0], command)
 
+    def __enter__(self):
+        return self
+
+    def __exit__(self, *_):
+        os.close(self.slave)
+        os.close(self.master)
+        if self.pid:
+            os.kill(self.pid, signal.SIGKILL)
+            os.waitpid(self.pid, 0)
+
     def echo(self):
         flags = termios.tcgetattr(self.slave)[3]
         return bool(flags & termios.ECHO), bool(flags & termios.ICANON)
 
+    def read(self, patience):
+        if not select.select([self.master], [], [], patience)[0]:
+            return False
+        self.seen += os.read(self.master, 65536)
+        return True
+
     def until(self, text):
         while text not in self.seen:
-            assert select.select([self.master], [], [], PATIENCE)[0], f"{text!r} did not come, but {self.seen!r}"
-            self.seen += os.read(self.master, 4096)
+            assert self.read(PATIENCE), f"{text!r} did not come, but {self.seen!r}"
         self.seen = self.seen.partition(text)[2]
 
+    def asks(self, prompt):
+        self.until(prompt)
+        assert self.echo() == (False, False), "echo is on while a secret is typed"
+
     def type(self, text):
-        os.write(self.master, text)
+        deadline = time.monotonic() + PATIENCE
+        while text:
+            assert time.monotonic() < deadline, f"nobody reads what is typed: {self.seen[:200]!r}"
+            if select.select([], [self.master], [], 0.1)[1]:  # a terminal takes only so much at once
+                text = text[os.write(self.master, text[:256]):]
+            while self.read(0):
+                pass
 
     def end(self):
+        """The exit code and the modes that are left."""
         deadline = time.monotonic() + PATIENCE
-        status = None
-        while status is None:
-            assert time.monotonic() < deadline, f"the command does not end: {self.seen!r}"
-            pid, code = os.waitpid(self.pid, os.WNOHANG)
-            status = code if pid else None
-            while select.select([self.master], [], [], 0.01)[0]:
-                self.seen += os.read(self.master, 65536)
-        left = self.echo()
-        os.close(self.slave)
-        os.close(self.master)
-        return os.waitstatus_to_exitcode(status), left
+        while self.pid:
+            assert time.monotonic() < deadline, f"the command does not end: {self.seen[:200]!r}"
+            pid, status = os.waitpid(self.pid, os.WNOHANG)
+            if pid:
+                self.pid = 0
+            while self.read(0.01):
+                pass
+        return os.waitstatus_to_exitcode(status), self.echo()
 
 
 def stored(password):
@@ -69,55 +94,81 @@ def stored(password):
 
 
 def verify_prompt(typed, password, expected):
-    terminal = Terminal("verify", stored(password))
-    terminal.until(b"Password: ")
-    assert terminal.echo() == (False, False), "echo is on while a password is typed"
-    for start in range(0, len(typed), 500):  # a terminal takes only so much at once
-        terminal.type(typed[start:start + 500])
-        time.sleep(0.01)
-    code, left = terminal.end()
-    assert code == expected, (typed[:40], code, terminal.seen)
-    assert left == (True, True), "echo stays off"
-    assert password == b"" or password not in terminal.seen, "the password was shown"
+    with Terminal("verify", stored(password)) as terminal:
+        terminal.asks(b"Password: ")
+        terminal.type(typed)
+        code, left = terminal.end()
+        assert (code, left) == (expected, (True, True)), (code, left, terminal.seen)
+        assert password == b"" or password not in terminal.seen, "the password was shown"
 
 
 def ended_by(number, send):
-    terminal = Terminal("verify", stored(b"secret"))
-    terminal.until(b"Password: ")
-    terminal.type(b"sec")
-    send(terminal)
-    code, left = terminal.end()
-    assert code == -number, (number, code)
-    assert left == (True, True), f"echo stays off after signal {number}"
+    with Terminal("verify", stored(b"secret")) as terminal:
+        terminal.asks(b"Password: ")
+        terminal.type(b"sec")
+        send(terminal)
+        code, left = terminal.end()
+        assert (code, left) == (-number, (True, True)), (code, left)
 
 
 def suspended():
-    terminal = Terminal(shell=f"set -m; '{TOOL}' verify '{stored(b'secret')}'; echo stopped; read -r; "
-                              "fg >/dev/null; echo rc=$?")
-    terminal.until(b"Password: ")
-    terminal.type(b"\x1a")
-    terminal.until(b"stopped")
-    assert terminal.echo()[0], "echo stays off while suspended"
-    terminal.type(b"\n")
-    terminal.until(b"Password: ")
-    assert terminal.echo() == (False, False), "echo comes back on when it goes on"
-    terminal.type(b"secret\n")
-    terminal.until(b"rc=0")
-    assert terminal.end()[1] == (True, True)
+    shell = (f"set -m; '{TOOL}' verify '{stored(b'secret')}'; echo stopped; read -r; fg >/dev/null; echo rc=$?")
+    with Terminal(shell=shell) as terminal:
+        terminal.asks(b"Password: ")
+        terminal.type(b"\x1a")
+        terminal.until(b"stopped")
+        assert terminal.echo()[0], "echo stays off while suspended"
+        terminal.type(b"\n")
+        terminal.asks(b"Password: ")
+        terminal.type(b"secret\n")
+        terminal.until(b"rc=0")
+        assert terminal.end()[1] == (True, True)
 
 
 def create_keys(second, expected):
     with tempfile.TemporaryDirectory() as folder:
         config, directory = os.path.join(folder, "c"), os.path.join(folder, "d")
-        terminal = Terminal("keys", "create", "--config", config, "--directory", directory)
-        terminal.until(b"Seed: ")
-        terminal.type(b"correct-horse-battery\n")
-        terminal.until(b"Seed again: ")
-        terminal.type(second)
-        code, left = terminal.end()
-        assert (code, left) == (expected, (True, True)), (code, left, terminal.seen)
-        assert len(os.listdir(folder)) == (2 if expected == 0 else 0)
-        assert b"horse" not in terminal.seen
+        with Terminal("keys", "create", "--config", config, "--directory", directory) as terminal:
+            terminal.asks(b"Seed: ")
+            terminal.type(b"correct-horse-battery\n")
+            terminal.asks(b"Seed again: ")
+            terminal.type(second)
+            code, left = terminal.end()
+            assert (code, left) == (expected, (True, True)), (code, left, terminal.seen)
+            assert len(os.listdir(folder)) == (2 if expected == 0 else 0)
+            assert b"horse" not in terminal.seen
+
+
+def format_one():
+    """One password is asked for, and its value shown."""
+    with Terminal("format", "--scheme", "sha") as terminal:
+        terminal.asks(b"Password: ")
+        terminal.type(b"secret\n")
+        assert terminal.end() == (0, (True, True)) and b"{SHA}5en6G6MezRroT3XKqkdPOmY/BfQ=" in terminal.seen
+
+
+def from_file():
+    """A file is read and nothing is asked, on a terminal too."""
+    with tempfile.NamedTemporaryFile() as file:
+        file.write(b"secret\n")
+        file.flush()
+        with Terminal("verify", stored(b"secret"), "--password-file", file.name) as terminal:
+            assert terminal.end()[0] == 0 and terminal.seen.strip() == b"match", terminal.seen
+
+
+def progress():
+    """A line that goes away again; none where results go to the same terminal."""
+    if "ldif" not in subprocess.run([TOOL, "--help"], check=True, capture_output=True, text=True).stdout:
+        return
+    with tempfile.TemporaryDirectory() as folder:
+        export = os.path.join(folder, "in")
+        with open(export, "w", encoding="ascii") as file:
+            file.write("dn: a\nuserPassword: secret\n\n" * 40000)
+        for results, shown in (("--out " + os.path.join(folder, "out"), True), ("", False)):
+            with Terminal(shell=f"'{TOOL}' ldif --to sha --in {export} {results}") as terminal:
+                code = terminal.end()[0]
+                assert code == 0 and (b" entries, " in terminal.seen) == shown, (code, terminal.seen[:200])
+                assert terminal.seen.count(b"\r\x1b[K") >= 2 or not shown, "the progress line stays"
 
 
 TYPED = [
@@ -131,14 +182,25 @@ TYPED = [
     (b"\x04", b"secret", 2),
     (b"x" * 10000 + b"\n", b"x" * 10000, 0),
 ]
+TESTS = [
+    *[(verify_prompt, *row) for row in TYPED],
+    (ended_by, signal.SIGINT, lambda terminal: terminal.type(b"\x03")),
+    (ended_by, signal.SIGQUIT, lambda terminal: terminal.type(b"\x1c")),
+    (ended_by, signal.SIGTERM, lambda terminal: os.kill(terminal.pid, signal.SIGTERM)),
+    (ended_by, signal.SIGHUP, lambda terminal: os.kill(terminal.pid, signal.SIGHUP)),
+    (suspended,),
+    (create_keys, b"correct-horse-battery\n", 0),
+    (create_keys, b"correct-horse-batterY\n", 2),
+    (format_one,),
+    (from_file,),
+    (progress,),
+]
 
-for row in TYPED:
-    verify_prompt(row[0], row[1], row[2])
-ended_by(signal.SIGINT, lambda terminal: terminal.type(b"\x03"))
-ended_by(signal.SIGQUIT, lambda terminal: terminal.type(b"\x1c"))
-for sent in (signal.SIGTERM, signal.SIGHUP):
-    ended_by(sent, lambda terminal, sent=sent: os.kill(terminal.pid, sent))
-suspended()
-create_keys(b"correct-horse-battery\n", 0)
-create_keys(b"correct-horse-batterY\n", 2)
-print("terminal: all well")
+failures = 0
+for test, *row in TESTS:
+    try:
+        test(*row)
+    except AssertionError as failure:
+        failures += 1
+        print(f"FAIL: {test.__name__} {str(row)[:60]}: {failure}", file=sys.stderr)
+sys.exit(failures > 0)

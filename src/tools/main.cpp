@@ -61,16 +61,20 @@ std::string optionName(const std::string& argument) {
 }
 
 ExitCode reportUsage(const CLI::App& app, const CLI::ParseError& error) {
-  if (dynamic_cast<const CLI::ExtrasError*>(&error) == nullptr) {
-    message(error.what());
-    return kUsage;
-  }
   std::string names;
   for (const std::string& argument : app.remaining(true)) {
     const std::string name = optionName(argument);
     if (!name.empty()) names += " " + name;
   }
-  message(names.empty() ? "there is an argument too many (--help shows what is taken)" : "unknown option:" + names);
+  if (!names.empty()) {
+    message("unknown option:" + names);
+  } else if (dynamic_cast<const CLI::ExtrasError*>(&error) != nullptr) {
+    message("there is an argument too many (--help shows what is taken)");
+  } else if (dynamic_cast<const CLI::ConversionError*>(&error) != nullptr) {
+    message("an option has a value that it does not take (--help shows what is taken)");
+  } else {
+    message(error.what());
+  }
   return kUsage;
 }
 
