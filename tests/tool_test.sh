@@ -91,22 +91,22 @@ said 'open stash' 'warning: open is open to other'
 
 # A run that is stopped when both temporary files are complete: whatever ends it, the stash files stay what they were.
 preload() { HELD_SYNC=$1 LD_PRELOAD=$held ASAN_OPTIONS=${ASAN_OPTIONS:-}:verify_asan_link_order=0 "${@:2}"; }
-for end in TERM HUP KILL nohup; do
-  (
-    [ $end != nohup ] || trap '' HUP
-    preload stop exec "$tool" keys create --config cfg --directory dir --force <seed >/dev/null 2>&1
-  ) &
+while read -r signal disposition rc; do
+  (preload stop exec env "$disposition" "$tool" keys create --config cfg --directory dir --force <seed >/dev/null 2>&1) &
   pid=$!
   for _ in {1..600}; do [[ $(ps -o stat= $pid) == T* ]] && break || sleep 0.1; done
-  same "$end: temporary files" 2 "$(ls -A | grep -cE '^\.(cfg|dir)\.')"
-  kill -${end/nohup/HUP} $pid; kill -CONT $pid; wait $pid 2>/dev/null; rc=$?
-  case $end in
-    nohup) same "$end: exit code" 0 $rc; cmp -s dir dir.good && fail 'a signal that is ignored ended the run' ;;
-    *) same "$end: exit code" $((128 + $(kill -l $end))) $rc; sameFile "$end" dir.good dir; sameFile "$end" cfg.good cfg ;;
-  esac
-  [ $end != KILL ] || rm .cfg.* .dir.*  # nothing can tidy up after that
-  same "$end: left behind" '' "$(ls -A | grep -E '^\.(cfg|dir)\.')"
-done
+  same "$signal: temporary files" 2 "$(ls -A | grep -cE '^\.(cfg|dir)\.')"
+  kill -"$signal" $pid; kill -CONT $pid; wait $pid 2>/dev/null; same "$signal: exit code" "$rc" $?
+  [ "$rc" = 0 ] || { sameFile "$signal" dir.good dir; sameFile "$signal" cfg.good cfg; }
+  [ "$signal" != KILL ] || rm .cfg.* .dir.*  # nothing can tidy up after that
+  same "$signal: left behind" '' "$(ls -A | grep -E '^\.(cfg|dir)\.')"
+done <<'ROWS'
+TERM --default-signal=TERM 143
+INT --default-signal=INT 130
+HUP --default-signal=HUP 129
+KILL --default-signal=HUP 137
+HUP --ignore-signal=HUP 0
+ROWS
 cp dir.good dir
 preload fail "$tool" keys restore dir --force --seed-file seed --salt-file salt >/dev/null 2>err
 same 'a file that does not reach the disk' '5 ldappw: '"$work/dir: Input/output error" "$? $(cat err)"

@@ -19,7 +19,7 @@ struct Options {
 const Scheme& chosenScheme(const Options& options) {
   const Scheme* scheme = findScheme(options.scheme);
   if (scheme == nullptr) throw Failure(kUsage, "there is no scheme " + options.scheme);
-  if (scheme->isClear()) throw Failure(kUsage, "clear is no protection: choose another scheme");
+  if (scheme->isClear()) throw Failure(kUsage, "clear text is not protected: choose another scheme");
   if (scheme->make == nullptr) throw Failure(kUsage, std::string("values of ") + scheme->name + " cannot be made");
   if (scheme->needsKey() && options.keys.empty()) {
     throw Failure(kUsage, std::string(scheme->name) + " needs the key stash (--keys)");

@@ -17,12 +17,12 @@ class KeyRecord {
   explicit KeyRecord(AesKeyData* record = nullptr) noexcept : record_(record) {}
 
   // Loads a stash file and warns when others can read it; an empty path gives no record. Throws Failure: kIoError when
-  // the file cannot be opened, kBadKey when it is no stash file.
+  // the file cannot be opened, kBadKey when it is not a stash file.
   static KeyRecord load(const std::string& path);
 
   AesKeyData* get() const noexcept { return record_.get(); }
   explicit operator bool() const noexcept { return record_ != nullptr; }
-  std::string_view sync() const noexcept;  // of a record that is there
+  std::string_view sync() const noexcept;  // not of an empty one
   std::string_view salt() const noexcept;
 
  private:

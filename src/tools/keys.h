@@ -29,7 +29,7 @@ struct SeedOptions {
 };
 void addSeedOptions(CLI::App& verb, SeedOptions& options, const std::string& saltHelp);
 
-// Throws Failure (kBadValue) unless the text will do as a seed or a salt.
+// Throws Failure (kBadValue) unless the text is acceptable as a seed or a salt.
 void requireSeed(const Secret& seed);
 void requireSalt(const Secret& salt);
 

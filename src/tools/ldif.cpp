@@ -8,7 +8,7 @@ namespace tool {
 namespace {
 
 constexpr char kFooter[] =
-    R"(Conversion (--to) makes every clear or reversible value again and leaves all other bytes of the export as they are. A
+    R"(Conversion (--to) covers every clear or reversible value and leaves all other bytes of the export as they are. A
 changed line keeps the spelling of its attribute, its options and its line ends; it is written as text or as base64,
 as the value needs, and folded at 76 columns only if the line was folded before. One-way values and values behind a
 URL are kept and counted. In change records the values of add and replace blocks are treated like those of entries;
@@ -34,7 +34,7 @@ ExitCode run(const LdifOptions& options) {
 
 void setUpLdif(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<LdifOptions>();
-  verb.add_option("--to", options->to, "scheme to make the values again under");
+  verb.add_option("--to", options->to, "scheme to convert the values to");
   verb.add_flag("--audit", options->audit, "count schemes and findings instead");
   addPath(verb, "--keys", options->keys, "key stash file that opens the AES values of the export");
   addPath(verb, "--new-keys", options->newKeys, "key stash file for the new values");

@@ -23,7 +23,7 @@ struct LdifOptions {
   bool json = false;
 };
 
-// Makes the password values again under another scheme or other keys, and leaves every other byte alone.
+// Converts the password values to another scheme or other keys, and leaves every other byte alone.
 ExitCode convertExport(const LdifOptions& options);
 
 // Counts which schemes the password values use, and what is wrong with them.

@@ -32,7 +32,7 @@ enum Total : std::size_t {
 };
 
 constexpr CountName kNames[] = {
-    {"values", "password values"},         {"made", "made again"},
+    {"values", "password values"},         {"made", "converted"},
     {"cut", "of these cut by the scheme"}, {"asTheyAre", "clear already, kept"},
     {"oneWay", "one-way, kept"},           {"urls", "behind a URL, kept"},
     {"deleted", "to be deleted, kept"},    {"unknownTags", "with an unknown tag, kept"},
@@ -115,10 +115,10 @@ void convertBatch(RecordWalker& walker, const Conversion& conversion, Part& part
 const Scheme& targetOf(const LdifOptions& options) {
   const Scheme* scheme = findScheme(options.to);
   if (scheme == nullptr || scheme->make == nullptr) {
-    throw Failure(kUsage, options.to + " is no scheme that can be made");
+    throw Failure(kUsage, options.to + " is not a scheme that values can be made under");
   }
   if (scheme->isClear() && !options.allowClear) {
-    throw Failure(kUsage, "passwords are written in the clear with --allow-clear only");
+    throw Failure(kUsage, "passwords are written in the clear only with --allow-clear");
   }
   if (scheme->needsKey() && options.newKeys.empty()) throw Failure(kUsage, options.to + " needs --new-keys");
   return *scheme;

@@ -69,9 +69,9 @@ ExitCode reportUsage(const CLI::App& app, const CLI::ParseError& error) {
   if (!names.empty()) {
     message("unknown option:" + names);
   } else if (dynamic_cast<const CLI::ExtrasError*>(&error) != nullptr) {
-    message("there is an argument too many (--help shows what is taken)");
+    message("too many arguments (--help shows what is accepted)");
   } else if (dynamic_cast<const CLI::ConversionError*>(&error) != nullptr) {
-    message("an option has a value that it does not take (--help shows what is taken)");
+    message("an option has a value that it does not accept (--help shows which it does)");
   } else {
     message(error.what());
   }

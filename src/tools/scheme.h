@@ -20,7 +20,7 @@ enum class Kind { kClear, kOneWay, kReversible, kUnknown };
 // What a payload has to be: check says what is wrong with one, or null. For base64, the number of bytes that it stands
 // for: from least to most, in whole steps, else text is the problem.
 struct PayloadRule {
-  const char* (*check)(const PayloadRule& rule, std::string_view payload);  // null: any payload will do
+  const char* (*check)(const PayloadRule& rule, std::string_view payload);  // null: any payload is accepted
   long least;
   long most;
   long step;
@@ -39,7 +39,7 @@ struct Scheme {
   PayloadRule payload;
   const char* foreignMarks;  // a payload that begins with one of these is of another algorithm under the same tag
 
-  // Columns that are null: any password will do, values cannot be made, not be checked, not be opened. The functions
+  // Null: every password is accepted; values cannot be made, checked or opened. The functions
   // are called when the password, the payload and the key have been found to be in order.
   const char* (*passwordProblem)(std::string_view password);
   Status (*make)(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out);

@@ -13,7 +13,7 @@
 
 namespace tool {
 
-// Why the scheme cannot hold the password unharmed. A cut (see cutBytes) is no such reason.
+// Why the scheme cannot hold the password unharmed. A cut (see cutBytes) is not a reason.
 Status passwordProblem(const Scheme& scheme, std::string_view password);
 
 // Makes the stored value of a password; for clear text that is the password. The AES schemes need key (kBadKey
