@@ -57,4 +57,7 @@ json() {
     fail "$1: not '$2' but '$(head -c 600 out)'"
 }
 
-finish() { exit $((failures > 0)); }
+finish() {
+  echo "failures: $failures"
+  exit $((failures > 0))
+}

@@ -27,6 +27,7 @@ for package in slapd-ldappw:slapd 389-ds-ldappw:389-ds-base; do
   [[ "$(field ${package%:*} Depends)" == "libldappw1 (= $version), ${package#*:} "* ]] || fail "$package: depends"
 done
 grep -qw libldappw1 <<<"$(field ldappw Depends)" || fail "the command does not ask for its library"
+grep -qw 'libldap[-.0-9]*' <<<"$(field ldappw Depends)" || fail "the command does not ask for what it opens"
 grep -qw libssl3 <<<"$(field libldappw1 Depends)" || fail "the library does not ask for what its provider links"
 for library in "$root"/usr/lib/*/*.so.*; do
   name=$(objdump -p "$library" | awk '$1 == "SONAME" { print $2 }')

@@ -30,6 +30,8 @@ class Terminal:
         self.pid = os.fork()
         if self.pid == 0:
             os.setsid()
+            for number in (signal.SIGINT, signal.SIGQUIT, signal.SIGHUP):  # a shell may have them ignored
+                signal.signal(number, signal.SIG_DFL)
             own = os.open(os.ttyname(self.slave), os.O_RDWR)
             for descriptor in range(3):
                 os.dup2(own, descriptor)

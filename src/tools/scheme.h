@@ -39,8 +39,8 @@ struct Scheme {
   PayloadRule payload;
   const char* foreignMarks;  // a payload that begins with one of these is of another algorithm under the same tag
 
-  // Null: every password is accepted; values cannot be made, checked or opened. The functions
-  // are called when the password, the payload and the key have been found to be in order.
+  // Null: every password is accepted; values cannot be made, checked or opened. The functions are called when the
+  // password, the payload and the key have been found to be in order.
   const char* (*passwordProblem)(std::string_view password);
   Status (*make)(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out);
   Status (*check)(const StoredValue& value, const KeyRecord& key, const Secret& password);
