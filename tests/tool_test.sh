@@ -270,7 +270,10 @@ done
 "$tool" --version >/dev/full 2>err; same 'full output of the version' 5 $?
 for verb in identify 'format --scheme md5' reveal; do  # whoever asks line by line is answered line by line
   coproc "$tool" $verb 2>/dev/null
-  for _ in 1 2; do echo question >&"${COPROC[1]}"; read -t 60 -r answer <&"${COPROC[0]}" || fail "$verb does not answer"; done
+  for _ in 1 2; do
+    echo question >&"${COPROC[1]}"
+    read -t 60 -r <&"${COPROC[0]}" || { fail "$verb does not answer"; break; }
+  done
   eval "exec ${COPROC[1]}>&-"; wait
 done
 finish
