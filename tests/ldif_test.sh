@@ -118,6 +118,8 @@ run 'verbose audit, JSON' 3 ldif --audit --verbose --json --in in
 json 'verbose audit, JSON' "len(d) == 6 and d[0] == {'line': 2, 'dn': 'a', 'attribute': 'userPassword', 'kind': 'sha',
   'finding': 'malformed', 'detail': 'the payload is not base64 text'} and
   d[1] == {'line': 3, 'dn': 'a', 'attribute': 'UserPassword;x', 'kind': 'url'}"
+"$tool" format --scheme qveil <<<x | sed 's/{qVEIL}/dn: a\nuserPassword: /' >in
+check 'a masked value without its tag' 3 'scheme.*qveil +1 +1 +0 +0.*finding: masked without a tag: 1' ldif --audit --in in
 run 'audit of what does not open' 4 ldif --audit --keys C --in b
 run 'audit without keys' 0 ldif --audit --in b
 run 'audit of bytes' 4 ldif --audit --keys B --in b

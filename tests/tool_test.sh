@@ -91,10 +91,11 @@ said 'open stash' 'warning: open is open to other'
 
 # A run that is stopped when both temporary files are complete: whatever ends it, the stash files stay what they were.
 preload() { HELD_SYNC=$1 LD_PRELOAD=$held ASAN_OPTIONS=${ASAN_OPTIONS:-}:verify_asan_link_order=0 "${@:2}"; }
+stopped() { for _ in {1..600}; do [[ $(ps -o stat= "$1") == T* ]] && break || sleep 0.1; done; }
 while read -r signal disposition rc; do
   (preload stop exec env "$disposition" "$tool" keys create --config cfg --directory dir --force <seed >/dev/null 2>&1) &
   pid=$!
-  for _ in {1..600}; do [[ $(ps -o stat= $pid) == T* ]] && break || sleep 0.1; done
+  stopped $pid
   same "$signal: temporary files" 2 "$(ls -A | grep -cE '^\.(cfg|dir)\.')"
   kill -"$signal" $pid; kill -CONT $pid; wait $pid 2>/dev/null; same "$signal: exit code" "$rc" $?
   [ "$rc" = 0 ] || { sameFile "$signal" dir.good dir; sameFile "$signal" cfg.good cfg; }
@@ -108,8 +109,16 @@ KILL --default-signal=HUP 137
 HUP --ignore-signal=HUP 0
 ROWS
 cp dir.good dir
-preload fail "$tool" keys restore dir --force --seed-file seed --salt-file salt >/dev/null 2>err
-same 'a file that does not reach the disk' '5 ldappw: '"$work/dir: Input/output error" "$? $(cat err)"
+for what in file folder; do
+  preload $what "$tool" keys restore dir --force --seed-file seed --salt-file salt >/dev/null 2>err
+  same "a $what that does not reach the disk" 5 $?
+done
+said 'a folder that does not reach the disk' "^ldappw: $work: Input/output error"
+(preload stop exec "$tool" keys restore late --seed-file seed --salt-file salt >/dev/null 2>&1) &
+pid=$!
+stopped $pid
+echo mine >late; kill -CONT $pid; wait $pid
+same 'a file that appears meanwhile is not replaced' '2 mine' "$? $(<late)"
 
 # ---- format, verify, reveal ----
 key() { tail -c 72 dir | tail -c +$(($1 + 1)) | head -c "$2" | od -An -v -tx1 | tr -d ' \n'; }
@@ -136,11 +145,15 @@ for password in '' a 12345678 123456789 "$(printf 'y%.0s' {1..46})" "$(printf 'z
     esac
   done
 done
-[ "$(yes same | head -20 | "$tool" format --scheme crypt | sort -u | wc -l)" -gt 15 ] || fail 'salts of one run are the same'
+yes same | head -100 | "$tool" format --scheme crypt >out
+for column in 8 9; do
+  [ "$(cut -c $column out | sort -u | wc -l)" -gt 30 ] || fail 'the characters of salts repeat'
+done
 
 # Fixed salts: one wrong key in some 250 opens a value to other bytes.
 "$tool" keys create --config c2 --directory d2 --salt-file salt <<<another-seed-entirely >/dev/null
 aesValue=$("$tool" format --scheme aes256 --keys dir <<<secret)
+lengthy=$("$tool" format --scheme aes128 --keys dir <seed); echo "${seed}Y" | sed 's/.Y$/Y/' >seed.other
 masked=$("$tool" format --scheme qveil <<<secret)
 hidden='{SHA}'$(printf secret | openssl dgst -sha1 -binary | b64)
 swapped=$(tr a-zA-Z A-Za-z <<<"${hidden#*\}}")
@@ -185,6 +198,7 @@ malformed|3||verify '{SHA}c2VjcmV0'
 cut payload|3||verify --keys dir "$wrap"
 no key|4||verify "$aesValue"
 wrong key|4||verify --keys d2 "$aesValue"
+wrong at the end|1|no match|verify --keys dir "$lengthy" --password-file seed.other
 missing key file|5||verify --keys none "$aesValue"
 a key file that is not needed|0|match|verify --keys none "$ssha"
 damaged key file|4||verify --keys short "$aesValue"

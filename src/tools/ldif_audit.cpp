@@ -48,7 +48,7 @@ Verdict auditValue(const StoredValue& value, const KeyRecord& keys, bool allowBi
     const Condition opened = tryToOpen(value, keys, allowBinary, counts);
     if (condition == Condition::kFine) condition = opened;
   }
-  return {scheme.name, condition, condition == Condition::kMalformed ? problem : ""};
+  return {scheme.name, condition, condition == Condition::kMalformed && problem != nullptr ? problem : ""};
 }
 
 Verdict auditLine(const PasswordLine& password, const KeyRecord& keys, bool allowBinary, Tally& tally) {
