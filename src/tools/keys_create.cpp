@@ -1,7 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw keys create: makes the two stash files.
-#include <filesystem>
 #include "keys.h"
+
+#include <filesystem>
+
 #include "terminal.h"
 
 namespace tool {

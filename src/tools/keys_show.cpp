@@ -1,8 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw keys show: what a stash file holds, with a fingerprint in place of each key.
-#include <cstdio>
-#include "crypto_provider.h"
 #include "keys.h"
+
+#include <cstdio>
+
+#include "crypto_provider.h"
 #include "scheme.h"
 #include "text.h"
 

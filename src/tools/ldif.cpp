@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw ldif: the command line of the conversion and the audit of a directory export.
-#include "ldif.h"
+#include "ldif_passes.h"
 
 #include "command_line.h"
 

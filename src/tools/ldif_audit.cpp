@@ -1,7 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 // The audit of an export.
+#include "ldif_passes.h"
+
 #include "condition.h"
-#include "ldif.h"
 #include "text.h"
 #include "values.h"
 

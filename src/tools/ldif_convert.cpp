@@ -1,13 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
 // The conversion. A value that cannot be carried over unharmed stays what it was and is reported: the export is often
 // the only copy of the passwords in it.
+#include "ldif_passes.h"
+
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <optional>
 
 #include "condition.h"
-#include "ldif.h"
 #include "messages.h"
 #include "output_file.h"
 #include "password_schemes.h"

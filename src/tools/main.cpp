@@ -1,5 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // The ldappw command: the command line, and what happens to every failure.
+#include "command_line.h"
+
 #include <errno.h>
 #include <fcntl.h>
 #include <signal.h>
@@ -8,7 +10,6 @@
 
 #include <new>
 
-#include "command_line.h"
 #include "messages.h"
 
 namespace tool {

@@ -2,11 +2,12 @@
 // ldappw trial: shows on the passwords of a real export that every scheme does what it promises: made, checked, a wrong
 // one refused, read back. Values are checked with the call that the server makes, not with the command's own check,
 // which serves longer passwords.
+#include "command_line.h"
+
 #include <time.h>
 
 #include <optional>
 
-#include "command_line.h"
 #include "export_run.h"
 #include "password_schemes.h"
 #include "values.h"

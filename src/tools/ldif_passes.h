@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // The two passes of ldappw ldif.
-#ifndef LDAPPW_TOOLS_LDIF_H
-#define LDAPPW_TOOLS_LDIF_H
+#ifndef LDAPPW_TOOLS_LDIF_PASSES_H
+#define LDAPPW_TOOLS_LDIF_PASSES_H
 
 #include <string>
 
