@@ -125,12 +125,17 @@ key() { tail -c 72 dir | tail -c +$(($1 + 1)) | head -c "$2" | od -An -v -tx1 | 
 aes() { printf %s "$1" | openssl enc -aes-"$2"-ecb -K "$(key "$3" $(($2 / 8)))" | b64; }
 euro=$'gr\xc3\xbc\xc3\x9fe \xe2\x82\xac'
 long=$(printf 'x%.0s' {1..2000})
-for password in '' a 12345678 123456789 "$(printf 'y%.0s' {1..46})" "$(printf 'z%.0s' {1..47})" "$long" "$euro" \
-  ' blanks ' $'return\r' '{SSHA}abc' '{XYZ}' '>1abcdef<' '$(id)`"\'; do
-  for scheme in sha ssha MD5 '{crypt}' qVEIL aes128 aes192 aes256; do
-    value=$("$tool" format --scheme "$scheme" --keys dir <<<"$password" 2>/dev/null) || fail "format $scheme '$password'"
+passwords=('' a 12345678 123456789 "$(printf 'y%.0s' {1..46})" "$(printf 'z%.0s' {1..47})" "$long" "$euro"
+  ' blanks ' $'return\r' '{SSHA}abc' '{XYZ}' '>1abcdef<' '$(id)`"\')
+printf '%s\n' "${passwords[@]}" >passwords
+for scheme in sha ssha MD5 '{crypt}' qVEIL aes128 aes192 aes256; do
+  run "format $scheme" 0 format --scheme "$scheme" --keys dir --password-file passwords </dev/null
+  mapfile -t values <out
+  same "format $scheme" ${#passwords[@]} ${#values[@]}
+  for i in "${!passwords[@]}"; do
+    password=${passwords[i]} value=${values[i]}
     check "verify $scheme '$password'" 0 match verify --keys dir -- "$value" <<<"$password"
-    check "refuse $scheme '$password'" 1 'no match' verify --keys dir -- "$value" <<<"!$password"
+    ((i % 4)) || check "refuse $scheme '$password'" 1 'no match' verify --keys dir -- "$value" <<<"!$password"
     case $scheme in
       sha) same sha "{SHA}$(printf %s "$password" | openssl dgst -sha1 -binary | b64)" "$value" ;;
       MD5) same md5 "{MD5}$(printf %s "$password" | openssl dgst -md5 -binary | b64)" "$value" ;;
@@ -139,11 +144,14 @@ for password in '' a 12345678 123456789 "$(printf 'y%.0s' {1..46})" "$(printf 'z
       aes192) same aes192 "{AES192}$(aes "$password" 192 16)" "$value" ;;
       aes256) same aes256 "{AES256}$(aes "$password" 256 40)" "$value" ;;
     esac
-    case $scheme in
-      qVEIL) same "reveal $scheme" "$(printf %s "$password" | head -c 46)" "$("$tool" reveal "$value")" ;;
-      aes*) same "reveal $scheme" "$password" "$("$tool" reveal --keys dir "$value")" ;;
-    esac
   done
+  case $scheme in
+    qVEIL) reveal=(cut -b -46 passwords) ;;
+    aes*) reveal=(cat passwords) ;;
+    *) continue ;;
+  esac
+  run "reveal $scheme" 0 reveal --keys dir < <(printf '%s\n' "${values[@]}")
+  sameFile "reveal $scheme" <("${reveal[@]}") out
 done
 yes same | head -100 | "$tool" format --scheme crypt >out
 for column in 8 9; do
@@ -233,34 +241,43 @@ check 'reveal from standard input' 3 'secret.secret' reveal <mixed
 said 'the number of the value' '^ldappw: value 4: the tag is of no known scheme'
 
 # ---- identify: value, columns ----
-while IFS='|' read -r code columns value; do
-  check "identify $value" "$code" "$columns" identify -- "$(eval "echo $value")"
-done <<ROWS
-0|clear.1.clear.well formed|secret
-0|clear.1.clear.well formed|''
-0|clear.1.clear.well formed|'{half open'
-0|sha.2.one-way.well formed|'{sha}5en6G6MezRroT3XKqkdPOmY/BfQ='
-3|sha.2.one-way.*20 bytes|'{SHA}c2VjcmV0'
-3|sha.2.one-way.*not base64.*|'{SHA}5en6G6MezRroT3XKqkdPOmY/BfQ'
-3|sha.2.one-way.*carriage return|$'{SHA}5en6G6MezRroT3XKqkdPOmY/BfQ=\\r'
-3|sha.2.one-way.*no payload|'{SHA}'
-0|ssha.9.one-way.well formed|'{SSHA}5en6G6MezRroT3XKqkdPOmY/BfQ='
-3|ssha.9.one-way.*|'{SSHA}c2VjcmV0'
-0|md5.3.one-way.well formed|'{MD5}Xr4ilOzQ4PCOq3aQ0qbuaQ=='
-3|md5.3.one-way.*|'{MD5}5en6G6MezRroT3XKqkdPOmY/BfQ='
-0|crypt.4.one-way.well formed|'{CRYPT}ab01FAX.bQRSU'
-3|crypt.4.one-way.*|'{crypt}ab01FAX.bQRS'
-3|crypt.4.one-way.*|'{crypt}\$6\$salt\$hash'
-0|qveil.128.reversible.well formed|'$masked'
-0|qveil.128.reversible.well formed, untagged|'${masked#*\}}'
-3|qveil.128.reversible.*untagged|'>hello there<'
-0|aes128.135.reversible.well formed|'{AES128}AAAAAAAAAAAAAAAAAAAAAA=='
-3|aes192.134.reversible.*blocks|'{AES192}AAAA'
-3|unknown .XYZ..1.unknown.*|'{XYZ}abc'
-3|unknown .X.x1BZ..1.unknown.*|$'{X\\eZ}abc'
-0|vldl.8.one-way.well formed|'{VLDL}anything'
-0|vldl.8.one-way.well formed|'{VLDL}'
+rows=()
+while IFS='|' read -r columns value; do
+  rows+=("$columns")
+  eval "echo $value" >&7
+done 7>values <<ROWS
+clear.1.clear.well formed|secret
+clear.1.clear.well formed|''
+clear.1.clear.well formed|'{half open'
+sha.2.one-way.well formed|'{sha}5en6G6MezRroT3XKqkdPOmY/BfQ='
+sha.2.one-way.*20 bytes|'{SHA}c2VjcmV0'
+sha.2.one-way.*not base64.*|'{SHA}5en6G6MezRroT3XKqkdPOmY/BfQ'
+sha.2.one-way.*carriage return|$'{SHA}5en6G6MezRroT3XKqkdPOmY/BfQ=\\r'
+sha.2.one-way.*no payload|'{SHA}'
+ssha.9.one-way.well formed|'{SSHA}5en6G6MezRroT3XKqkdPOmY/BfQ='
+ssha.9.one-way.*|'{SSHA}c2VjcmV0'
+md5.3.one-way.well formed|'{MD5}Xr4ilOzQ4PCOq3aQ0qbuaQ=='
+md5.3.one-way.*|'{MD5}5en6G6MezRroT3XKqkdPOmY/BfQ='
+crypt.4.one-way.well formed|'{CRYPT}ab01FAX.bQRSU'
+crypt.4.one-way.*|'{crypt}ab01FAX.bQRS'
+crypt.4.one-way.*|'{crypt}\$6\$salt\$hash'
+qveil.128.reversible.well formed|'$masked'
+qveil.128.reversible.well formed, untagged|'${masked#*\}}'
+qveil.128.reversible.*untagged|'>hello there<'
+aes128.135.reversible.well formed|'{AES128}AAAAAAAAAAAAAAAAAAAAAA=='
+aes192.134.reversible.*blocks|'{AES192}AAAA'
+unknown .XYZ..1.unknown.*|'{XYZ}abc'
+unknown .X.x1BZ..1.unknown.*|$'{X\\eZ}abc'
+vldl.8.one-way.well formed|'{VLDL}anything'
+vldl.8.one-way.well formed|'{VLDL}'
 ROWS
+run identify 3 identify <values
+while IFS= read -r line; do
+  [[ $line =~ ^(${rows[0]})$ ]] || fail "identify: '$line', not '${rows[0]}'"
+  rows=("${rows[@]:1}")
+done <out
+same 'identify: no more and no less' 0 ${#rows[@]}
+check 'identify well formed values' 0 'sha.*ssha.*' identify "$hidden" "$ssha"
 run 'identify JSON' 3 identify --json "$hidden" secret $'{X\e}a' '>hello there<'
 json 'identify JSON' "d == [
   {'index': 1, 'scheme': 'sha', 'code': 2, 'kind': 'one-way', 'tag': '{SHA}', 'well_formed': True},
