@@ -91,7 +91,7 @@ said 'open stash' 'warning: open is open to other'
 
 # A run that is stopped when both temporary files are complete: whatever ends it, the stash files stay what they were.
 preload() { HELD_SYNC=$1 LD_PRELOAD=$held ASAN_OPTIONS=${ASAN_OPTIONS:-}:verify_asan_link_order=0 "${@:2}"; }
-stopped() { for _ in {1..600}; do [[ $(ps -o stat= "$1") == T* ]] && break || sleep 0.1; done; }
+stopped() { for _ in {1..600}; do [[ $(ps -o stat= "$1") == [!T]* ]] || break; sleep 0.1; done; }
 while read -r signal disposition rc; do
   (preload stop exec env "$disposition" "$tool" keys create --config cfg --directory dir --force <seed >/dev/null 2>&1) &
   pid=$!
