@@ -18,9 +18,6 @@ set(CPACK_PRE_BUILD_SCRIPTS ${PROJECT_SOURCE_DIR}/cmake/debian/stage.cmake)
 set(CPACK_LDAPPW_DEBIAN ${PROJECT_SOURCE_DIR}/cmake/debian)
 set(CPACK_LDAPPW_LIBRARIES ${CMAKE_LIBRARY_OUTPUT_DIRECTORY} ${LDAPPW_EXTRA_RPATH})
 set(CPACK_LDAPPW_FOREIGN ${CMAKE_CROSSCOMPILING})
-# The package of the library that the command opens at run time, named by the rules for libraries.
-string(REGEX REPLACE "([0-9])[.]so[.]" "\\1-" CPACK_LDAPPW_OPENED "${LDAPPW_LDAP_SONAME}")
-string(REPLACE ".so." "" CPACK_LDAPPW_OPENED "${CPACK_LDAPPW_OPENED}")
 
 set(CPACK_DEB_COMPONENT_INSTALL ON)
 set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
@@ -55,6 +52,9 @@ files of CMake and pkg-config.")
 
 set(CPACK_DEBIAN_TOOL_PACKAGE_NAME ldappw)
 set(CPACK_DEBIAN_TOOL_PACKAGE_SECTION admin)
+# The package of the library that the command opens at run time, named by the rules for libraries.
+string(REGEX REPLACE "([0-9])[.]so[.]" "\\1-" opened "${LDAPPW_LDAP_SONAME}")
+string(REPLACE ".so." "" CPACK_DEBIAN_TOOL_PACKAGE_DEPENDS "${opened}")
 set(CPACK_COMPONENT_TOOL_DESCRIPTION "stored passwords and key files of an LDAP directory server
 The ldappw command makes, identifies, checks and reveals stored passwords,
 creates, restores and shows key stash files, and audits and converts the
