@@ -1,0 +1,75 @@
+# SPDX-License-Identifier: Apache-2.0
+# What the scripts share; they read it with "source". Everything said here goes to standard error.
+root=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
+name=$(basename "$0")
+cd "$root"
+mkdir -p build
+
+step() { echo "== $*"; }
+
+say() { echo "$name: $*" >&2; }
+
+fail() {
+  say "$@"
+  exit 1
+}
+
+# Runs a command with its output in a log; when it fails, shows the end of the log and stops.
+logged() { # log, command...
+  local log=$1
+  shift
+  mkdir -p "$(dirname "$log")"
+  "$@" >"$log" 2>&1 </dev/null || failed "$log" "$1"
+}
+
+failed() { # log, what failed
+  tail -n 40 "$1" >&2
+  fail "$2 failed; all of its output is in $1"
+}
+
+# Gives the commands that follow a temporary folder of their own, which goes when the script ends.
+own_temporary_folder() {
+  TMPDIR=$(mktemp -d)
+  export TMPDIR
+  trap 'rm -rf "$TMPDIR"' EXIT
+}
+
+# Configures a preset unless that is done: the build itself sees when a list of sources changes.
+configure() { # preset
+  local folder=build/$1 fresh=()
+  local cache=$folder/CMakeCache.txt
+  if [ "$folder/build.ninja" -nt CMakePresets.json ] && grep -qFx "CMAKE_HOME_DIRECTORY:INTERNAL=$root" "$cache"; then
+    return
+  fi
+  say "configuring $folder"
+  # A folder that another generator or another place of the tree has left is of no use.
+  [ ! -e "$cache" ] || fresh=(--fresh)
+  logged "$folder/configure.log" cmake --preset "$1" "${fresh[@]}"
+}
+
+# Configures and builds, and shows how far it is; says nothing when there is nothing to do.
+build() { # preset, target...
+  local preset=$1 targets=()
+  shift
+  [ $# -eq 0 ] || targets=(--target "$@")
+  configure "$preset"
+  NINJA_STATUS='[%f/%t] ' cmake --build --preset "$preset" "${targets[@]}" </dev/null 2>&1 |
+    tee "build/$preset/build.log" | progress "building build/$preset" ||
+    failed "build/$preset/build.log" "the build"
+}
+
+# Turns a builder's "[done/all]" lines into one line that changes, or into a line each quarter where none can.
+progress() { # what
+  local terminal=0
+  [ ! -t 2 ] || terminal=1
+  awk -v what="$name: $1" -v terminal="$terminal" '
+    match($0, /^\[[0-9]+\/[0-9]+\]/) {
+      split(substr($0, 2, RLENGTH - 2), count, "/")
+      quarter = int(4 * count[1] / count[2])
+      if (terminal) printf "\r%s: %d of %d ", what, count[1], count[2]
+      else if (!shown++ || quarter > last) printf "%s: %d of %d\n", what, count[1], count[2]
+      last = quarter
+      fflush()
+    }
+    END { if (terminal && NR && last != "") print "" }' >&2
+}
