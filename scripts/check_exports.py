@@ -16,15 +16,18 @@ HEADERS = ("password_schemes.h", "encoding_utils.h", "crypto_provider.h", "aes_k
 FORBIDDEN_IMPORTS = re.compile(r"^(__cxa_throw|__cxa_allocate_exception|_Zn[wa][jm])$")
 
 
-def declared():
+def declared_in(header):
     names = set()
-    for header in HEADERS:
-        text = re.sub(r"/\*.*?\*/", "", (SOURCES / header).read_text(), flags=re.S)
-        for declaration in re.findall(r"^LDAPPW_(?:API|DATA)\s([^;]*);", text, flags=re.M):
-            symbol = re.search(r'LDAPPW_SYMBOL\("(\w+)"\)', declaration) or \
-                re.search(r"\(\*(\w+)\)\(", declaration) or re.search(r"(\w+)\s*(?:\(|\[|$)", declaration)
-            names.add(symbol[1])
+    text = re.sub(r"/\*.*?\*/", "", (SOURCES / header).read_text(), flags=re.S)
+    for declaration in re.findall(r"^LDAPPW_(?:API|DATA)\s([^;]*);", text, flags=re.M):
+        symbol = re.search(r'LDAPPW_SYMBOL\("(\w+)"\)', declaration) or \
+            re.search(r"\(\*(\w+)\)\(", declaration) or re.search(r"(\w+)\s*(?:\(|\[|$)", declaration)
+        names.add(symbol[1])
     return names
+
+
+def declared():
+    return set.union(*(declared_in(header) for header in HEADERS))
 
 
 def listed():

@@ -2,10 +2,11 @@
 // AES encryption of buffers through the crypto provider, with base64 text around it. Log readers match the texts as
 // they are, the two without a code and the allocation failure that speaks of DecryptInit among them; the AesFailures
 // suite pins all.
+#include "aes_keys.h"
+
 #include <climits>
 #include <cstring>
 
-#include "aes_keys.h"
 #include "qel_utils.h"
 #include "text_target.h"
 #include "trace_scope.h"

@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 // The process-wide key state that password formatting reads.
+#include "aes_keys.h"
+
 #include <cstring>
 
-#include "aes_keys.h"
 #include "trace_scope.h"
 
 namespace ldappw {

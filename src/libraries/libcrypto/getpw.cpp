@@ -1,5 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // The terminal password prompt.
+#include "encoding_utils.h"
+
 #include <termios.h>
 #include <unistd.h>
 
@@ -11,7 +13,6 @@
 #include <iterator>
 
 #include "cancellation.h"
-#include "encoding_utils.h"
 #include "owners.h"
 
 namespace ldappw {

@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 // The one process-wide provider context, and cipher and digest contexts over it. Log readers match the texts as they
 // are, the one that shows no code among them; the ProviderContext and ProviderPairs suites pin all.
+#include "qel_utils.h"
+
 #include <sys/stat.h>
 
 #include <cstddef>
@@ -10,7 +12,6 @@
 #include "cancellation.h"
 #include "locks.h"
 #include "owners.h"
-#include "qel_utils.h"
 #include "trace_scope.h"
 
 static_assert(sizeof(QelStatus) == 268 && offsetof(QelStatus, minRC) == 4 && offsetof(QelStatus, desc) == 8,

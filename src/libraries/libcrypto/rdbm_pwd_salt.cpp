@@ -1,12 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 // The salt of new {crypt} values.
+#include "password_schemes.h"
+
 #include <unistd.h>
 
 #include <cstdint>
 #include <cstdlib>
 #include <ctime>
-
-#include "password_schemes.h"
 
 namespace ldappw {
 namespace {

@@ -1,10 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
 // Checking presented passwords against stored values. Which of the schemes of the two texts decide how they are
 // compared stands in one table; each comparison is a few lines above it.
+#include "password_schemes.h"
+
 #include <cstring>
 
 #include "owners.h"
-#include "password_schemes.h"
 #include "rdbm_pwd.h"
 #include "rdbm_pwd_format.h"
 #include "rdbm_pwd_reverse.h"

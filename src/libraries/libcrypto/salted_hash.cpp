@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 // Salted digests through the crypto provider: the payload of {SSHA} values.
+#include "password_schemes.h"
+
 #include <climits>
 #include <cstring>
 
-#include "password_schemes.h"
 #include "qel_utils.h"
 #include "text_target.h"
 #include "trace_scope.h"

@@ -1,11 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 // SHA-1 (FIPS 180-1) in one call, without the crypto provider. All rounds are written out, for speed.
+#include "password_schemes.h"
+
 #include <cstdint>
 #include <cstring>
 #include <utility>
 
 #include "bits.h"
-#include "password_schemes.h"
 #include "wipe.h"
 
 static_assert(sizeof(sha_digest) == 20, "the record is the digest");

@@ -2,9 +2,10 @@
 // Plain digests through the crypto provider: the payload of {MD5} values. Log readers match the lines as they are,
 // which lack the code, the newline or a blank here and there, and there is none about entering. Any value of the
 // provider but 0 is a success. UnsaltedHash.ReportsProviderFailuresInItsOwnWords pins both.
+#include "password_schemes.h"
+
 #include <cstring>
 
-#include "password_schemes.h"
 #include "qel_utils.h"
 #include "text_target.h"
 #include "trace_scope.h"

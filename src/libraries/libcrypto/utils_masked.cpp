@@ -1,12 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 // The masked encoding: data scattered over random background, enciphered, and written as text over one of sixteen
 // alphabets, with a control packet inside that states how to undo it.
+#include "encoding_utils.h"
+
 #include <climits>
 #include <cstring>
 #include <ctime>
 
 #include "crypto_simple.h"
-#include "encoding_utils.h"
 #include "owners.h"
 #include "utils_base64.h"
 #include "utils_masked_bits.h"
