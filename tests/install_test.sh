@@ -11,7 +11,7 @@ cmake --install "$1" --prefix "$work/first" > "$work/log"
 mv "$work/first" "$work/moved"
 export CFLAGS=$2
 
-cmake -S "$here/install" -B "$work/cmake" -DCMAKE_PREFIX_PATH="$work/moved" >> "$work/log"
+cmake -G Ninja -S "$here/install" -B "$work/cmake" -DCMAKE_PREFIX_PATH="$work/moved" >> "$work/log"
 cmake --build "$work/cmake" >> "$work/log"
 "$work/cmake/outside"
 
