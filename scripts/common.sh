@@ -34,17 +34,20 @@ own_temporary_folder() {
   trap 'rm -rf "$TMPDIR"' EXIT
 }
 
+tests=ON # OFF in a script that neither builds tests nor has their packages
+
 # Configures a preset unless that is done: the build itself sees when a list of sources changes.
 configure() { # preset
   local folder=build/$1 fresh=()
   local cache=$folder/CMakeCache.txt
-  if [ "$folder/build.ninja" -nt CMakePresets.json ] && grep -qFx "CMAKE_HOME_DIRECTORY:INTERNAL=$root" "$cache"; then
+  if [ "$folder/build.ninja" -nt CMakePresets.json ] && grep -qFx "CMAKE_HOME_DIRECTORY:INTERNAL=$root" "$cache" &&
+    { [ $tests = OFF ] || grep -qFx LDAPPW_TESTS:BOOL=ON "$cache"; }; then
     return
   fi
   say "configuring $folder"
   # A folder that another generator or another place of the tree has left is of no use.
   [ ! -e "$cache" ] || fresh=(--fresh)
-  logged "$folder/configure.log" cmake --preset "$1" "${fresh[@]}"
+  logged "$folder/configure.log" cmake --preset "$1" -DLDAPPW_TESTS=$tests "${fresh[@]}"
 }
 
 # Configures and builds, and shows how far it is; says nothing when there is nothing to do.
