@@ -28,9 +28,12 @@ if(LDAPPW_SANITIZE)
                                                   -fno-omit-frame-pointer)
   target_link_options(ldappw_options INTERFACE -fsanitize=${LDAPPW_SANITIZE})
 endif()
-# Release files: guarded stacks, checked copies, marked jump targets, and no path of the machine that builds them.
+# Release files: guarded stacks, checked copies, marked jump targets, and no path of the machine that builds them. A target
+# with the property LDAPPW_GUARD_ARRAYS_ALONE has the guard in functions with arrays, not wherever an address is taken.
 target_compile_options(ldappw_options INTERFACE
-  $<$<CONFIG:Release>:-fstack-protector-strong -fcf-protection -ffile-prefix-map=${PROJECT_SOURCE_DIR}=.>)
+  $<$<CONFIG:Release>:-fstack-protector$<$<NOT:$<BOOL:$<TARGET_PROPERTY:LDAPPW_GUARD_ARRAYS_ALONE>>>:-strong>>
+  $<$<CONFIG:Release>:-fcf-protection>
+  $<$<CONFIG:Release>:-ffile-prefix-map=${PROJECT_SOURCE_DIR}=.>)
 target_compile_definitions(ldappw_options INTERFACE $<$<CONFIG:Release>:_FORTIFY_SOURCE=3>)
 if(LDAPPW_COVERAGE)
   target_compile_options(ldappw_options INTERFACE --coverage)
