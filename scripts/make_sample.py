@@ -2,7 +2,7 @@
 # SPDX-License-Identifier: Apache-2.0
 """Makes the sample exports: the people of an invented company, with clear passwords of many kinds.
 
-    scripts/make_sample.py                          writes samples/directory.ldif and samples/mixed.ldif anew
+    scripts/make_sample.py                          writes samples/directory.ldif and samples/mixed.ldif again
     scripts/make_sample.py --check                  compares them with what would be written
     scripts/make_sample.py --entries 100000 --out F writes one larger directory of the same make
 
