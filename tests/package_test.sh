@@ -66,7 +66,7 @@ export PKG_CONFIG_SYSROOT_DIR=$root PKG_CONFIG_LIBDIR=$libdir/pkgconfig
 # shellcheck disable=SC2046 # the flags are words
 cc -D_GNU_SOURCE "$here/consumer.c" -o "$work/outside" $(pkg-config --cflags --libs ldappw)
 "$work/outside"
-cmake -S "$here/install" -B "$work/cmake" -DCMAKE_PREFIX_PATH="$root/usr" >"$work/log"
+cmake -G Ninja -S "$here/install" -B "$work/cmake" -DCMAKE_PREFIX_PATH="$root/usr" >"$work/log"
 cmake --build "$work/cmake" >>"$work/log"
 "$work/cmake/outside"
 
