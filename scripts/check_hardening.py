@@ -12,6 +12,7 @@ import sys
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent
 FILES = ("lib/libldappw.so.1", "lib/libdsutil.so.1", "lib/qel/qellib/libtresk7qels.so", "bin/ldappw")
+PLUGINS = ("lib/ldap/pw-ldappw.so", "lib/dirsrv/plugins/libldappw-pwdstorage.so")  # where their servers' headers are
 MARK = re.compile(r"x86 feature:.*\bIBT\b.*\bSHSTK\b")
 
 
@@ -61,7 +62,7 @@ def start_file_is_marked(path):
 def main():
     faults = []
     for build in map(pathlib.Path, sys.argv[1:]):
-        linked = [build / name for name in FILES]
+        linked = [build / name for name in FILES] + [build / name for name in PLUGINS if (build / name).exists()]
         for path in linked:
             faults += [*import_faults(path), *linking_faults(path), *path_faults(path),
                        *mark_faults(path, start_file_is_marked(path))]
