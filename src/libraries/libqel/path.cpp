@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// Where the library was loaded from. That is worked out while it is loaded, when a relative name still means what it
-// meant to the loader; the loader's own note of it cannot be read when memory ran out for it.
+// Where the library was loaded from. That is worked out while it is loaded, before the host can change its working
+// folder, against which the loader has just read a relative name; the loader's own note of it cannot be read when memory
+// ran out for it.
 #include <dlfcn.h>
 #include <unistd.h>
 
