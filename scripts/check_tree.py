@@ -151,11 +151,11 @@ def shortest_circle(graph, start):
 
 def circle_faults(graph):
     """A line for each circle; a file is named in the shortest one that it is part of."""
-    told = set()
+    shown = set()
     for start in sorted(graph):
-        way = None if start in told else shortest_circle(graph, start)
+        way = None if start in shown else shortest_circle(graph, start)
         if way:
-            told.update(way)
+            shown.update(way)
             steps = ("%s (%s)" % (used, plain(graph[user][used])) for user, used in zip(way, way[1:] + way[:1]))
             yield "libcrypto: calls run in a circle: %s -> %s" % (start, " -> ".join(steps))
 

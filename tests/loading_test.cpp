@@ -10,7 +10,7 @@
 #include "dsutil.h"
 #include "failures.h"
 
-static const char* installFolder = "install";  // null: cannot be told
+static const char* installFolder = "install";  // null: unknown
 static int failingPutEnvVar = 0;               // the number of the call that fails, from 1
 
 // In place of those of the utility library.

@@ -61,7 +61,7 @@ std::string payloadOf(int scheme, const std::string& clear, const std::string& p
   if (scheme == 3) return opensslBase64(opensslDigest("MD5", text));
   if (scheme == 4) return systemCrypt(text, "ab");
   if (scheme == 9) return saltedPayload(text, opensslDecoded(payload).substr(20, 20));
-  if (scheme == 128) return payload;  // reversing tells
+  if (scheme == 128) return payload;  // reversing checks it
   const auto aes = [&clear](const char* cipher, size_t keyAt) {
     return opensslBase64(opensslCipher({cipher, fixedContent().substr(keyAt), "", true, true}, clear));
   };

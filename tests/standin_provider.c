@@ -1,6 +1,6 @@
 /* SPDX-License-Identifier: Apache-2.0 */
 /*
- * A small provider for tests, without OpenSSL. In the file STANDIN_LOG it tells what was called with what while it is
+ * A small provider for tests, without OpenSSL. In the file STANDIN_LOG it reports every call and its arguments while it is
  * loaded; its directory is STANDIN_PATH, and it gives no context while STANDIN_FAILS is set. STANDIN_NO_PATH and
  * STANDIN_NO_SEED leave an entry out. Its digests and ciphers are toys of the right sizes that protect nothing.
  */
