@@ -82,7 +82,7 @@ inline void expectFailures(const std::vector<FailureCase>& rows, int severity, c
   }
 }
 
-// A failing step, and what is told of it: whole, or without the name before it and the code behind it.
+// A failing step, and what is reported of it: whole, or without the name before it and the code behind it.
 struct FailingStep {
   int rc;
   std::string says;
