@@ -5,6 +5,7 @@
 #pragma once
 
 #include <openssl/core_dispatch.h>
+#include <openssl/types.h>
 #include <pthread.h>
 
 #include <atomic>
@@ -72,7 +73,8 @@ struct Algorithm {
 // Read once, before there is a provider context, and there until the process ends.
 inline Algorithm algorithms[2][255];  // by type; twice as many as there are
 inline std::size_t algorithmCounts[2];
-inline void* providerContext;  // for the making of states
+inline void* providerContext;     // for the making of states
+inline EVP_RAND_CTX* seedSource;  // of random bytes
 
 // Starts OpenSSL and reads the algorithms, unless that is done. One thread at a time; may be tried again.
 bool startOpenssl() noexcept;

@@ -70,6 +70,14 @@ void readAll(OSSL_PROVIDER* provider, Type type, int operation) noexcept {
   algorithmCounts[type] = static_cast<std::size_t>(next - algorithms[type]);
 }
 
+EVP_RAND_CTX* newSeedSource(OSSL_LIB_CTX* library) noexcept {
+  EVP_RAND* method = EVP_RAND_fetch(library, "SEED-SRC", nullptr);
+  EVP_RAND_CTX* source = method == nullptr ? nullptr : EVP_RAND_CTX_new(method, nullptr);
+  EVP_RAND_free(method);
+  if (source != nullptr && EVP_RAND_instantiate(source, 0, 0, nullptr, 0, nullptr) == 1) return source;
+  return EVP_RAND_CTX_free(source), nullptr;
+}
+
 }  // namespace
 
 // A library context of its own keeps the host's configuration and property queries from deciding what a name means.
@@ -79,7 +87,8 @@ bool startOpenssl() noexcept {
   if (OPENSSL_init_crypto(OPENSSL_INIT_NO_ATEXIT, nullptr) != 1) return false;
   OSSL_LIB_CTX* library = OSSL_LIB_CTX_new();
   OSSL_PROVIDER* provider = library == nullptr ? nullptr : OSSL_PROVIDER_load(library, "default");
-  if (provider == nullptr) return OSSL_LIB_CTX_free(library), false;
+  seedSource = provider == nullptr ? nullptr : newSeedSource(library);
+  if (seedSource == nullptr) return OSSL_LIB_CTX_free(library), false;
   readAll(provider, kDigest, OSSL_OP_DIGEST);
   readAll(provider, kCipher, OSSL_OP_CIPHER);
   for (Usual& each : usual) each.algorithm = findAlgorithm(each.type, each.spelling);

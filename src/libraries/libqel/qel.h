@@ -190,12 +190,12 @@ const QEL_CIPHER* QEL_EVP_CIPHER_CTX_cipher(QEL_CTX* ctx, QEL_CIPHER_CTX* cipher
 
 /* ---- Random bytes ---- */
 
-/* Fill count bytes from the thread's generators, the second from the one for private values; after a failure their
- * content is not to be used. */
+/* Fill count bytes from the system's generator; after a failure their content is not to be used. In the child of a fork
+ * they differ from the parent's. */
 int QEL_RAND_bytes(QEL_CTX* ctx, unsigned char* buffer, int count) QEL_NOEXCEPT;
 int QEL_GenerateRandomSeed(QEL_CTX* ctx, QelStatus* status, unsigned char* buffer, int count) QEL_NOEXCEPT;
 
-/* Mixes length bytes into the process's generators, in addition to the system's entropy. */
+/* Checks its arguments and does nothing else: the system's generator needs no seed. */
 int QEL_RAND_seed(QEL_CTX* ctx, const void* data, int length) QEL_NOEXCEPT;
 
 #pragma GCC visibility pop
