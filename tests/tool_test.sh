@@ -260,7 +260,21 @@ md5.3.one-way.well formed|'{MD5}Xr4ilOzQ4PCOq3aQ0qbuaQ=='
 md5.3.one-way.*|'{MD5}5en6G6MezRroT3XKqkdPOmY/BfQ='
 crypt.4.one-way.well formed|'{CRYPT}ab01FAX.bQRSU'
 crypt.4.one-way.*|'{crypt}ab01FAX.bQRS'
-crypt.4.one-way.*|'{crypt}\$6\$salt\$hash'
+crypt.4.one-way.*.des-crypt|'{crypt}\$99\$salt\$hash'
+sha512-crypt.1.one-way.*no whole crypt value.*strong|'{crypt}\$6\$salt\$hash'
+bcrypt.1.one-way.well formed.strong|'{BLF-CRYPT}\$2y\$05\$bvIG6Nmid91Mu9RcmmWZfO5HJIMCT8riNW0hEp8f6/FuA2/mHZFpe'
+md5-crypt.1.one-way.well formed.salted-fast|'{MD5}\$1\$saltsalt\$qjXMvbEw8oaL.CzflDtaK/'
+bigcrypt.1.one-way.well formed.des-crypt|'{CRYPT}abJnggxhB/yWI.qMXmRzKAlo'
+bsdi-crypt.1.one-way.well formed.des-crypt|'{crypt}_J9..CCCCXBrJUJV154M'
+locked.1.one-way.well formed.locked|'{CRYPT}!\$6\$salt\$hash'
+smd5.1.one-way.well formed.salted-fast|'{smd5}4ZjWjMcT9fLtOJiI1oMDcHNhbHQ='
+sha512.1.one-way.*digest.unsalted|'{SHA512}AAAA'
+plain.1.reversible.well formed.clear|'{ClearText}secret'
+389-aes.1.reversible.well formed.reversible|'{AES-TUhNR0NTcUdTSWIzRFFFRkRUQm1N}c2VjcmV0'
+sasl.1.one-way.well formed.external|'{SASL}user@realm'
+pbkdf2-sha512.1.one-way.*iterations.salt.hash.strong|'{PBKDF2-SHA512}10000\$abc\$def'
+argon2id.1.one-way.*well formed.strong|'{ARGON2}\$argon2id\$v=19\$m=4096,t=3,p=1\$c2FsdHNhbHQ\$dGFnZ3RhZ2c'
+argon2i.1.one-way.*salt.hash.strong|'{ARGON2}\$argon2i\$v=19\$m=4096,t=x,p=1\$c2FsdHNhbHQ\$dGFnZ3RhZ2c'
 qveil.128.reversible.well formed|'$masked'
 qveil.128.reversible.well formed, untagged|'${masked#*\}}'
 qveil.128.reversible.*untagged|'>hello there<'
@@ -273,20 +287,22 @@ vldl.8.one-way.well formed|'{VLDL}'
 ROWS
 run identify 3 identify <values
 while IFS= read -r line; do
-  [[ $line =~ ^(${rows[0]})$ ]] || fail "identify: '$line', not '${rows[0]}'"
+  [[ $line =~ ^(${rows[0]})($'\t'[a-z-]+)?$ ]] || fail "identify: '$line', not '${rows[0]}'"
   rows=("${rows[@]:1}")
 done <out
 same 'identify: no more and no less' 0 ${#rows[@]}
 check 'identify well formed values' 0 'sha.*ssha.*' identify "$hidden" "$ssha"
 run 'identify JSON' 3 identify --json "$hidden" secret $'{X\e}a' '>hello there<'
 json 'identify JSON' "d == [
-  {'index': 1, 'scheme': 'sha', 'code': 2, 'kind': 'one-way', 'tag': '{SHA}', 'well_formed': True},
-  {'index': 2, 'scheme': 'clear', 'code': 1, 'kind': 'clear', 'tag': None, 'well_formed': True},
+  {'index': 1, 'scheme': 'sha', 'code': 2, 'kind': 'one-way', 'tag': '{SHA}', 'well_formed': True,
+   'strength': 'unsalted', 'writers': d[0]['writers']},
+  {'index': 2, 'scheme': 'clear', 'code': 1, 'kind': 'clear', 'tag': None, 'well_formed': True,
+   'strength': 'clear', 'writers': 'any'},
   {'index': 3, 'scheme': None, 'code': 1, 'kind': 'unknown', 'tag': '{X\\\\x1B}', 'well_formed': False,
-   'problem': 'the tag is of no known scheme'},
+   'problem': 'the tag is of no known scheme', 'strength': 'unknown', 'writers': ''},
   {'index': 4, 'scheme': 'qveil', 'code': 128, 'kind': 'reversible', 'tag': None, 'well_formed': False,
-   'problem': d[3]['problem']}]"
-check 'NUL in the payload' 3 'sha.2.one-way.*NUL byte' identify < <(printf '{SHA}a\0b\n')
+   'problem': d[3]['problem'], 'strength': 'reversible', 'writers': 'ldappw'}]"
+check 'NUL in the payload' 3 'sha.2.one-way.*NUL byte.unsalted' identify < <(printf '{SHA}a\0b\n')
 same 'identify lines' 100000 "$(yes '{MD5}Xr4ilOzQ4PCOq3aQ0qbuaQ==' | head -100000 | "$tool" identify | grep -c 'well formed')"
 
 # ---- the command as a whole ----

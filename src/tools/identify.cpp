@@ -25,7 +25,7 @@ void showText(const StoredValue& value, const char* problem, Results& results) {
   const bool untagged = !scheme.isClear() && value.tag().empty();
   results.line(scheme.name + (unknown ? " " + printable(value.tag()) : "") + "\t" + std::to_string(scheme.code) + "\t" +
                kindName(scheme) + "\t" + (problem != nullptr ? problem : "well formed") +
-               (untagged ? ", untagged" : ""));
+               (untagged ? ", untagged" : "") + "\t" + nameOf(scheme.strength));
 }
 
 void showJson(const StoredValue& value, const char* problem, std::size_t index, Results& results) {
@@ -37,6 +37,7 @@ void showJson(const StoredValue& value, const char* problem, std::size_t index, 
   value.tag().empty() ? json.null("tag") : json.text("tag", printable(value.tag()));
   json.flag("well_formed", problem == nullptr);
   if (problem != nullptr) json.text("problem", problem);
+  json.text("strength", nameOf(scheme.strength)).text("writers", scheme.writers);
   results.line(json.end());
 }
 

@@ -88,6 +88,15 @@ void auditBatch(RecordWalker& walker, const LdifOptions& options, const KeyRecor
   }
 }
 
+// Every scheme of the library, whether it occurs or not, and of the others those that do.
+template <class Work>
+void forEachScheme(const Tally& tally, const Work& work) {
+  for (const Scheme& scheme : kSchemes) work(scheme, tally.of(scheme));
+  for (const Scheme& scheme : kForeignSchemes) {
+    if (tally.of(scheme)[kAll] > 0) work(scheme, tally.of(scheme));
+  }
+}
+
 void writeTable(const Tally& tally, Results& results) {
   const auto write = [&](const CountName& name, std::uint64_t count, const char* prefix) {
     results.line(prefix + std::string(name.text) + ": " + std::to_string(count));
@@ -95,13 +104,12 @@ void writeTable(const Tally& tally, Results& results) {
   std::string row = leftCell("scheme", 10);
   for (const CountName& column : kColumnNames) row += cell(column.text, 12);
   results.line(row);
-  for (const Scheme& scheme : kSchemes) {
-    const Tally::Row& counts = tally.of(scheme);
-    if (counts[kAll] == 0) continue;
+  forEachScheme(tally, [&](const Scheme& scheme, const Tally::Row& counts) {
+    if (counts[kAll] == 0) return;
     row = leftCell(scheme.name, 10);
     for (std::size_t column = kAll; column <= kUnopened; ++column) row += cell(counts[column], 12);
     results.line(row);
-  }
+  });
   write({"entries", "entries"}, tally.entries, "");
   for (std::size_t total = kValues; total < kFirstCondition; ++total) {
     if (total == kValues || tally.totals[total] > 0) write(kTotalNames[total], tally.totals[total], "");
@@ -117,12 +125,11 @@ void writeObject(const Tally& tally, Results& results) {
   json.number("entries", tally.entries);
   addCounts(json, kTotalNames, tally.totals.data());
   json.open("schemes");
-  for (const Scheme& scheme : kSchemes) {
-    const Tally::Row& counts = tally.of(scheme);
+  forEachScheme(tally, [&](const Scheme& scheme, const Tally::Row& counts) {
     json.open(scheme.name);
     scheme.reversible() ? addCounts(json, kColumnNames, counts.data()) : (void)json.number("values", counts[kAll]);
     json.close();
-  }
+  });
   json.close().open("findings");
   for (std::size_t i = 1; i < kConditionCount; ++i) {
     json.number(kConditions[i].name, tally.totals[kFirstCondition + i]);

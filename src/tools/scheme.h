@@ -17,6 +17,15 @@ class StoredValue;
 
 enum class Kind { kClear, kOneWay, kReversible, kUnknown };
 
+// What a value is worth against somebody who reads it, the worst first. kExternal: the password is elsewhere; kLocked:
+// nothing matches.
+enum class Strength { kClear, kReversible, kUnsalted, kDesCrypt, kSaltedFast, kStrong, kExternal, kLocked, kUnknown };
+constexpr const char* kStrengthNames[] = {"clear",  "reversible", "unsalted", "des-crypt", "salted-fast",
+                                          "strong", "external",   "locked",   "unknown"};
+constexpr const char* nameOf(Strength strength) {
+  return kStrengthNames[static_cast<int>(strength)];
+}
+
 // What a payload has to be: check says what is wrong with one, or null. For base64, the number of bytes that it stands
 // for: from least to most, in whole steps, else text is the problem.
 struct PayloadRule {
@@ -29,7 +38,7 @@ struct PayloadRule {
 
 struct Scheme {
   const char* name;      // "ssha"; "clear" for clear text
-  std::string_view tag;  // "{SSHA}", in any case; empty for clear text. Of two tags that fit, the longer one counts
+  std::string_view tag;  // "{SSHA}", in any case; empty for clear text. Other programs' rows: all tags, one by one
   int code;              // of enum PasswordFormat; FORMAT_NONE for what the server's check does not know
   Kind kind;
   std::size_t cutBytes;       // a password is cut to this many bytes when a value is made; 0: taken whole
@@ -46,13 +55,17 @@ struct Scheme {
   Status (*check)(const StoredValue& value, const KeyRecord& key, const Secret& password);
   Status (*open)(const StoredValue& value, const KeyRecord& key, Secret& out);
 
+  Strength strength;
+  const char* writers;        // programs that write such values
+  std::string_view prefix{};  // of the payload, where several algorithms share a tag
+
   bool needsKey() const noexcept { return keyIndex >= 0; }
   bool reversible() const noexcept { return kind == Kind::kReversible; }
   bool isClear() const noexcept { return kind == Kind::kClear; }
   bool cuts(std::size_t bytes) const noexcept { return cutBytes != 0 && bytes > cutBytes; }
 };
 
-// All schemes, clear text first.
+// The schemes of the library, clear text first.
 extern const std::initializer_list<Scheme> kSchemes;
 
 // By name, in any case, with or without braces ("ssha", "{SSHA}", "clear"); null when there is none.
@@ -64,9 +77,11 @@ class StoredValue {
   explicit StoredValue(const Secret& value) noexcept;
 
   const Secret& whole() const noexcept { return *whole_; }
-  // By the tag, qveil for an untagged value wrapped in ">" and "<"; a scheme of its own, outside the table and of the
-  // kind kUnknown, for a value with a tag of no known scheme; otherwise clear text.
+  // By the tag, qveil for an untagged value wrapped in ">" and "<"; a row of foreign_schemes.h where the value is none of
+  // the library's; a scheme of its own, outside the tables and of the kind kUnknown, for a tag of no known scheme;
+  // otherwise clear text.
   const Scheme& scheme() const noexcept { return *scheme_; }
+  // As it is spelt in the value.
   std::string_view tag() const noexcept { return whole_->view().substr(0, tagBytes_); }
   std::string_view payload() const noexcept { return whole_->view().substr(tagBytes_); }
   // What is wrong with the payload, or null when it is well formed, as clear text always is.

@@ -11,8 +11,8 @@
 #include <string_view>
 #include <vector>
 
+#include "foreign_schemes.h"
 #include "results.h"
-#include "scheme.h"
 
 namespace tool {
 
@@ -23,9 +23,9 @@ struct Tally {
 
   std::uint64_t entries = 0;
   std::array<std::uint64_t, kTotals> totals{};
-  std::vector<Row> schemes = std::vector<Row>(kSchemes.size());
+  std::vector<Row> schemes = std::vector<Row>(kSchemes.size() + kForeignSchemes.size());
 
-  Row& of(const Scheme& scheme) { return schemes[static_cast<std::size_t>(&scheme - kSchemes.begin())]; }
+  Row& of(const Scheme& scheme) { return schemes[indexOf(scheme)]; }
   const Row& of(const Scheme& scheme) const { return const_cast<Tally*>(this)->of(scheme); }
   void add(const Tally& part) noexcept {
     entries += part.entries;

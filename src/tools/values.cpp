@@ -12,11 +12,13 @@ constexpr std::size_t kMaxPasswordBytes = std::size_t{1} << 28;
 constexpr std::size_t kMaxValueBytes = kMaxPasswordBytes * 2;
 
 constexpr Status kNoKey{kBadKey, "an AES value needs the key stash (--keys)"};
+constexpr Status kElsewhere{kBadValue, "the password is checked by another service and cannot be computed here"};
 
 Status valueProblem(const StoredValue& value, const KeyRecord& key) {
   const Scheme& scheme = value.scheme();
   if (value.whole().size() > kMaxValueBytes) return {kBadValue, "the value is too long"};
   if (const char* problem = value.problem()) return {kBadValue, problem};
+  if (scheme.check == nullptr && scheme.strength == Strength::kExternal) return kElsewhere;
   if (scheme.check == nullptr) return {kBadValue, "a value of this scheme can only be recognised"};
   if (scheme.needsKey() && !key) return kNoKey;
   return {};

@@ -1,0 +1,44 @@
+// SPDX-License-Identifier: Apache-2.0
+// The forms of foreign payloads: what is wrong with one, and its parts.
+#ifndef LDAPPW_TOOLS_FOREIGN_PAYLOADS_H
+#define LDAPPW_TOOLS_FOREIGN_PAYLOADS_H
+
+#include <cstdint>
+#include <string_view>
+
+#include "scheme.h"
+
+namespace tool {
+
+// What is wrong with a payload, or null; the rule's least is the number of bytes, or of characters of the hash.
+const char* hexProblem(const PayloadRule& rule, std::string_view payload);
+const char* cryptStringProblem(const PayloadRule& rule, std::string_view payload);
+const char* bigcryptProblem(const PayloadRule& rule, std::string_view payload);
+const char* pbkdf2Problem(const PayloadRule& rule, std::string_view payload);
+const char* argon2Problem(const PayloadRule& rule, std::string_view payload);
+
+// A decimal number without sign; false when it is none or too large.
+bool parseNumber(std::string_view text, std::uint32_t& number) noexcept;
+
+// Bytes of base64 with or without padding, "." standing for "+" as some programs write it; false when it is none.
+bool decodeBase64(std::string_view text, Secret& bytes);
+
+// iterations$salt$hash, decoded.
+struct Pbkdf2Parts {
+  std::uint32_t iterations = 0;
+  Secret salt;
+  Secret hash;
+};
+bool parsePbkdf2(std::string_view payload, Pbkdf2Parts& parts);
+
+// $type[$v=number]$m=number,t=number,p=number$salt$hash.
+struct Argon2Parts {
+  std::uint32_t memoryKib = 0;
+  std::uint32_t passes = 0;
+  std::uint32_t lanes = 0;
+};
+bool parseArgon2(std::string_view payload, Argon2Parts& parts);
+
+}  // namespace tool
+
+#endif
