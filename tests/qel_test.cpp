@@ -574,7 +574,7 @@ int outliveExit() {
   std::exit(kBad);
 }
 
-int forkAmongThreads() {
+[[maybe_unused]] int forkAmongThreads() {
   const Handles& h = sharedWithThreads();
   const auto child = [&h] {
     const Handles own;
@@ -591,7 +591,9 @@ TEST(QelDeathTest, WhatHappensOnce) {
   EXPECT_EQ(inChild(endOpenssl), kGood);
   EXPECT_EQ(inChild(outliveExit), kGood);
   EXPECT_EQ(inChild(cancelInFirstDraw), kGood);
+#ifndef __SANITIZE_ADDRESS__  // its own allocator leaves locks taken in the child
   EXPECT_EQ(inChild(forkAmongThreads), kGood);
+#endif
   for (int i = 0; i < 20; ++i) EXPECT_EQ(inChild(exitAmongThreads), kGood);
 }
 
