@@ -85,13 +85,17 @@ TEST(SetkeyAndEncrypt, AreDesOnBitsInEveryForm) {
       EXPECT_EQ(block, bitsOf(opensslDes(key, plain, true)));
     }
   }
-  // Formatting leaves no key behind; this salt leaves the expansion as it is.
-  char value[20];
-  ASSERT_EQ(format_password(4, std::string("..").data(), nullptr, "secret", 6, value, sizeof value), 20);
-  const std::string zero(8, '\0');
-  std::string block = bitsOf(zero);
+  // Formatting leaves what a key without bits would leave, but for the text.
+  const char* shared = _crypt("key", "zz");
+  char value[21] = {};
+  ASSERT_EQ(format_password(4, std::string("ab").data(), nullptr, "secret", 6, value, sizeof value), 20);
+  EXPECT_STREQ(shared, value + 7);
+  _crypt_r("", "ab", &state);
+  std::string block = bitsOf("8 bytes!");
+  std::string expected = block;
   _encrypt(block.data(), 0);
-  EXPECT_EQ(block, bitsOf(opensslDes(zero, zero, true)));
+  _encrypt_r(expected.data(), 0, &state);
+  EXPECT_EQ(block, expected);
 }
 
 TEST(GenerateCryptSalt, DrawsFromClockAndProcessNumber) {

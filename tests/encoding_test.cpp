@@ -4,6 +4,7 @@
 
 #include <array>
 
+#include "crypto_des.h"
 #include "oracle.h"
 #include "support.h"
 #include "utils_masked_tables.h"
@@ -125,6 +126,17 @@ TEST(Des, AgreesWithOpensslSingleAndTriple) {
       const std::string result = crypted(three[2], crypted(three[1], crypted(three[0], clear)));
       EXPECT_EQ(result, opensslDes(keys, clear, decrypt == 0));
     }
+  }
+}
+
+TEST(Des, BlocksSideBySideAreBlocksAlone) {
+  std::mt19937 random(4);
+  for (size_t count = 0; count <= 20; ++count) {
+    const std::string key = randomBytes(random, 8);
+    const std::string clear = randomBytes(random, 8 * count);
+    Guarded blocks(clear);
+    ldappw::desBlocks(scheduleOf(deskey, key, 0).data(), bytesOf(blocks.data()), count);
+    EXPECT_EQ(std::string(blocks.data(), 8 * count), opensslDes(key, clear, true)) << count;
   }
 }
 

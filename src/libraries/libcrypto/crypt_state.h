@@ -2,9 +2,11 @@
 // What the password module needs of the Unix crypt beside its public operations.
 #pragma once
 
+#include "crypt_hash.h"
+
 namespace ldappw {
 
-// Clears the round keys and the block that the last _crypt left in the process-wide state.
-void wipeCryptState() noexcept;
+// _crypt on the process-wide state, with neither the round keys nor the block left in it. One call at a time.
+char* cryptWiped(const CryptInput& input) noexcept;
 
 }  // namespace ldappw

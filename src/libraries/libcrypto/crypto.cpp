@@ -30,7 +30,12 @@ void reverseRounds(uint32_t* schedule) noexcept {
 }
 
 void fullSchedule(uint32_t* schedule, const unsigned char* key, bool decrypt) noexcept {
-  buildSchedule(schedule, key);
+  RoundKeys keys;
+  deriveRoundKeys(keys, key);
+  for (unsigned round = 0; round < 16; ++round) {
+    schedule[2 * round] = (keys.c[round] & 0xffff0000U) | keys.d[round] >> 16U;
+    schedule[2 * round + 1] = keys.c[round] << 16U | (keys.d[round] & 0xffffU);
+  }
   if (decrypt) reverseRounds(schedule);
   scaleForByteOffsets(schedule);
 }
@@ -40,6 +45,11 @@ void fullSchedule(uint32_t* schedule, const unsigned char* key, bool decrypt) no
 constexpr unsigned kReducedKeyBits = 40;
 constexpr unsigned kReducedRoundKeyBits = 32;
 constexpr unsigned kHalfBits = 28;
+
+struct RoundKey {
+  uint32_t odd;
+  uint32_t even;
+};
 
 RoundKey reducedRoundKey(const uint8_t (&selected)[56], unsigned rotation) noexcept {
   SecretArray<56> rotated;
@@ -81,12 +91,7 @@ const char* pEncrypt = "ujzde8gxd6ncf10epf91dhodzdoc9is0j8ht9lgmx&9edn581u33xtpl
 
 void des(const uint32_t* schedule, unsigned char* block) noexcept {
   if (schedule == nullptr || block == nullptr) return;
-  Halves halves{loadBigEndian(block), loadBigEndian(block + 4)};
-  initialPermutation(halves);
-  desRounds(halves, schedule);
-  finalPermutation(halves);
-  storeBigEndian(block, halves.left);
-  storeBigEndian(block + 4, halves.right);
+  desBlocks(schedule, block, 1);
 }
 
 void deskey(uint32_t* schedule, const unsigned char* key, int decrypt) noexcept {

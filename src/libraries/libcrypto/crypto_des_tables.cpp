@@ -55,36 +55,48 @@ constexpr uint32_t permuted(uint32_t bits) {
   return result;
 }
 
-constexpr uint32_t spboxWord(unsigned box, unsigned input) {
+// The output of an S-box behind the P permutation.
+constexpr uint32_t substitutedWord(unsigned box, unsigned input) {
   const unsigned row = ((input >> 4U) & 2U) | (input & 1U);
   const unsigned column = (input >> 1U) & 15U;
-  const uint32_t word = permuted(uint32_t{kSubstitution[box][row * 16 + column]} << (28U - 4U * box));
+  return permuted(uint32_t{kSubstitution[box][row * 16 + column]} << (28U - 4U * box));
+}
+
+constexpr uint32_t spboxWord(unsigned box, unsigned input) {
+  const uint32_t word = substitutedWord(box, input);
   return (word << 1U) | (word >> 31U);
 }
 
-constexpr uint64_t pc1Chunk(unsigned byte, unsigned upperBits) {
-  uint64_t result = 0;
-  for (unsigned i = 0; i < 56; ++i) {
-    const unsigned bit = pc1[i] - 1U;
-    if (bit / 8 == byte && ((upperBits >> (6U - bit % 8)) & 1U) != 0) result |= uint64_t{1} << (55U - i);
-  }
-  return result;
+// Where the n-th of the 24 bits that come from one half of the key lies in its word.
+constexpr unsigned roundBit(unsigned n) {
+  return kGroupShifts[n / 6] + 5U - n % 6;
 }
 
-constexpr RoundKey pc2Chunk(unsigned chunk, unsigned bits) {
-  RoundKey key{0, 0};
-  for (unsigned i = 0; i < 48; ++i) {
-    const unsigned source = pc2[i] - 1U;
-    if (source / 7 != chunk || ((bits >> (6U - source % 7)) & 1U) == 0) continue;
-    const unsigned group = i / 6;
-    const uint32_t word = uint32_t{1} << ((3U - group / 2) * 8U + 5U - i % 6);
-    if (group % 2 == 0) {
-      key.odd |= word;
-    } else {
-      key.even |= word;
-    }
+// The key bit, from 0, that PC-1, the rotation of a round and PC-2 bring to the n-th place of a half's 24.
+constexpr unsigned keyBit(unsigned half, unsigned round, unsigned n) {
+  const unsigned rotated = pc2[24 * half + n] - 1U - 28 * half;
+  return pc1[28 * half + (rotated + totrot[round]) % 28] - 1U;
+}
+
+constexpr KeyParts keyParts() {
+  KeyParts parts{};
+  for (unsigned i = 0; i < 2 * 16 * 24; ++i) {
+    const unsigned half = i / (16 * 24);
+    const unsigned round = i / 24 % 16;
+    const unsigned bit = keyBit(half, round, i % 24);
+    auto& rows = half == 0 ? parts.c[bit / 8] : parts.d[bit / 8];
+    const unsigned place = (half == 0 ? 3U : 6U) - bit % 8;  // among the four bits that choose a row
+    for (unsigned bits = 0; bits < 16; ++bits) rows[bits][round] |= ((bits >> place) & 1U) << roundBit(i % 24);
   }
-  return key;
+  return parts;
+}
+
+constexpr WordPair expandedPair(unsigned byte, unsigned input) {
+  constexpr unsigned kGroups[4] = {3, 1, 2, 0};  // by byte, as kGroupShifts has them
+  const uint32_t half = substitutedWord(kGroups[byte % 4] + byte / 4 * 4, input);
+  WordPair pair{};
+  for (unsigned n = 0; n < 48; ++n) pair[n / 24] |= ((half >> (32U - kExpansion[n])) & 1U) << roundBit(n % 24);
+  return pair;
 }
 
 template <class Word, size_t kColumns>
@@ -99,7 +111,7 @@ constexpr DesTable<Word, kColumns> filled(Word (*entry)(unsigned row, unsigned c
 }  // namespace
 
 constexpr DesTable<uint32_t, 64> Spbox = filled<uint32_t, 64>(spboxWord);
-constexpr DesTable<uint64_t, 128> kPc1Chunks = filled<uint64_t, 128>(pc1Chunk);
-constexpr DesTable<RoundKey, 128> kPc2Chunks = filled<RoundKey, 128>(pc2Chunk);
+constexpr ExpandedBoxes kExpandedBoxes = filled<WordPair, 64>(expandedPair);
+constexpr KeyParts kKeyParts = keyParts();
 
 }  // namespace ldappw

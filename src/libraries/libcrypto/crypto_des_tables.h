@@ -22,16 +22,23 @@ extern const uint8_t kExpansion[48];
 // keeps the halves of a block. The input's six bits are in the order of the expansion.
 extern const DesTable<uint32_t, 64> Spbox;
 
-// One round key: the groups 1, 3, 5, 7 and 2, 4, 6, 8, a group a byte, the first in the top byte.
-struct RoundKey {
-  uint32_t odd;
-  uint32_t even;
+// The round keys lie in two halves: groups 1 to 4 come from the half C of the key, groups 5 to 8 from D. A word holds one
+// group a byte, from the top 1, 3, 2, 4 (5, 7, 6, 8), so that its 16-bit halves go into the words of a schedule as they
+// are, and groups that are four apart have the same place in both.
+constexpr unsigned kGroupShifts[4] = {24, 8, 16, 0};
+using RoundWords = std::array<uint32_t, 16>;
+
+// What four bits of a key byte add to the words of all rounds: its bits 1 to 4 to those of C, 4 to 7 to those of D.
+struct KeyParts {
+  alignas(64) RoundWords c[8][16];
+  alignas(64) RoundWords d[8][16];
 };
+extern const KeyParts kKeyParts;
 
-// PC-1 over the upper seven bits of each key byte: the 28 bits of C, then the 28 bits of D.
-extern const DesTable<uint64_t, 128> kPc1Chunks;
-
-// PC-2 over the eight 7-bit chunks of C and D, the first chunk of C first.
-extern const DesTable<RoundKey, 128> kPc2Chunks;
+// The S-box, the P permutation and the expansion in one: all 48 inputs of the next round, as a pair of words in which
+// they lie as round keys do. By the byte of the input, the lowest of C's word first and then those of D's.
+using WordPair = std::array<uint32_t, 2>;
+using ExpandedBoxes = DesTable<WordPair, 64>;
+extern const ExpandedBoxes kExpandedBoxes;
 
 }  // namespace ldappw

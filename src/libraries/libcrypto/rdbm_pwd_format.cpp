@@ -92,9 +92,9 @@ size_t makeSsha(TracedCall&, const Scheme&, const FormatRequest& request, char* 
 size_t makeCrypt(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
   SecretArray<kCryptKeyBytes + 1> key;
   std::memcpy(key.data(), request.clear, strnlen(request.clear, least(request.clearBytes, kCryptKeyBytes)));
+  const CryptInput input(key.text(), request.salt);
   const CryptLock lock;
-  std::memcpy(payload, _crypt(key.text(), request.salt), kCryptCharacters);
-  wipeCryptState();
+  std::memcpy(payload, cryptWiped(input), kCryptCharacters);
   return kCryptCharacters;
 }
 
