@@ -60,7 +60,7 @@ TEST(Masking, TextsAreTheRecordedOnes) {
     int draws;  // as many texts, each under another draw
     const char* digest;
   } rows[] = {
-      {"the most for width 1, every key and alphabet", 11, 12, 77, "9d6a02d3b195e3c55501adf0ba513edab7ef7f8a"},
+      {"the most for width 1, every key and alphabet", 11, 12, 77, "b1f16cce492a71cbc62bd7f4fa9d8d5f79e19db0"},
       {"the least for width 2", 11, 13, 1, "55c989fcc7fad2b26bd01f46ce32eb9ef884caa7"},
       {"the most for width 2", 11, 24, 1, "8f24d28051898b3f09a1d932669e7a366e63ff1d"},
       {"the least for width 4", 11, 25, 1, "c7d818968e1b196faebf140f4d2537278c7aecbf"},
@@ -68,7 +68,7 @@ TEST(Masking, TextsAreTheRecordedOnes) {
       {"the least in a larger area", 11, 49, 1, "4fe907921f822fad4c9705394c8800c3182f34d7"},
       {"a length of three bytes", 11, 70000, 1, "feb2e50055c13a4806e657b2667a1b2ebaa05b28"},
       {"reduced reading", 7, 20, 1, "5c03b3213f539e021c26c0da625e7d9b86ba5042"},
-      {"no key", 1, 20, 16, "4b62ffec88e78c8c49ebf86acf101774b9498e0b"},
+      {"no key", 1, 20, 16, "23a75f3fe3cdc4d7d6201bc66428fcc29f85be7a"},
   };
   for (const auto& row : rows) {
     SCOPED_TRACE(row.name);
@@ -76,7 +76,7 @@ TEST(Masking, TextsAreTheRecordedOnes) {
     const std::string data = test::letters(row.length);
     std::string texts;
     for (int i = 0; i < row.draws; ++i) {
-      const test::Replaced<int> draw(fixedDraw, 0x17002a5b + i);  // with a byte that no background may hold
+      const test::Replaced<int> draw(fixedDraw, 0x17002a5b + i * 0x10001);  // the first holds a NUL, as no background
       const std::string text = encoded(data);
       EXPECT_EQ(decoded(text).data == data + '\0', row.selector != 7);  // what 7 masks is read with another schedule
       texts += text;

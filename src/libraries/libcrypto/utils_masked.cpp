@@ -20,17 +20,15 @@ namespace {
 constexpr unsigned encodingMax = sizeof encodings / sizeof encodings[0] - 1;
 constexpr int kLargestLength = 0xffffff;  // the packet states a length in three bytes
 
-// The control packet. From kBlockAt on it is enciphered.
-constexpr size_t kPacketBytes = 26;
-constexpr size_t kIdentifierAt = 1;
-constexpr size_t kLengthAt = 2;
-constexpr size_t kBlockKeyAt = 12;
-constexpr size_t kBlockSelectorAt = 13;
-constexpr size_t kBlockAt = 18;
-constexpr size_t kSelectorAt = 18;
-constexpr size_t kKeyAt = 19;
-constexpr size_t kConstantAt = 20;
-constexpr size_t kWidthAt = 21;
+// The control packet, without the two characters of it that the text shows in clear. From kBlockAt on it is enciphered.
+constexpr size_t kPacketBytes = 24;
+constexpr size_t kBlockKeyAt = 10;
+constexpr size_t kBlockSelectorAt = 11;
+constexpr size_t kBlockAt = 16;
+constexpr size_t kSelectorAt = 16;
+constexpr size_t kKeyAt = 17;
+constexpr size_t kConstantAt = 18;
+constexpr size_t kWidthAt = 19;
 constexpr unsigned char kBlockSelectorMask = 0xcc;
 constexpr unsigned char kSelectorMask = 0x56;
 constexpr unsigned char kConstantMask = 0x3f;
@@ -38,10 +36,9 @@ constexpr unsigned char kWidthMask = 0x3f;
 constexpr unsigned kConstant = 39;
 static_assert(kPacketBytes - kBlockAt == kCipherBlock);
 
-// The record: the packet, without the two characters that the text shows in clear, lies behind the first data bytes.
+// The record: the packet lies behind the first data bytes. While it is worked on, the packet comes first.
 constexpr size_t kDataBefore = 47;
-constexpr size_t kPacketInRecord = kPacketBytes - kLengthAt;
-constexpr size_t kFixedRecord = kDataBefore + kPacketInRecord;
+constexpr size_t kFixedRecord = kDataBefore + kPacketBytes;
 constexpr size_t kUsualRecord = 256;  // passwords need no allocation for theirs
 
 constexpr unsigned kLengthCursor = 4;  // where the scattering of the length enters the pattern tables
@@ -61,54 +58,68 @@ const Encoding& drawnEncoding() noexcept {
   return encodings[static_cast<unsigned>(rand_r(&seed)) % encodingMax];
 }
 
+// A length's lowest byte is scattered over two bytes of the packet, the others over eight more, with the patterns of
+// other widths but one cursor.
 void scatterLength(unsigned char* packet, size_t length) noexcept {
-  Cursor cursor = kLengthCursor;
-  bitScatter(static_cast<unsigned char>(length), packet + kLengthAt, cursor, 4);
-  bitScatter(static_cast<unsigned char>(length >> 8U), packet + kLengthAt + 2, cursor, 2);
-  bitScatter(static_cast<unsigned char>(length >> 16U), packet + kLengthAt + 6, cursor, 2);
+  const unsigned char bytes[3] = {static_cast<unsigned char>(length), static_cast<unsigned char>(length >> 8U),
+                                  static_cast<unsigned char>(length >> 16U)};
+  const Cursor cursor = bitScatter(bytes, 1, packet, 4, kLengthCursor);
+  bitScatter(bytes + 1, 2, packet + 2, 2, cursor);
 }
 
 size_t gatheredLength(const unsigned char* packet) noexcept {
-  Cursor cursor = kLengthCursor;
-  size_t length = bitGather(packet + kLengthAt, cursor, 4);
-  length |= size_t{bitGather(packet + kLengthAt + 2, cursor, 2)} << 8U;
-  return length | size_t{bitGather(packet + kLengthAt + 6, cursor, 2)} << 16U;
+  unsigned char bytes[3];
+  const Cursor cursor = bitGather(packet, bytes, 1, 4, kLengthCursor);
+  bitGather(packet + 2, bytes + 1, 2, 2, cursor);
+  return size_t{bytes[0]} | size_t{bytes[1]} << 8U | size_t{bytes[2]} << 16U;
 }
 
 void write(unsigned char* packet, size_t at, unsigned value, unsigned char mask) noexcept {
-  packet[at] = expandOnBitPattern(value, packet[at], mask, 0);
+  packet[at] = expandOnBitPattern(value, packet[at], mask);
 }
 
-// Masks the data into the packet and the data area of a record.
-void mask(const unsigned char* data, size_t length, unsigned selector, unsigned char* packet, unsigned char* area,
-          size_t size) noexcept {
-  setBackground(packet + kLengthAt, kPacketInRecord);
+// Masks the data into a packet and the area of so many bytes behind it.
+void mask(const unsigned char* data, size_t length, unsigned selector, unsigned char* packet, size_t size) noexcept {
+  unsigned char* area = packet + kPacketBytes;
+  setBackground(packet, kPacketBytes);
   setBackground(area, size);
   const unsigned width = widthFor(length, size);
-  Cursor cursor = 0;
-  for (size_t i = 0; i < length; ++i) bitScatter(data[i], area + 8 / width * i, cursor, width);
+  bitScatter(data, length, area, width);
   write(packet, kWidthAt, width, kWidthMask);
   write(packet, kConstantAt, kConstant, kConstantMask);
   write(packet, kSelectorAt, selector, kSelectorMask);
-  encryptData(area, size, selector, packet[kKeyAt]);
+  RecordCipher cipher;
+  cipher.encryptData(area, size, selector, packet[kKeyAt]);
   write(packet, kBlockSelectorAt, selector, kBlockSelectorMask);
-  encryptData(packet + kBlockAt, kCipherBlock, selector, packet[kBlockKeyAt]);
+  cipher.encryptData(packet + kBlockAt, kCipherBlock, selector, packet[kBlockKeyAt]);
   scatterLength(packet, length);
 }
 
+// Moves a packet from before the area to its place in the record, and back.
+void movePacketIn(unsigned char* record) noexcept {
+  unsigned char packet[kPacketBytes];
+  std::memcpy(packet, record, kPacketBytes);
+  std::memmove(record, record + kPacketBytes, kDataBefore);
+  std::memcpy(record + kDataBefore, packet, kPacketBytes);
+}
+void movePacketOut(unsigned char* record) noexcept {
+  unsigned char packet[kPacketBytes];
+  std::memcpy(packet, record + kDataBefore, kPacketBytes);
+  std::memmove(record + kPacketBytes, record, kDataBefore);
+  std::memcpy(record, packet, kPacketBytes);
+}
+
 int wrapped(const unsigned char* record, size_t bytes, const Encoding& encoding, char** out) noexcept {
-  const PlainOwner<char> text(binaryBlobToString(record, static_cast<int>(bytes), encoding.alphabet));
-  if (!text) return LDAPPW_NO_MEMORY;
-  const size_t characters = std::strlen(text.get());
-  char* result = static_cast<char*>(std::malloc(characters + 5));
-  if (result == nullptr) return LDAPPW_NO_MEMORY;
-  result[0] = '>';
-  result[1] = '1';
-  result[2] = encoding.identifier[0];
-  std::memcpy(result + 3, text.get(), characters);
-  result[3 + characters] = '<';
-  result[4 + characters] = '\0';
-  *out = result;
+  const size_t characters = (bytes + 2) / 3 * 4;
+  char* text = static_cast<char*>(std::malloc(characters + 5));
+  if (text == nullptr) return LDAPPW_NO_MEMORY;
+  text[0] = '>';
+  text[1] = '1';
+  text[2] = encoding.identifier[0];
+  encodeBytes(record, bytes, encoding.alphabet, text + 3);
+  text[3 + characters] = '<';
+  text[4 + characters] = '\0';
+  *out = text;
   return LDAPPW_SUCCESS;
 }
 
@@ -116,17 +127,12 @@ int encode(const unsigned char* data, size_t length, char** out) noexcept {
   const auto selector = static_cast<unsigned>(encryptionType);
   if (!isSelector(selector)) return LDAPPW_NOT_SUPPORTED;
   const Encoding& encoding = drawnEncoding();
-  SecretArray<kPacketBytes> packet;
-  packet.data()[0] = '1';
-  packet.data()[kIdentifierAt] = static_cast<unsigned char>(encoding.identifier[0]);
   const auto size = static_cast<size_t>(findBinaryDataBufferSize(length));
-  SecretBytes<kUsualRecord> record(size + kPacketInRecord);
+  SecretBytes<kUsualRecord> record(kPacketBytes + size);
   if (!record) return LDAPPW_NO_MEMORY;
-  unsigned char* area = record.get() + kPacketInRecord;
-  mask(data, length, selector, packet.data(), area, size);
-  std::memmove(record.get(), area, kDataBefore);
-  std::memcpy(record.get() + kDataBefore, packet.data() + kLengthAt, kPacketInRecord);
-  return wrapped(record.get(), size + kPacketInRecord, encoding, out);
+  mask(data, length, selector, record.get(), size);
+  movePacketIn(record.get());
+  return wrapped(record.get(), record.size(), encoding, out);
 }
 
 // What a decoder makes: bytes with a NUL behind them, and how many it says they are.
@@ -140,28 +146,26 @@ int gathered(const unsigned char* area, size_t areaBytes, size_t length, unsigne
   out.data = zeroedBytes<unsigned char>(length + 1);
   if (out.data == nullptr) return LDAPPW_NO_MEMORY;
   out.length = length;
-  Cursor cursor = 0;
-  for (size_t i = 0; i < length; ++i) out.data[i] = bitGather(area + 8 / width * i, cursor, width);
+  bitGather(area, out.data, length, width);
   return LDAPPW_SUCCESS;
 }
 
 // Undoes mask on a record, which it uses as its work area.
 int unmask(unsigned char* record, size_t bytes, Decoded& out) noexcept {
-  if (bytes < kFixedRecord || (bytes - kPacketInRecord) % kCipherBlock != 0) return LDAPPW_NOT_SUPPORTED;
-  SecretArray<kPacketBytes> packetBytes;
-  unsigned char* packet = packetBytes.data();
-  std::memcpy(packet + kLengthAt, record + kDataBefore, kPacketInRecord);
-  std::memmove(record + kPacketInRecord, record, kDataBefore);
-  unsigned char* area = record + kPacketInRecord;
-  const size_t areaBytes = bytes - kPacketInRecord;
+  if (bytes < kFixedRecord || (bytes - kPacketBytes) % kCipherBlock != 0) return LDAPPW_NOT_SUPPORTED;
+  movePacketOut(record);
+  unsigned char* packet = record;
+  unsigned char* area = record + kPacketBytes;
+  const size_t areaBytes = bytes - kPacketBytes;
 
   const unsigned blockSelector = collapseOnBitPattern(packet[kBlockSelectorAt], kBlockSelectorMask);
   if (!isSelector(blockSelector)) return LDAPPW_NOT_SUPPORTED;
-  decryptData(packet + kBlockAt, kCipherBlock, blockSelector, packet[kBlockKeyAt]);
+  RecordCipher cipher;
+  cipher.decryptData(packet + kBlockAt, kCipherBlock, blockSelector, packet[kBlockKeyAt]);
   const unsigned selector = collapseOnBitPattern(packet[kSelectorAt], kSelectorMask);
   const unsigned width = collapseOnBitPattern(packet[kWidthAt], kWidthMask);
   if (!isSelector(selector) || !isWidth(width)) return LDAPPW_NOT_SUPPORTED;
-  decryptData(area, areaBytes, selector, packet[kKeyAt]);
+  cipher.decryptData(area, areaBytes, selector, packet[kKeyAt]);
   return gathered(area, areaBytes, gatheredLength(packet), width, out);
 }
 
@@ -286,7 +290,7 @@ void _morva_utils_decode_binary_free(char** result) noexcept {
 
 int _morva_utils_getEncodedSize(int length) noexcept {
   const uint64_t data = length > 0 ? static_cast<uint64_t>(length) : 0;
-  const uint64_t bytes = masking::findBinaryDataBufferSize(data) + masking::kPacketInRecord;
+  const uint64_t bytes = masking::findBinaryDataBufferSize(data) + masking::kPacketBytes;
   const uint64_t size = (bytes + 2) / 3 * 4 + 5;
   return size <= INT_MAX ? static_cast<int>(size) : 0;
 }

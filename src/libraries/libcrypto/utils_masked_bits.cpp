@@ -2,6 +2,8 @@
 // The bit work of the masked encoding, and what must hold of its tables.
 #include "utils_masked_bits.h"
 
+#include <array>
+
 #include "utils_masked_tables.h"
 
 namespace ldappw::masking {
@@ -57,58 +59,94 @@ static_assert(holdsPatterns(scatterArray1, 12, 1));
 static_assert(holdsPatterns(scatterArray2, 26, 2));
 static_assert(holdsPatterns(scatterArray4, 39, 4));
 
-const unsigned char* patterns(unsigned width) noexcept {
-  return width == 1 ? scatterArray1 : width == 2 ? scatterArray2 : scatterArray4;
+// What a mask makes of each value, and of each half of a byte that it is applied to.
+struct Pattern {
+  unsigned char mask;
+  unsigned char expanded[16];
+  unsigned char collapsedLow[16];
+  unsigned char collapsedHigh[16];
+};
+
+constexpr Pattern patternOf(unsigned char mask) {
+  Pattern pattern{mask, {}, {}, {}};
+  for (unsigned i = 0; i < 16; ++i) {
+    pattern.expanded[i] = expandOnBitPattern(i, 0, mask);
+    pattern.collapsedLow[i] = static_cast<unsigned char>(collapseOnBitPattern(i, mask));
+    pattern.collapsedHigh[i] = static_cast<unsigned char>(collapseOnBitPattern(i << 4U, mask));
+  }
+  return pattern;
 }
 
-unsigned char nextMask(Cursor& cursor, const unsigned char* table) noexcept {
-  const unsigned char mask = table[cursor++];
-  if (table[cursor] == 0) cursor = 0;
-  return mask;
+template <size_t kSize>
+constexpr std::array<Pattern, kSize - 1> patternsOf(const unsigned char (&masks)[kSize]) {
+  std::array<Pattern, kSize - 1> patterns{};
+  for (size_t i = 0; i < kSize - 1; ++i) patterns[i] = patternOf(masks[i]);
+  return patterns;
+}
+
+constexpr auto kPatterns1 = patternsOf(scatterArray1);
+constexpr auto kPatterns2 = patternsOf(scatterArray2);
+constexpr auto kPatterns4 = patternsOf(scatterArray4);
+
+// The patterns of a width, taken one after another, round and round.
+template <unsigned kWidth>
+class Patterns {
+ public:
+  explicit Patterns(Cursor cursor) noexcept : next_(all().data() + cursor) {}
+
+  const Pattern& next() noexcept {
+    const Pattern& pattern = *next_++;
+    if (next_ == all().data() + all().size()) next_ = all().data();
+    return pattern;
+  }
+  Cursor cursor() const noexcept { return static_cast<Cursor>(next_ - all().data()); }
+
+ private:
+  static constexpr const auto& all() {
+    if constexpr (kWidth == 1) return kPatterns1;
+    if constexpr (kWidth == 2) return kPatterns2;
+    if constexpr (kWidth == 4) return kPatterns4;
+  }
+  const Pattern* next_;
+};
+
+template <unsigned kWidth>
+Cursor scatter(const unsigned char* data, size_t n, unsigned char* out, Cursor cursor) noexcept {
+  Patterns<kWidth> patterns(cursor);
+  for (const unsigned char* end = data + n; data != end; ++data) {
+#pragma GCC unroll 8
+    for (unsigned at = 0; at < 8; at += kWidth, ++out) {
+      const Pattern& pattern = patterns.next();
+      const unsigned value = static_cast<unsigned>(*data >> at) & ((1U << kWidth) - 1);
+      *out = static_cast<unsigned char>((*out & ~pattern.mask) | pattern.expanded[value]);
+    }
+  }
+  return patterns.cursor();
+}
+
+template <unsigned kWidth>
+Cursor gather(const unsigned char* in, unsigned char* data, size_t n, Cursor cursor) noexcept {
+  Patterns<kWidth> patterns(cursor);
+  for (const unsigned char* end = data + n; data != end; ++data) {
+    unsigned byte = 0;
+#pragma GCC unroll 8
+    for (unsigned at = 0; at < 8; at += kWidth, ++in) {
+      const Pattern& pattern = patterns.next();
+      byte |= static_cast<unsigned>(pattern.collapsedLow[*in & 15U] | pattern.collapsedHigh[*in >> 4U]) << at;
+    }
+    *data = static_cast<unsigned char>(byte);
+  }
+  return patterns.cursor();
 }
 
 }  // namespace
 
-bool isWidth(unsigned width) noexcept {
-  return width == 1 || width == 2 || width == 4;
+Cursor bitScatter(const unsigned char* data, size_t n, unsigned char* out, unsigned width, Cursor cursor) noexcept {
+  return (width == 1 ? scatter<1> : width == 2 ? scatter<2> : scatter<4>)(data, n, out, cursor);
 }
 
-unsigned char expandOnBitPattern(unsigned value, unsigned char byte, unsigned char mask, unsigned n) noexcept {
-  unsigned result = byte;
-  unsigned cleared = 0;
-  for (unsigned bit = 0; bit < 8 && (n == 0 || cleared < n); ++bit) {
-    if ((mask >> bit & 1U) == 0) continue;
-    result &= ~(1U << bit);
-    ++cleared;
-  }
-  for (unsigned bit = 8; bit-- > 0 && cleared > 0;) {
-    if ((mask >> bit & 1U) != 0) result |= (value >> --cleared & 1U) << bit;
-  }
-  return static_cast<unsigned char>(result);
-}
-
-unsigned collapseOnBitPattern(unsigned char byte, unsigned char mask) noexcept {
-  unsigned value = 0;
-  unsigned place = 0;
-  for (unsigned bit = 0; bit < 8; ++bit) {
-    if ((mask >> bit & 1U) != 0) value |= (byte >> bit & 1U) << place++;
-  }
-  return value;
-}
-
-void bitScatter(unsigned char byte, unsigned char* out, Cursor& cursor, unsigned width) noexcept {
-  const unsigned char* table = patterns(width);
-  for (unsigned k = 0; k < 8 / width; ++k) {
-    const unsigned bits = (byte >> (width * k)) & ((1U << width) - 1);
-    out[k] = expandOnBitPattern(bits, out[k], nextMask(cursor, table), 0);
-  }
-}
-
-unsigned char bitGather(const unsigned char* in, Cursor& cursor, unsigned width) noexcept {
-  const unsigned char* table = patterns(width);
-  unsigned byte = 0;
-  for (unsigned k = 0; k < 8 / width; ++k) byte |= collapseOnBitPattern(in[k], nextMask(cursor, table)) << (width * k);
-  return static_cast<unsigned char>(byte);
+Cursor bitGather(const unsigned char* in, unsigned char* data, size_t n, unsigned width, Cursor cursor) noexcept {
+  return (width == 1 ? gather<1> : width == 2 ? gather<2> : gather<4>)(in, data, n, cursor);
 }
 
 }  // namespace ldappw::masking

@@ -10,19 +10,30 @@ namespace ldappw::masking {
 using Cursor = unsigned;
 
 // Whether bytes can be scattered at this width: 1, 2 or 4 bits to an output byte.
-bool isWidth(unsigned width) noexcept;
+constexpr bool isWidth(unsigned width) {
+  return width == 1 || width == 2 || width == 4;
+}
 
-// The byte with its lowest n set mask bits cleared (all for n = 0) and as many bits of value written to the set mask
-// bits, from the highest mask bit downward.
-unsigned char expandOnBitPattern(unsigned value, unsigned char byte, unsigned char mask, unsigned n) noexcept;
+// The byte with the bits of value on the set mask bits, the lowest on the lowest.
+constexpr unsigned char expandOnBitPattern(unsigned value, unsigned byte, unsigned mask) {
+  byte &= ~mask;
+  for (; mask != 0; mask &= mask - 1, value >>= 1U) byte |= (0U - (value & 1U)) & mask & (0U - mask);
+  return static_cast<unsigned char>(byte);
+}
 
 // The byte's bits at the set mask positions, the lowest first.
-unsigned collapseOnBitPattern(unsigned char byte, unsigned char mask) noexcept;
+constexpr unsigned collapseOnBitPattern(unsigned byte, unsigned mask) {
+  unsigned value = 0;
+  for (unsigned bit = 1; mask != 0; mask &= mask - 1, bit <<= 1U) {
+    if ((byte & mask & (0U - mask)) != 0) value |= bit;
+  }
+  return value;
+}
 
-// Scatters a byte over the next 8 / width output bytes, whose other bits stay.
-void bitScatter(unsigned char byte, unsigned char* out, Cursor& cursor, unsigned width) noexcept;
+// Scatters bytes, each over the next 8 / width output bytes, whose other bits stay. Returns where the next mask is.
+Cursor bitScatter(const unsigned char* data, size_t n, unsigned char* out, unsigned width, Cursor cursor = 0) noexcept;
 
 // Undoes bitScatter.
-unsigned char bitGather(const unsigned char* in, Cursor& cursor, unsigned width) noexcept;
+Cursor bitGather(const unsigned char* in, unsigned char* data, size_t n, unsigned width, Cursor cursor = 0) noexcept;
 
 }  // namespace ldappw::masking
