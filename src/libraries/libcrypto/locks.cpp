@@ -8,7 +8,8 @@ namespace ldappw {
 namespace {
 
 pthread_mutex_t creationMutex = PTHREAD_MUTEX_INITIALIZER;
-pthread_mutex_t cryptMutex = PTHREAD_MUTEX_INITIALIZER;
+// Who finds it locked spins before it sleeps: it is held for less time than going to sleep takes.
+pthread_mutex_t cryptMutex = PTHREAD_ADAPTIVE_MUTEX_INITIALIZER_NP;
 thread_local bool isCreating = false;  // this thread holds creationMutex
 
 void beforeFork() noexcept {

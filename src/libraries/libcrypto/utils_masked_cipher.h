@@ -12,7 +12,7 @@ namespace ldappw::masking {
 enum Selector : unsigned { kSimpleCrypt = 1, kDesReducedReading = 7, kDes = 11 };
 
 constexpr size_t kCipherBlock = 8;
-constexpr unsigned char kClearIndex = 0xff;  // the key index that of data that were left clear
+constexpr unsigned char kClearIndex = 0xff;  // the key index of data that were left clear
 
 bool isSelector(unsigned selector) noexcept;
 
