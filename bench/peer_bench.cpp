@@ -1,8 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// Each operation of the library, named <work>/ours, and the same work done directly with libxcrypt or OpenSSL, named
-// <work>/peer. The OpenSSL peers use algorithms fetched beforehand and a new context for each call.
+// Each operation of the library, named <work>/ours, and the same work done directly with OpenSSL, named <work>/peer.
+// The peers use algorithms fetched beforehand and a new context for each call.
 #include <benchmark/benchmark.h>
-#include <crypt.h>
 #include <openssl/evp.h>
 #include <openssl/rand.h>
 
@@ -17,20 +16,6 @@ using bench::formatted;
 using bench::keys;
 using bench::kPassword;
 using bench::verified;
-
-// ---- Unix crypt ----
-
-void cryptOurs(benchmark::State& state) {
-  ldappw_crypt_data data{};
-  for (auto _ : state) benchmark::DoNotOptimize(_crypt_r(kPassword.c_str(), "ab", &data));
-}
-BENCHMARK(cryptOurs)->Name("crypt/ours");
-
-void cryptPeer(benchmark::State& state) {
-  static crypt_data data;
-  for (auto _ : state) benchmark::DoNotOptimize(crypt_r(kPassword.c_str(), "ab", &data));
-}
-BENCHMARK(cryptPeer)->Name("crypt/peer");
 
 // ---- {AES256} format and reveal ----
 
