@@ -216,7 +216,8 @@ TEST(FormatPassword, ReadsNothingBehindAFirstNul) {
       const std::string whole = clear + std::string(296, '\0');
       const int length = format_password(scheme, std::string("ab").data(), nullptr, end.data(), 300, out[0], 256);
       EXPECT_EQ(format_password(scheme, std::string("ab").data(), nullptr, whole.data(), 300, out[1], 256), length);
-      EXPECT_EQ(std::string(out[0], 12) == std::string(out[1], 12), scheme < 9) << scheme;  // the others draw
+      const bool equal = std::string(out[0], 12) == std::string(out[1], 12);
+      EXPECT_TRUE(scheme == 128 || equal == (scheme < 9)) << scheme;  // 9 draws a salt; 128 may draw one alphabet twice
     }
   }
 }
