@@ -27,6 +27,7 @@ void setUpFormat(CLI::App& verb, ExitCode& exitCode);
 void setUpVerify(CLI::App& verb, ExitCode& exitCode);
 void setUpReveal(CLI::App& verb, ExitCode& exitCode);
 void setUpKeys(CLI::App& verb, ExitCode& exitCode);
+void setUpAudit(CLI::App& verb, ExitCode& exitCode);
 void setUpLdif(CLI::App& verb, ExitCode& exitCode);
 void setUpTrial(CLI::App& verb, ExitCode& exitCode);
 

@@ -82,9 +82,9 @@ void Progress::hide() noexcept {
 class Run {
  public:
   Run(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
-      const std::function<void(std::string_view)>& deliver)
+      const std::function<void(const Part&)>& deliver)
       : reader_(input),
-        attributes_(options.attributes),
+        attributes_(options.attributes, options.others),
         progress_(input.fd(), options.resultsOnStdout),
         work_(work),
         deliver_(deliver) {}
@@ -115,7 +115,7 @@ class Run {
         part.tally.entries = walker.entries();
         if (!hand(batch, part)) return;
         part.out.clear();
-        part = {std::move(part.out), {}, {}, kSuccess};
+        part = {std::move(part.out), {}, {}, kSuccess, nullptr};
       }
     } catch (...) {
       stop(std::current_exception());
@@ -131,7 +131,7 @@ class Run {
     std::unique_lock<std::mutex> lock(output_);
     turn_.wait(lock, [&] { return failure_ || due_ == batch.number; });
     if (failure_) return false;
-    deliver_(part.out.view());
+    deliver_(part);
     if (!part.messages.empty()) progress_.hide();
     for (const std::string& text : part.messages) message(text);
     keepFirst(sum_.exitCode, part.exitCode);
@@ -157,7 +157,7 @@ class Run {
   const AttributeSet attributes_;
   Progress progress_;
   const std::function<void(RecordWalker&, Part&)>& work_;
-  const std::function<void(std::string_view)>& deliver_;
+  const std::function<void(const Part&)>& deliver_;
   std::mutex input_;
   std::mutex output_;
   std::condition_variable turn_;
@@ -179,7 +179,7 @@ Input openExport(const ExportOptions& options) {
 }
 
 Part runExport(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
-               const std::function<void(std::string_view out)>& deliver) {
+               const std::function<void(const Part& part)>& deliver) {
   const unsigned threads = options.threads > 0 ? options.threads : std::max(1U, std::thread::hardware_concurrency());
   return Run(input, options, work, deliver).all(threads);
 }

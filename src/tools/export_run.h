@@ -6,8 +6,8 @@
 
 #include <cstdint>
 #include <functional>
+#include <memory>
 #include <string>
-#include <string_view>
 #include <vector>
 
 #include "failure.h"
@@ -17,12 +17,18 @@
 
 namespace tool {
 
+// What a pass makes of a batch beside the counts: each that needs it derives its own.
+struct Gathered {
+  virtual ~Gathered() = default;
+};
+
 // What comes of one batch, and in sum of all.
 struct Part {
   Secret out;
   std::vector<std::string> messages;
   Tally tally;
   ExitCode exitCode = kSuccess;  // of the first problem
+  std::unique_ptr<Gathered> gathered;
 
   // Reports a problem with a value of an entry.
   void report(std::uint64_t line, const std::string& dn, ExitCode code, const std::string& text);
@@ -31,6 +37,7 @@ struct Part {
 struct ExportOptions {
   std::string in = "-";                 // "-" for standard input
   std::vector<std::string> attributes;  // none: userPassword
+  std::vector<std::string> others;      // attributes that hold no passwords and are stopped at all the same
   unsigned threads = 0;                 // 0: one a processor
   bool resultsOnStdout = false;         // the progress line stays away from them
 };
@@ -39,9 +46,9 @@ struct ExportOptions {
 Input openExport(const ExportOptions& options);
 
 // work runs on many threads at once; deliver, and all reporting, on one at a time, in order. An exception of either
-// ends all and leaves runExport. Returns the sum of the parts, without their output and messages.
+// ends all and leaves runExport. Returns the sum of the parts, without their output, messages and what was gathered.
 Part runExport(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
-               const std::function<void(std::string_view out)>& deliver);
+               const std::function<void(const Part& part)>& deliver);
 
 }  // namespace tool
 

@@ -4,47 +4,18 @@
 
 #include <cstdio>
 
-#include "crypto_provider.h"
 #include "scheme.h"
+#include "sha256.h"
 #include "text.h"
 
 namespace tool {
 namespace {
 
-constexpr unsigned kDigestBytes = 32;
 constexpr unsigned kShownBytes = 8;
 
 struct Options {
   std::string file;
   bool json = false;
-};
-
-// A digest context of the provider.
-class Sha256 {
- public:
-  Sha256() {
-    if (initQelCrypto(&provider_) != LDAPPW_SUCCESS ||
-        initQelDigest(provider_, &context_, "SHA256", &digest_) != LDAPPW_SUCCESS) {
-      throw Failure(kInternal, "the crypto provider has no SHA256");
-    }
-  }
-  ~Sha256() { freeQelDigest(provider_, context_); }
-  Sha256(const Sha256&) = delete;
-  Sha256& operator=(const Sha256&) = delete;
-
-  void of(const SecBuffer& bytes, unsigned char (&out)[kDigestBytes]) {
-    unsigned length = 0;
-    if (pQEL_EVP_DigestInit(provider_, context_, digest_) != 1 ||
-        pQEL_EVP_DigestUpdate(provider_, context_, bytes.data, bytes.length) != 1 ||
-        pQEL_EVP_DigestFinal(provider_, context_, out, &length) != 1 || length != kDigestBytes) {
-      throw Failure(kInternal, "the crypto provider failed to make a digest");
-    }
-  }
-
- private:
-  void* provider_ = nullptr;
-  void* context_ = nullptr;
-  void* digest_ = nullptr;
 };
 
 // Calls work with the name, the bytes and the fingerprint of each key.
@@ -54,8 +25,7 @@ void forEachKey(const KeyRecord& record, Work work) {
   for (const Scheme& scheme : kSchemes) {
     if (!scheme.needsKey()) continue;
     const SecBuffer& key = record.get()->aesKeys[scheme.keyIndex];
-    unsigned char digest[kDigestBytes];
-    sha256.of(key, digest);
+    const Sha256::Digest digest = sha256.of({viewOf(key)});
     char shown[2 * kShownBytes + 1];
     for (unsigned i = 0; i < kShownBytes; ++i) snprintf(shown + 2 * i, 3, "%02x", static_cast<unsigned>(digest[i]));
     work(scheme.name, key.length, shown);

@@ -148,7 +148,7 @@ ExitCode auditExport(const LdifOptions& options) {
   Results results;
   const Part sum = runExport(
       input, source, [&](RecordWalker& walker, Part& part) { auditBatch(walker, options, keys, part); },
-      [&](std::string_view out) { results.write(out); });
+      [&](const Part& part) { results.write(part.out.view()); });
   (options.json ? writeObject : writeTable)(sum.tally, results);
   results.flush();
   return sum.exitCode;

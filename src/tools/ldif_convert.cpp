@@ -161,8 +161,8 @@ ExitCode convertExport(const LdifOptions& options) {
   Input input = openExport(options.source);
   std::optional<OutputFile> file;
   if (options.out != "-") file.emplace(options.out, modeFor(options.out), options.force);
-  const auto deliver = [&](std::string_view out) {
-    file ? file->write(out) : writeAll(STDOUT_FILENO, out, "standard output");
+  const auto deliver = [&](const Part& part) {
+    file ? file->write(part.out.view()) : writeAll(STDOUT_FILENO, part.out.view(), "standard output");
   };
   ExportOptions source = options.source;
   source.resultsOnStdout = !file;

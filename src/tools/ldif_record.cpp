@@ -38,8 +38,10 @@ bool parseValue(Secret& text, Secret& value) {
 
 }  // namespace
 
-AttributeSet::AttributeSet(std::vector<std::string> names) : names_(std::move(names)) {
+AttributeSet::AttributeSet(std::vector<std::string> names, const std::vector<std::string>& others)
+    : names_(std::move(names)) {
   if (names_.empty()) names_ = {"userPassword", "2.5.4.35"};
+  names_.insert(names_.end(), others.begin(), others.end());
 }
 
 bool AttributeSet::matches(std::string_view description) const noexcept {

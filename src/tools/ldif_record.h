@@ -18,7 +18,8 @@ namespace tool {
 class AttributeSet {
  public:
   // No names mean userPassword, which is also known as 2.5.4.35.
-  explicit AttributeSet(std::vector<std::string> names);
+  // others are covered as well.
+  explicit AttributeSet(std::vector<std::string> names, const std::vector<std::string>& others = {});
   bool matches(std::string_view description) const noexcept;
 
  private:
@@ -55,6 +56,7 @@ class RecordWalker {
   std::uint64_t lineNumber() const noexcept { return lineNumber_; }
   const std::string& dn() const noexcept { return dn_; }  // decoded; empty when the record has none
   std::uint64_t entries() const noexcept { return entries_; }
+  bool modifies() const noexcept { return modify_; }  // the record changes an entry and does not describe it
 
  private:
   void startRecord() noexcept;

@@ -22,6 +22,7 @@ constexpr Verb kVerbs[] = {
     {"reveal", "Turn reversible values back into clear passwords, one a line", setUpReveal},
     {"keys", "Make, restore, show and check key stash files", setUpKeys},
 #ifdef LDAPPW_WITH_LDIF
+    {"audit", "Report how well the passwords of directory exports are kept, and hold them to a policy", setUpAudit},
     {"ldif", "Convert or audit the password values of a directory export (LDIF)", setUpLdif},
     {"trial", "Put the clear passwords of an export through every scheme and compare", setUpTrial},
 #endif

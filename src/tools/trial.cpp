@@ -188,7 +188,7 @@ ExitCode trial(const Options& options) {
   Input input = openExport(options.source);
   const Part sum = runExport(
       input, options.source, [&](RecordWalker& walker, Part& part) { tryBatch(walker, keys, part); },
-      [](std::string_view) {});
+      [](const Part&) {});
   Results results;
   (options.json ? writeObject : writeTable)(sum.tally, results);
   results.flush();

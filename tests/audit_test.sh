@@ -1,0 +1,110 @@
+#!/bin/bash
+# SPDX-License-Identifier: Apache-2.0
+# The audit of exports: audit_test.sh LDAPPW. Counts are made by hand; no password and no part of a value is ever shown.
+. "$(dirname "$0")/command_frame.sh"
+digest() { printf '{%s}%s' "$1" "$(printf "$2" | openssl dgst "-$3" -binary | b64)"; }
+entry() { printf 'dn: uid=%s,ou=%s,dc=example,dc=org\nobjectClass: inetOrgPerson\ncn: Some One\n' "$1" "$2"; printf 'userPassword: %s\n' "${@:3}"; echo; }
+
+echo SaltOfTest-A >salt
+run 'keys create' 0 keys create --salt-file salt --config cfg --directory dir <<<aSeedForTheTest-A
+run 'other keys' 0 keys create --salt-file salt --config cfg2 --directory dir2 <<<aSeedForTheTest-B
+aes=$("$tool" format --scheme aes256 --keys dir <<<teatime99)
+{
+  printf 'dn: dc=example,dc=org\nobjectClass: domain\n\n'
+  entry anna People hunter2xyz
+  entry ben People "$(digest SHA sharedone sha1)"
+  entry cem People "$(digest sha sharedone sha1)" '{CRYPT}$6$salt$'"$(printf 'a%.0s' {1..86})"
+  entry dora People DORA
+  entry finn Ops "$("$tool" format --scheme ssha <<<letmein77)"
+  entry gus Ops "$aes"
+  entry guy 'OPS' "$aes"
+  entry hal Ops teatime99 teatime99
+  entry kim Ops "$("$tool" format --scheme qveil <<<teatime99)"
+  entry leo Ops "$("$tool" format --scheme md5 <<<leo)"
+  printf 'dn: uid=eve,ou=Ops,dc=example,dc=org\nobjectClass: account\n\n'
+  printf 'dn: uid=ida,ou=Ops,dc=example,dc=org\nuserPassword:\n\n'
+  printf 'dn: uid=eve,ou=Ops,dc=example,dc=org\nchangetype: modify\nreplace: uid\nuid: eve\n-\n\n'
+  printf 'dn:: %s\nuserPassword:: *\nuserPassword: {sha}broken\nuserPassword: {X-teatime}99\nuserPassword:< file:///x\n\n' \
+    "$(printf 'uid=<script>\33[1m\377@style@"&\342\200\256,ou=</td>,dc=example,dc=org' | b64)"
+} >export
+printf 'letmein77\r\nhunter2xyz\n\n' >bad
+secrets="hunter2xyz sharedone DORA letmein77 teatime99 ${aes:8:20} $(digest SHA sharedone sha1 | cut -c 6-20) X-teatime hunter2"
+unshown() { for text in $secrets; do ! grep -qaF -- "$text" out err page* 2>/dev/null || fail "$1: '$text' was shown"; done; }
+named() { json "$1" "{f['name'].replace('-', '_'): f['entries'] for f in d[0]['findings']} == dict($always, $2)"; unshown "$1"; }
+always='clear=4, empty=1, reversible=3, unsalted=4, malformed=1, salted_fast=1, no_password=1, unknown=1, broken=1, reused=6'
+
+# What is read alone is compared alone: equal AES values without keys, their passwords with them, hashes on request.
+run 'without keys' 3 audit export --json --known-bad bad
+named 'without keys' 'name_as_password=1, known_bad=1'
+json 'groups' "[f for f in d[0]['findings'] if f['name'] == 'reused'][0]['largestGroups'] == [{'entries': 2, 'dns':
+  ['uid=%s,ou=%s,dc=example,dc=org' % name for name in pair]} for pair in ((('ben', 'People'), ('cem', 'People')),
+  (('gus', 'Ops'), ('guy', 'OPS')), (('hal', 'Ops'), ('kim', 'Ops')))]"
+json 'counts' "(d[0]['entries'], d[0]['accounts'], d[0]['values'], d[0]['urls'], d[0]['policyMet']) == (15, 13, 17, 1, None) and
+  {s['name']: s['values'] for s in d[0]['strengths']} == {'clear': 5, 'reversible': 3, 'unsalted': 4, 'salted-fast': 1,
+  'strong': 1, 'unknown': 1} and {'name': 'sha512-crypt', 'strength': 'strong', 'values': 1} in d[0]['schemes']"
+json 'subtrees' "[(s['dn'], s['accounts'], s['values']) for s in d[0]['subtrees']] == [
+  ('ou=ops,dc=example,dc=org', 8, 8), ('ou=people,dc=example,dc=org', 4, 5), ('ou=</td>,dc=example,dc=org', 1, 2)]"
+run 'with keys' 3 audit --json --keys dir - <export
+named 'with keys' 'name_as_password=1'
+json 'one group of four' "d[0]['findings'][3]['largestGroups'][0]['entries'] == 4"
+run 'other keys' 3 audit --json --keys dir2 export
+named 'other keys' 'name_as_password=1, unopened=2'
+run hashes 3 audit --json --known-bad bad --check-hashes export
+named hashes 'name_as_password=2, known_bad=2'
+run 'an entry in two exports is one' 3 audit export export --json --threads 1
+json 'an entry in two exports is one' "d[0]['entries'] == 30 and d[0]['findings'][3]['entries'] == 6"
+run 'several batches' 0 audit "$root/samples/directory.ldif" --json --list 2
+json 'several batches' "[(f['entries'], len(f['dns'])) for f in d[0]['findings']] == [(320, 2), (16, 2), (24, 2)]"
+entry max People "$("$tool" format --scheme ssha <<<letmein77)" >fine
+
+# The text, and that nothing of the export acts on a terminal or a page.
+run text 1 audit export --fail-on clear,des-crypt --fail-on REUSED --list 1 --html page
+for line in 'scheme +strength +values' 'sha +unsalted +3' 'entries: 15' 'strength reversible: 3' '  uid=anna,ou=People,dc=example,dc=org' \
+  'subtree ou=people,dc=example,dc=org: 4 accounts, 5 values, 2 clear, 2 unsalted, 1 strong' '  and 3 more' 'finding: reversible: 3' \
+  'finding: reused: 6 \(against the policy\)' '  one password in 2 entries:' '  uid=<script>.x1B\[1m.xFF@style@.*' 'policy: not met'; do
+  grep -qxE -- "$line" out || fail "text: no '$line' in $(cat out)"
+done
+said text '^ldappw: policy: clear: 4'
+unshown text
+LC_ALL=C grep -qa '[[:cntrl:]]' <(tr -d '\n' <out) && fail 'text: control characters'
+same 'mode of a page' 600 "$(mode page)"
+grep -qF 'uid=&lt;script&gt;\x1B[1m\xFF@style@&quot;&amp;\u202E,ou=&lt;/td&gt;,dc=example' page || fail 'page: the hostile DN is not there as text'
+python3 - page <<'PAGE' || fail 'page: markup'
+import base64, hashlib, html.parser, sys
+text, stack, seen = open(sys.argv[1], encoding="utf-8").read(), [], set()
+class Page(html.parser.HTMLParser):
+    def handle_starttag(self, tag, attributes):
+        assert not {name for name, _ in attributes if name.startswith("on") or name in ("href", "src", "style", "action")}
+        seen.add(tag)
+        if tag not in ("meta",): stack.append(tag)
+    def handle_endtag(self, tag):
+        assert stack.pop() == tag, tag
+Page().feed(text)
+assert not stack and not seen & {"script", "link", "img", "iframe", "object", "form", "base"} and {"svg", "details"} < seen
+style = text.split("<style>")[1].split("</style>")[0]
+digest = base64.b64encode(hashlib.sha256(style.encode()).digest()).decode()
+assert "content=\"default-src 'none'; style-src 'sha256-%s'; base-uri 'none'; form-action 'none'\"" % digest in text
+assert not any(c < " " and c != "\n" for c in text)
+PAGE
+
+# name | exit code | pattern | arguments: policies, and command lines that are refused.
+rows <<'ROWS'
+met|0|.*policy: met|audit fine --fail-on clear,reversible --accept ssha,{CRYPT}
+a scheme that is not accepted|1|.*finding: not-accepted: 1 .against.*|audit fine --accept {CRYPT},argon2id
+known bad, not tried|0|.*policy: met|audit fine --fail-on known-bad --known-bad bad
+known bad, tried|1|.*policy: not met|audit fine --fail-on known-bad --known-bad bad --check-hashes
+page in the place of the text|0|<!DOCTYPE html>.*100 %.*</html>|audit fine --html - --list 0
+no such finding|2||audit --fail-on claer fine
+no such scheme|2||audit --accept ssha,{NONE} fine
+an empty item|2||audit --accept ssha, fine
+no export|2||audit --json
+standard input twice|2||audit - --known-bad -
+two results on standard output|2||audit fine --json --html -
+a page that exists|2||audit fine --html page
+missing list|5||audit fine --known-bad none
+empty list|3||audit fine --known-bad /dev/null
+missing export|5||audit fine none
+ROWS
+run 'a page that is replaced' 0 audit fine --html page --force
+grep -q '<h3>clear' page && fail 'a page that is replaced: it is the old one'
+finish
