@@ -34,7 +34,8 @@ LAYERS = (
      ("sha", "salted_hash", "unsalted_hash", "crypt", "crypto", "utils_masked", "aes")),
     ("provider contexts", ("qel_utils",)),
     ("loader wrappers", ("utils_loader",)),
-    ("helpers", ("utils_base64", "getpw", "locks", "trace_scope", "bits", "cancellation", "owners", "text_target", "wipe")),
+    ("helpers", ("utils_base64", "getpw", "locks", "trace_scope", "bits", "cancellation", "owners", "processor",
+                 "text_target", "vector_kernel", "wipe")),
 )
 
 

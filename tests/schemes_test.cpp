@@ -7,6 +7,7 @@
 #include "failures.h"
 #include "oracle.h"
 #include "password_schemes.h"
+#include "sha.h"
 #include "system_crypt.h"
 
 using namespace std::string_literals;
@@ -102,6 +103,19 @@ TEST(CheckFormat, FollowsTheUnevenLengthsOfTheTags) {
     EXPECT_EQ(trace.messages(), Lines(lines, "CheckFormat:UNKNOWN pwd encoding,assume unencrypted\n"));
   }
   EXPECT_EQ(check_format(nullptr, 20), 1);
+}
+
+TEST(Sha, AgreesWithOpensslAtEveryLengthInBothWays) {
+  std::mt19937 random(4);
+  for (size_t n = 0; n <= 300; ++n) {
+    const std::string data = randomBytes(random, n);
+    Guarded in(data);
+    Guarded out(std::string(sizeof(sha_digest), '!'));
+    for (const auto digest : {ldappw::digestPlainly, ldappw::digestBytes}) {
+      digest(bytesOf(in.data()), n, reinterpret_cast<sha_digest*>(out.data()));
+      EXPECT_EQ(std::string(out.data(), sizeof(sha_digest)), opensslDigest("SHA1", data)) << n;
+    }
+  }
 }
 
 TEST(HotPaths, AllocateNothing) {  // nor does _crypt_r, as its suite shows
@@ -281,6 +295,8 @@ TEST(VerifyPassword, TreatsTheOddPairsAsPromised) {
   } rows[] = {
       {"a tag in other letters", "secret", "{sSha}" + salted8.substr(6), 0, 0, keys()},
       {"a payload in other letters", "abc", "{SHA}QZk+NkcGgWq6PiVxeFDCbJzQ2J0=", 1, 0, keys()},
+      {"bits behind the digest", "abc", "{SHA}qZk+NkcGgWq6PiVxeFDCbJzQ2J1=", -1, 0, keys()},
+      {"a pad for a zero byte, made up for at the end", "12", "{SHA}e1I=m2T9CipJ5tipOXUwd3krBVQA", 1, 0, keys()},
       {"alike in the first 46", text46 + "a", text46 + "bcd", 0, 0, keys()},
       {"different in the 46th", text46.substr(0, 45) + "a", text46.substr(0, 45) + "b", -1, 0, keys()},
       {"the first difference counts, unsigned", "\x80y", "\x7fz", 1, 0, keys()},
@@ -374,7 +390,8 @@ const std::string kSecret = "Zq7#kW2!";  // as much as the shortest scheme looks
 // Single operations on texts that begin with the secret; each releases what it is given.
 std::vector<Body> secretUses() {
   std::vector<Body> uses;
-  for (const std::string& clear : {kSecret, kSecret + letters(300), kSecret + '\0' + letters(300)}) {
+  for (const std::string& clear :
+       {kSecret, kSecret + letters(30), kSecret + letters(300), kSecret + '\0' + letters(300)}) {
     for (const auto& [code, tag] : kSchemes) {
       if (code == 1) continue;  // its value is the secret
       const std::string value = format(code, clear);
@@ -412,7 +429,13 @@ TEST(Secrets, AreGoneFromTheStack) {
   EXPECT_TRUE(leftOnStack(leave, kSecret)) << "the search sees nothing";
   const std::vector<Body> uses = secretUses();
   for (const Body& use : uses) use();  // resolves the symbols, which saves registers on the stack
-  for (size_t i = 0; i < uses.size(); ++i) EXPECT_FALSE(leftOnStack(uses[i], kSecret)) << i;
+  Lines forms{kSecret};
+  // SHA works on words with their bytes turned round, its kernel on four of them from the last to the first.
+  forms.emplace_back(kSecret.rbegin(), kSecret.rend());
+  forms.push_back(forms[1].substr(4) + forms[1].substr(0, 4));
+  for (const std::string& form : forms) {
+    for (size_t i = 0; i < uses.size(); ++i) EXPECT_FALSE(leftOnStack(uses[i], form)) << i << " " << form;
+  }
 }
 
 TEST(Threads, FormatVerifyAndReverseAllSchemesAtOnce) {

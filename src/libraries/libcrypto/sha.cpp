@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// SHA-1 (FIPS 180-1) in one call, without the crypto provider. All rounds are written out, for speed.
-#include "password_schemes.h"
+// SHA-1 (FIPS 180-1) in one call, without the crypto provider: the way for any processor, in which all rounds are written
+// out, for speed; and the choice between it and the faster one.
+#include "sha.h"
 
 #include <cstdint>
 #include <cstring>
@@ -73,16 +74,8 @@ void compress(uint32_t (&chain)[5], Work& work) noexcept {
 }
 
 }  // namespace
-}  // namespace ldappw
 
-using namespace ldappw;
-
-extern "C" {
-
-// Documented in password_schemes.h.
-
-void SHA(char* data, unsigned long length, sha_digest* digest) noexcept {
-  if (digest == nullptr || (data == nullptr && length != 0)) return;
+void digestPlainly(const unsigned char* data, size_t length, sha_digest* digest) noexcept {
   uint32_t chain[5] = {0x67452301U, 0xefcdab89U, 0x98badcfeU, 0x10325476U, 0xc3d2e1f0U};
   const uint64_t bits = uint64_t{length} * 8;
   Work work;
@@ -102,6 +95,19 @@ void SHA(char* data, unsigned long length, sha_digest* digest) noexcept {
   compress(chain, work);
   auto* out = reinterpret_cast<unsigned char*>(digest);
   for (unsigned i = 0; i < 5; ++i) storeBigEndian(out + 4 * i, chain[i]);
+}
+
+}  // namespace ldappw
+
+using namespace ldappw;
+
+extern "C" {
+
+// Documented in password_schemes.h.
+
+void SHA(char* data, unsigned long length, sha_digest* digest) noexcept {
+  if (digest == nullptr || (data == nullptr && length != 0)) return;
+  digestBytes(reinterpret_cast<const unsigned char*>(data), length, digest);
 }
 
 }  // extern "C"

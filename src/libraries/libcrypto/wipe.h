@@ -8,9 +8,10 @@
 
 namespace ldappw {
 
-// Clears a secret; the optimiser may not remove it.
+// Clears a secret; the optimiser may not remove it. As explicit_bzero does, but here the compiler sees the size.
 inline void wipe(void* data, size_t bytes) noexcept {
-  if (bytes != 0) explicit_bzero(data, bytes);
+  if (bytes != 0) std::memset(data, 0, bytes);
+  __asm__ volatile("" : : "r"(data) : "memory");
 }
 
 // The sign of the first differing pair of bytes (unsigned), or 0. The last byte is looked at first and each earlier
