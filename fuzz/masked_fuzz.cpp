@@ -105,9 +105,9 @@ std::string closed(Opened opened) {
                              std::string(reinterpret_cast<char*>(opened.packet), kPacket) +
                              opened.area.substr(std::min(kBefore, opened.area.size()));
   const Encoding& encoding = encodings[opened.alphabet];
-  std::string text(ldappw::encodedRoom(record.size()), '\0');
-  text.resize(ldappw::encodeBytes(reinterpret_cast<const unsigned char*>(record.data()), record.size(),
-                                  encoding.alphabet, text.data()));
+  std::string text(ldappw::encodedLength(record.size()), '\0');
+  ldappw::encodeBytes(reinterpret_cast<const unsigned char*>(record.data()), record.size(), encoding.alphabet,
+                      text.data());
   return ">1" + std::string(encoding.identifier) + text + "<";
 }
 

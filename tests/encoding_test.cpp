@@ -7,8 +7,10 @@
 #include "crypto_des.h"
 #include "oracle.h"
 #include "support.h"
+#include "utils_base64.h"
 #include "utils_masked_tables.h"
 
+using namespace std::string_literals;
 using namespace test;
 
 namespace {
@@ -66,6 +68,40 @@ TEST(Base64, DecodesOddTextsByTheirPlaces) {
     EXPECT_EQ(length, row.length);
     EXPECT_EQ(toHex(blob, std::strlen(row.buffer) / 2), row.buffer);  // behind the length too
     free(blob);
+  }
+}
+
+std::string encoded(decltype(ldappw::encodeBytes) encode, const std::string& data, const char* alphabet) {
+  Guarded guarded(data);
+  std::string out(ldappw::encodedLength(data.size()) + 1, '!');
+  encode(bytesOf(guarded.data()), data.size(), alphabet, out.data());
+  return out;
+}
+
+std::string decoded(decltype(ldappw::decodeText) decode, const std::string& text, const char* alphabet) {
+  Guarded guarded(text);
+  std::string out(ldappw::decodedRoom(text.size()), '!');
+  const auto [bytes, isClean] = decode(guarded.data(), text.size(), alphabet, bytesOf(out));
+  return toHex(out.data(), out.size()) + (isClean ? " clean " : " odd ") + std::to_string(bytes);
+}
+
+TEST(Base64, IsThatOfThePlainWayWhateverTextAndAlphabet) {
+  const std::string rest = kStandard.substr(1);
+  const std::string others[] = {kStandard,     rest + '\x80',      rest + '=',
+                                '\x1f' + rest, rest + "\x7f more", std::string(64, 'a')};
+  std::vector<const char*> alphabets{pBase64, ldappw::masking::encodings[5].alphabet};
+  for (const std::string& other : others) alphabets.push_back(other.c_str());
+  const std::string odd = "=-_ \n\x1f\x7f\x80\xff"s + '\0';
+  std::mt19937 random(2);
+  for (size_t round = 0; round < 9000; ++round) {
+    const char* alphabet = alphabets[round % alphabets.size()];
+    const std::string data = randomBytes(random, random() % 90);
+    std::string text = encoded(ldappw::encodePlainly, data, alphabet);
+    EXPECT_EQ(encoded(ldappw::encodeBytes, data, alphabet), text);
+    text.resize(text.size() - 1 - (round % 3 == 0 && !data.empty() ? random() % 4 : 0));
+    for (size_t faults = random() % 3; faults > 0 && !text.empty(); --faults)
+      text[random() % text.size()] = odd[random() % odd.size()];
+    EXPECT_EQ(decoded(ldappw::decodeText, text, alphabet), decoded(ldappw::decodePlainly, text, alphabet)) << text;
   }
 }
 

@@ -38,7 +38,8 @@ inline bool writeBase64(TextTarget& target, const unsigned char* data, size_t by
     return text != nullptr;
   }
   if (!isWholeAlphabet(pBase64)) return false;
-  target.length = encodeBytes(data, bytes, pBase64, target.payload);
+  encodeBytes(data, bytes, pBase64, target.payload);
+  target.length = encodedLength(bytes);
   return true;
 }
 
