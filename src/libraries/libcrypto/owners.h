@@ -65,32 +65,39 @@ class SecretArray {
   unsigned char bytes_[kBytes];
 };
 
-// A zeroed buffer whose size is known when it is made; up to kInline bytes need no allocation. Who fills it may fill
-// less than it claims, so that what it holds must not be old memory. Secrets are wiped when it goes.
+// A buffer whose size is known when it is made; up to kInline bytes need no allocation. One for secrets is zeroed, since
+// who fills it may fill less than it claims, and wiped when it goes; one for public data is for those who write all of
+// it.
 template <size_t kInline, bool kSecret>
 class Buffer {
  public:
-  explicit Buffer(size_t bytes) noexcept : bytes_(bytes) {
-    if (bytes_ <= kInline) {
-      std::memset(inline_, 0, bytes_);
-    } else {
-      heap_.reset(zeroedBytes<unsigned char>(bytes_));
-    }
+  explicit Buffer(size_t bytes) noexcept : bytes_(bytes), data_(bytes <= kInline ? inline_ : allocated(bytes)) {
+    if (kSecret && isInline()) std::memset(inline_, 0, inlineBytes());
   }
   ~Buffer() {
-    if (kSecret && *this) wipe(get(), bytes_);
+    if (!isInline()) {
+      wipeAndFree(data_, kSecret ? bytes_ : 0);
+    } else if (kSecret) {
+      wipe(inline_, inlineBytes());
+    }
   }
   Buffer(const Buffer&) = delete;
   Buffer& operator=(const Buffer&) = delete;
 
-  explicit operator bool() const noexcept { return bytes_ <= kInline || heap_ != nullptr; }
-  unsigned char* get() noexcept { return bytes_ <= kInline ? inline_ : heap_.get(); }
-  char* text() noexcept { return reinterpret_cast<char*>(get()); }
+  explicit operator bool() const noexcept { return data_ != nullptr; }
+  unsigned char* get() noexcept { return data_; }
+  char* text() noexcept { return reinterpret_cast<char*>(data_); }
   size_t size() const noexcept { return bytes_; }
 
  private:
+  static unsigned char* allocated(size_t bytes) noexcept {
+    return kSecret ? zeroedBytes<unsigned char>(bytes) : static_cast<unsigned char*>(std::malloc(bytes));
+  }
+  bool isInline() const noexcept { return data_ == inline_; }
+  size_t inlineBytes() const noexcept { return kInline <= 128 ? kInline : bytes_; }  // a known size needs no call
+
   size_t bytes_;
-  PlainOwner<unsigned char> heap_;
+  unsigned char* data_;
   unsigned char inline_[kInline];
 };
 

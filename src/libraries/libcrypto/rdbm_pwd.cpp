@@ -2,6 +2,8 @@
 // Telling which scheme a value uses, and how long values are.
 #include "rdbm_pwd.h"
 
+#include <iterator>
+
 namespace ldappw {
 namespace {
 
@@ -18,8 +20,8 @@ const Scheme& detected(TracedCall& call, const char* value, size_t length) noexc
   if (length <= kNoTag || value == nullptr) return kSchemes[kClearRow];
   if (isWrapped(value, length)) return kSchemes[kMaskedRow];
   if (value[0] != '{') return kSchemes[kClearRow];
-  for (const Scheme& scheme : kSchemes) {
-    if (scheme.tagBytes != 0 && length > scheme.longerThan && hasTag(value, scheme)) return scheme;
+  for (const Scheme* scheme = kSchemes + kClearRow + 1; scheme != std::end(kSchemes); ++scheme) {
+    if (length > scheme->longerThan && hasTag(value, *scheme)) return *scheme;
   }
   call.line(LineClass::debug, "CheckFormat:UNKNOWN pwd encoding,assume unencrypted\n");
   return kSchemes[kClearRow];

@@ -7,6 +7,7 @@
 
 #include "crypt_state.h"
 #include "locks.h"
+#include "sha.h"
 #include "text_target.h"
 
 namespace ldappw {
@@ -19,7 +20,6 @@ constexpr size_t kCryptKeyBytes = 8;  // that count
 constexpr size_t kCryptCharacters = 13;
 constexpr size_t kMaskedClear = 46;  // a longer password is cut silently, as in every stored value (EachScheme suite)
 constexpr size_t kMaskedCharacters = 164;
-constexpr size_t kFormattedSha = 33;
 
 // The clear text up to a first NUL, behind which nothing is read, since it may be the end of what there is.
 size_t bytesBeforeNul(const FormatRequest& request) noexcept {
@@ -40,17 +40,19 @@ size_t makeClear(TracedCall&, const Scheme&, const FormatRequest& request, char*
   return request.clearBytes;
 }
 
-// The digest of the clear text, in which every byte after a first NUL counts as NUL. False when memory runs out.
-bool digestClear(const FormatRequest& request, sha_digest& digest) noexcept {
-  const size_t before = bytesBeforeNul(request);
-  if (before == request.clearBytes) {
-    SHA(const_cast<char*>(request.clear), request.clearBytes, &digest);
-    return true;
-  }
+// Digests a clear text in which every byte after a first NUL counts as NUL. False when memory runs out.
+bool digestBeforeNul(const FormatRequest& request, size_t before, sha_digest& digest) noexcept {
   SecretBytes<256> copy(request.clearBytes);
   if (!copy) return false;
   std::memcpy(copy.get(), request.clear, before);
-  SHA(copy.text(), request.clearBytes, &digest);
+  digestBytes(copy.get(), request.clearBytes, &digest);
+  return true;
+}
+
+bool digestClear(const FormatRequest& request, sha_digest& digest) noexcept {
+  const size_t before = bytesBeforeNul(request);
+  if (before != request.clearBytes) return digestBeforeNul(request, before, digest);
+  digestBytes(reinterpret_cast<const unsigned char*>(request.clear), request.clearBytes, &digest);
   return true;
 }
 
@@ -63,7 +65,7 @@ size_t makeSha(TracedCall& call, const Scheme& scheme, const FormatRequest& requ
   sha_digest digest{};
   auto* digestBytes = reinterpret_cast<unsigned char*>(&digest);
   const bool isTagged = !request.isClear && bytesBeforeNul(request) >= scheme.tagBytes && hasTag(request.clear, scheme);
-  if (isTagged && request.clearBytes == kFormattedSha) {
+  if (isTagged && request.clearBytes == kShaValue) {
     call.line(LineClass::debug,
               "format_password: This pwd update is in SHA format and is from an ORVEX supplier. Do nothing.\n");
     return 0;
@@ -141,32 +143,34 @@ static_assert(fitTheSchemes(), "a maker for each scheme that can be made");
 
 // ---- Formatting ----
 
-// {AES256} without keys becomes {qVEIL}; the shorter keys have no such way out and make nothing.
-// FormatPassword.RefusesAndLeavesAtMostTheTag pins it.
-const Scheme* schemeToMake(int code, const AesKeyData* keyData) noexcept {
-  return findScheme(code == FORMAT_AES256 && keyData == nullptr ? int{FORMAT_QVEIL} : code);
+int unknown(TracedCall& call, int code) noexcept {
+  call.line(LineClass::debug, "Error - format_password: Format-UNKNOWN pwd encoding %d\n", code);
+  return 0;
 }
 
-int formattedValue(TracedCall& call, int code, const FormatRequest& request, char* out, size_t outSize) noexcept {
-  const Scheme* scheme = schemeToMake(code, request.keyData);
-  if (scheme == nullptr || scheme->fixedLength == kNeverMade) {
-    call.line(LineClass::debug, "Error - format_password: Format-UNKNOWN pwd encoding %d\n", code);
-    return 0;
-  }
-  const int length = valueLength(*scheme, static_cast<int>(request.clearBytes));
+int formattedValue(TracedCall& call, const Scheme& asked, const FormatRequest& request, char* out,
+                   size_t outSize) noexcept {
+  const Scheme& scheme = schemeToMake(asked, request.keyData);
+  if (scheme.fixedLength == kNeverMade) return unknown(call, scheme.code);
+  const int length = valueLength(scheme, static_cast<int>(request.clearBytes));
   if (length < 0 || outSize < static_cast<size_t>(length)) return 0;
-  if (scheme->code == FORMAT_CRYPT && request.salt == nullptr) return 0;
-  std::memcpy(out, scheme->tag, scheme->tagBytes);
-  if (outSize - scheme->tagBytes < scheme->payloadRoom) return 0;
-  const size_t payload = kMakers[scheme - kSchemes].make(call, *scheme, request, out + scheme->tagBytes);
-  return payload == 0 ? 0 : static_cast<int>(scheme->tagBytes + payload);
+  if (scheme.code == FORMAT_CRYPT && request.salt == nullptr) return 0;
+  std::memcpy(out, scheme.tag, scheme.tagBytes);
+  if (outSize - scheme.tagBytes < scheme.payloadRoom) return 0;
+  const size_t payload = kMakers[&scheme - kSchemes].make(call, scheme, request, out + scheme.tagBytes);
+  return payload == 0 ? 0 : static_cast<int>(scheme.tagBytes + payload);
 }
 
 }  // namespace
 
-int formatValue(int code, const FormatRequest& request, char* out, size_t outSize) noexcept {
+bool digestValue(const FormatRequest& request, sha_digest& digest) noexcept {
   TracedCall call{kFormatPassword};
-  return call.leave(formattedValue(call, code, request, out, outSize));
+  return call.leave(isWholeAlphabet(pBase64) && digestClear(request, digest) ? kShaValue : 0) != 0;
+}
+
+int formatValue(const Scheme& scheme, const FormatRequest& request, char* out, size_t outSize) noexcept {
+  TracedCall call{kFormatPassword};
+  return call.leave(formattedValue(call, scheme, request, out, outSize));
 }
 
 }  // namespace ldappw
@@ -184,8 +188,10 @@ int format_password(int scheme, char* salt, AesKeyData* keyData, const char* cle
   const auto room = static_cast<size_t>(outSize);
   std::memset(out, 0, room);  // also for what is refused
   if (clear == nullptr || clearLength < 0) return call.leave(0);
+  const Scheme* row = findScheme(scheme);
+  if (row == nullptr) return call.leave(unknown(call, scheme));
   const FormatRequest request{clear, static_cast<size_t>(clearLength), salt, keyData, false};
-  return call.leave(formattedValue(call, scheme, request, out, room));
+  return call.leave(formattedValue(call, *row, request, out, room));
 }
 
 }  // extern "C"

@@ -4,7 +4,6 @@
 
 #include <climits>
 #include <cstdint>
-#include <cstring>
 
 namespace ldappw {
 
@@ -20,12 +19,6 @@ int paddedLength(int clearLength, size_t tagBytes) noexcept {
 
 constexpr int folded(char c) {
   return c >= 'A' && c <= 'Z' ? c - 'A' + 'a' : static_cast<unsigned char>(c);
-}
-
-uint32_t wordAt(const char* text) noexcept {
-  uint32_t word = 0;
-  std::memcpy(&word, text, sizeof word);
-  return word;
 }
 
 }  // namespace
@@ -48,15 +41,6 @@ int compareTag(const char* left, const char* right, size_t bytes) noexcept {
     if (const int difference = folded(left[i]) - folded(right[i]); difference != 0) return difference;
   }
   return 0;
-}
-
-bool hasTag(const char* value, const Scheme& scheme) noexcept {
-  // Tags have 5 to 8 bytes, which two words that overlap cover. The cases of a letter differ in one bit.
-  const size_t last = scheme.tagBytes - sizeof(uint32_t);
-  const uint32_t differences =
-      (wordAt(value) ^ wordAt(scheme.tag)) | (wordAt(value + last) ^ wordAt(scheme.tag + last));
-  if (differences == 0) return true;  // the usual spelling
-  return (differences & ~0x20202020U) == 0 && compareTag(value, scheme.tag, scheme.tagBytes) == 0;
 }
 
 }  // namespace ldappw

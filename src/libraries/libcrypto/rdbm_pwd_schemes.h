@@ -4,6 +4,8 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
+#include <cstring>
 
 #include "password_schemes.h"
 #include "trace_scope.h"
@@ -45,7 +47,7 @@ inline constexpr Scheme kSchemes[] = {
 // clang-format on
 
 // The rows that need no search.
-constexpr size_t kClearRow = 0;
+constexpr size_t kClearRow = 0;  // the one without a tag
 constexpr size_t kMaskedRow = 5;
 static_assert(kSchemes[kClearRow].code == FORMAT_NONE && kSchemes[kMaskedRow].code == FORMAT_QVEIL);
 
@@ -60,14 +62,28 @@ int valueLength(const Scheme& scheme, int clearLength) noexcept;
 int compareTag(const char* left, const char* right, size_t bytes) noexcept;
 
 // Whether a value of at least as many bytes begins with the scheme's tag, in any case.
-bool hasTag(const char* value, const Scheme& scheme) noexcept;
+inline bool hasTag(const char* value, const Scheme& scheme) noexcept {
+  // Tags have 5 to 8 bytes, which two words that overlap cover. The cases of a letter differ in one bit.
+  const auto differences = [&](size_t at) {
+    uint32_t words[2];
+    std::memcpy(&words[0], value + at, sizeof words[0]);
+    std::memcpy(&words[1], scheme.tag + at, sizeof words[1]);
+    return words[0] ^ words[1];
+  };
+  constexpr uint32_t kCaseBits = 0x20202020;
+  const uint32_t first = differences(0);
+  if ((first & ~kCaseBits) != 0) return false;
+  const uint32_t last = differences(scheme.tagBytes - sizeof(uint32_t));
+  if ((first | last) == 0) return true;  // the usual spelling
+  return (last & ~kCaseBits) == 0 && compareTag(value, scheme.tag, scheme.tagBytes) == 0;
+}
 
 // The functions of the password module in the order of their trace identifiers. They write no lines about entering and
 // leaving.
 enum PasswordFunction : unsigned { kCheckFormatId = 1, kFormatPasswordId, kVerifyPasswordId, kUnformatPasswordId };
 
 constexpr TraceInfo passwordOperation(const char* name, PasswordFunction function) {
-  return {name, {passwordId(function), kOperationLevel, kOperationMask}, LineClass::debug, {}, Lines::none};
+  return {{passwordId(function), kOperationLevel, kOperationMask}, name, LineClass::debug, {}, Lines::none};
 }
 
 }  // namespace ldappw

@@ -18,14 +18,14 @@ struct Line {
 }  // namespace
 
 int TracedCall::failShowing(int rc, const char* what, int shown) noexcept {
-  line(info_.failures, "Error - %s: %s rc = %d\n", info_.name, what, shown);
+  line(info().failures, "Error - %s: %s rc = %d\n", info().name, what, shown);
   return leave(rc);
 }
 
 int TracedCall::failText(int rc, const char* format, ...) noexcept {
   va_list values;
   va_start(values, format);
-  write(info_.failures, format, values);
+  write(info().failures, format, values);
   va_end(values);
   return leave(rc);
 }
@@ -39,7 +39,7 @@ void TracedCall::line(LineClass lineClass, const char* format, ...) noexcept {
 
 void TracedCall::write(LineClass lineClass, const char* format, va_list values) noexcept {
   if (!scope_.debugOn()) return;
-  ldtr_formater_local(&info_.scope, static_cast<int>(lineClass), "%s", Line(format, values).text);
+  ldtr_formater_local(&info(), static_cast<int>(lineClass), "%s", Line(format, values).text);
 }
 
 void TracedCall::writeEntering(const void* const* arguments, size_t count) noexcept {
@@ -47,17 +47,17 @@ void TracedCall::writeEntering(const void* const* arguments, size_t count) noexc
   size_t used = 0;
   for (size_t i = 0; i < count && used < sizeof list; ++i) {
     const int written = std::snprintf(list + used, sizeof list - used, "%s %s = %p", i == 0 ? "" : ",",
-                                      info_.arguments.names[i], arguments[i]);
+                                      info().arguments.names[i], arguments[i]);
     used += static_cast<size_t>(written);
   }
-  line(LineClass::debug, "%s: Entering.%s\n", info_.enteringAs != nullptr ? info_.enteringAs : info_.name, list);
+  line(LineClass::debug, "%s: Entering.%s\n", info().enteringAs != nullptr ? info().enteringAs : info().name, list);
 }
 
 void TracedCall::writeLeaving() noexcept {
-  if (info_.leavingLine != nullptr) {
-    ldtr_formater_local(&info_.scope, LDTR_DEBUG, info_.leavingLine, scope_.rc());
+  if (info().leavingLine != nullptr) {
+    ldtr_formater_local(&info(), LDTR_DEBUG, info().leavingLine, scope_.rc());
   } else {
-    line(LineClass::debug, "%s: Leaving. rc = %d\n", info_.name, scope_.rc());
+    line(LineClass::debug, "%s: Leaving. rc = %d\n", info().name, scope_.rc());
   }
 }
 

@@ -23,9 +23,8 @@ struct ArgumentNames {
   const char* names[kMost];
 };
 
-struct TraceInfo {
+struct TraceInfo : ldtr_scope {
   const char* name;
-  ldtr_scope scope;
   LineClass failures;  // the class of the module's failure lines
   ArgumentNames arguments{};
   Lines lines = Lines::usual;
@@ -66,10 +65,10 @@ constexpr LineClass failuresOf(Module module) {
 }
 
 constexpr TraceInfo operation(Module module, unsigned function, const char* name, ArgumentNames arguments = {}) {
-  return {name, {moduleId(module, function), kOperationLevel, kOperationMask}, failuresOf(module), arguments};
+  return {{moduleId(module, function), kOperationLevel, kOperationMask}, name, failuresOf(module), arguments};
 }
 constexpr TraceInfo accessor(Module module, unsigned function, const char* name, ArgumentNames arguments = {}) {
-  return {name, {moduleId(module, function), kSmallLevel, kSmallMask}, failuresOf(module), arguments};
+  return {{moduleId(module, function), kSmallLevel, kSmallMask}, name, failuresOf(module), arguments};
 }
 
 template <class... Pointers>
@@ -81,15 +80,15 @@ class TracedCall {
  public:
   // The pointers are those that the entering line shows; they are put together only when there is a line to write.
   template <class... Pointers>
-  explicit TracedCall(const TraceInfo& info, Pointers... arguments) noexcept : info_(info), scope_(info.scope) {
+  explicit TracedCall(const TraceInfo& info, Pointers... arguments) noexcept : scope_(info) {
     static_assert(sizeof...(arguments) <= ArgumentNames::kMost);
-    if (__builtin_expect(scope_.debugOn(), 0) && info_.lines == Lines::usual) {
+    if (__builtin_expect(scope_.isOn(), 0) && scope_.debugOn() && info.lines == Lines::usual) {
       const void* const list[] = {static_cast<const void*>(arguments)..., nullptr};
       writeEntering(list, sizeof...(arguments));
     }
   }
   ~TracedCall() {
-    if (__builtin_expect(scope_.debugOn(), 0) && info_.lines != Lines::none) writeLeaving();
+    if (__builtin_expect(scope_.isOn(), 0) && scope_.debugOn() && info().lines != Lines::none) writeLeaving();
   }
   TracedCall(const TracedCall&) = delete;
   TracedCall& operator=(const TracedCall&) = delete;
@@ -118,7 +117,8 @@ class TracedCall {
   [[gnu::cold]] void writeEntering(const void* const* arguments, size_t count) noexcept;
   [[gnu::cold]] void writeLeaving() noexcept;
 
-  const TraceInfo& info_;
+  const TraceInfo& info() const noexcept { return static_cast<const TraceInfo&>(scope_.scope()); }
+
   ldtr_function_local scope_;
 };
 

@@ -13,8 +13,8 @@
 namespace ldappw {
 namespace {
 
-constexpr TraceInfo kEncrypt{"unsaltedHashEncrypt",
-                             {moduleId(kUnsaltedHash, 1), kOperationLevel, kOperationMask},
+constexpr TraceInfo kEncrypt{{moduleId(kUnsaltedHash, 1), kOperationLevel, kOperationMask},
+                             "unsaltedHashEncrypt",
                              LineClass::debug,
                              {},
                              Lines::leavingOnly,

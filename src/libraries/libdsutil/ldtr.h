@@ -75,22 +75,25 @@ class ldtr_function_local {
  public:
   explicit ldtr_function_local(const ldtr_scope& scope) noexcept
       : scope_(scope), events_(ldtr_events() & (scope.mask | static_cast<unsigned>(LDTR_EVENT_DEBUG))) {
-    if ((events_ & scope_.mask) != 0) ldtr_write_entry(&scope_);
+    if (isOn() && recordsScope()) ldtr_write_entry(&scope_);
   }
   ~ldtr_function_local() {
-    if ((events_ & scope_.mask) != 0) ldtr_write_exit(&scope_, rc_);
+    if (isOn() && recordsScope()) ldtr_write_exit(&scope_, rc_);
   }
   ldtr_function_local(const ldtr_function_local&) = delete;
   ldtr_function_local& operator=(const ldtr_function_local&) = delete;
 
   void ldtr_exit_errcode(int rc) noexcept { rc_ = rc; }
   int rc() const noexcept { return rc_; }
+  bool isOn() const noexcept { return events_ != 0; }
   bool debugOn() const noexcept { return (events_ & static_cast<unsigned>(LDTR_EVENT_DEBUG)) != 0; }
   const ldtr_scope& scope() const noexcept { return scope_; }
 
  private:
+  bool recordsScope() const noexcept { return (events_ & ~static_cast<unsigned>(LDTR_EVENT_DEBUG)) != 0; }
+
   const ldtr_scope& scope_;
-  unsigned events_;
+  unsigned events_;  // those of trcEvents that concern this scope
   int rc_ = 0;
 };
 #endif
