@@ -1,17 +1,68 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the benchmarks share: fixed passwords and a key record.
+// What the benchmarks share: the registration of pieces of work, fixed passwords and a key record.
 #pragma once
+
+#include <benchmark/benchmark.h>
 
 #include <cstdint>
 #include <cstring>
+#include <functional>
 #include <string>
+#include <vector>
 
 #include "password_schemes.h"
 
 namespace bench {
 
+// A file adds its rows with one static object of this type; the function runs when the program has started.
+class Rows {
+ public:
+  explicit Rows(void (*add)()) { all().push_back(add); }
+  static std::vector<void (*)()>& all() {
+    static std::vector<void (*)()> functions;
+    return functions;
+  }
+};
+
+// What can be counted instead of timed.
+struct Counted {
+  std::string name;
+  std::function<void()> work;
+};
+inline std::vector<Counted>& countedWorks() {
+  static std::vector<Counted> works;
+  return works;
+}
+
+// A piece of work, named <row>/ours, or the same work by a peer, named <row>/<peer>. scripts/bench prints the ratios
+// of each row, and bars.csv states what they must not exceed.
+template <class Work>
+benchmark::internal::Benchmark* measure(const std::string& name, Work work) {
+  countedWorks().push_back({name, work});
+  return benchmark::RegisterBenchmark(name.c_str(), [work](benchmark::State& state) {
+    for (auto _ : state) work();
+  });
+}
+
+// The same on one, two and four threads, named <row>/threads.
+template <class Work>
+void measureThreads(const std::string& row, Work work) {
+  benchmark::RegisterBenchmark((row + "/threads").c_str(),
+                               [work](benchmark::State& state) {
+                                 for (auto _ : state) work();
+                                 state.SetItemsProcessed(state.iterations());
+                               })
+      ->Threads(1)
+      ->Threads(2)
+      ->Threads(4)
+      ->UseRealTime();
+}
+
 inline const std::string kPassword = "correct horse 42";
-inline const std::string kWrong = "correct horse 43";
+
+inline const unsigned char* bytesOf(const std::string& text) {
+  return reinterpret_cast<const unsigned char*>(text.data());
+}
 
 // A record with keys 0, 1, 2 ...; lives as long as the process.
 inline AesKeyData* keys() {

@@ -1,7 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Unix crypt and DES beside libxcrypt's, OpenSSL's and nettle's, and the masked encoding beside its parts done by the
-// fastest of them. Named <work>/ours and <work>/<peer>.
-#include <benchmark/benchmark.h>
+// fastest of them.
 #include <crypt.h>
 #include <nettle/des.h>
 #include <openssl/des.h>
@@ -16,13 +15,7 @@
 namespace {
 
 using bench::kPassword;
-
-template <class Work>
-void measure(const char* name, Work work) {
-  benchmark::RegisterBenchmark(name, [work](benchmark::State& state) {
-    for (auto _ : state) work();
-  });
-}
+using bench::measure;
 
 const char* const kText = kPassword.c_str();
 unsigned char key[8] = {0x13, 0x34, 0x57, 0x79, 0x9b, 0xbc, 0xdf, 0xf1};
@@ -152,6 +145,9 @@ void addMasking() {
     benchmark::DoNotOptimize(clear);
     std::free(clear);
   });
+  measure("qveil-verify/ours", [stored = bench::formatted(FORMAT_QVEIL, kPassword)] {
+    benchmark::DoNotOptimize(bench::verified(kPassword, stored));
+  });
   measure("unmask/parts", [] {
     static const std::string text(kRecordText, 'x');
     unsigned char record[kRecord + 3];
@@ -164,6 +160,10 @@ void addMasking() {
   });
 }
 
-[[maybe_unused]] const bool kAdded = (addCrypt(), addDes(), addMasking(), true);
+const bench::Rows kRows([] {
+  addCrypt();
+  addDes();
+  addMasking();
+});
 
 }  // namespace

@@ -1,7 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // The provider alone: a digest and a block of ciphertext as the library asks for them, each with a context of its own,
-// against EVP with an algorithm fetched beforehand; and the rounds of a key derivation, against EVP with one context.
-#include <benchmark/benchmark.h>
+// beside EVP with an algorithm fetched beforehand; and the rounds of a key derivation, beside EVP with one context.
 #include <openssl/evp.h>
 
 #include "bench_support.h"
@@ -9,11 +8,11 @@
 
 namespace {
 
-constexpr int kRounds = 50000;
+using bench::bytesOf;
+using bench::kPassword;
 
-const unsigned char* password() {
-  return reinterpret_cast<const unsigned char*>(bench::kPassword.data());
-}
+constexpr int kRounds = 1000;
+constexpr char kCipher[] = "AES-256-ECB";
 
 void* provider() {
   void* ctx = nullptr;
@@ -21,101 +20,79 @@ void* provider() {
   return ctx;
 }
 
-void digestOurs(benchmark::State& state, const char* name) {
-  void* ctx = provider();
-  unsigned char out[64];
-  for (auto _ : state) {
+void addDigest(const std::string& row, const char* name) {
+  bench::measure(row + "/ours", [ctx = provider(), name] {
+    unsigned char out[64];
     void* digestCtx = pQEL_EVP_MD_CTX_new(ctx);
     pQEL_EVP_MD_CTX_init(ctx, digestCtx);
     pQEL_EVP_DigestInit(ctx, digestCtx, pQEL_EVP_get_digestbyname(ctx, name));
-    pQEL_EVP_DigestUpdate(ctx, digestCtx, password(), 16);
-    benchmark::DoNotOptimize(pQEL_EVP_DigestFinal(ctx, digestCtx, out, nullptr));
+    pQEL_EVP_DigestUpdate(ctx, digestCtx, kPassword.data(), static_cast<unsigned>(kPassword.size()));
+    pQEL_EVP_DigestFinal(ctx, digestCtx, out, nullptr);
     pQEL_EVP_MD_CTX_cleanup(ctx, digestCtx);
     pQEL_EVP_MD_CTX_free(ctx, digestCtx);
-  }
-}
-
-void digestPeer(benchmark::State& state, const char* name) {
-  EVP_MD* digest = EVP_MD_fetch(nullptr, name, nullptr);
-  unsigned char out[64];
-  for (auto _ : state) {
+  });
+  bench::measure(row + "/openssl", [digest = EVP_MD_fetch(nullptr, name, nullptr)] {
+    unsigned char out[64];
     EVP_MD_CTX* digestCtx = EVP_MD_CTX_new();
     EVP_DigestInit_ex2(digestCtx, digest, nullptr);
-    EVP_DigestUpdate(digestCtx, password(), 16);
-    benchmark::DoNotOptimize(EVP_DigestFinal_ex(digestCtx, out, nullptr));
+    EVP_DigestUpdate(digestCtx, kPassword.data(), kPassword.size());
+    EVP_DigestFinal_ex(digestCtx, out, nullptr);
     EVP_MD_CTX_free(digestCtx);
-  }
-  EVP_MD_free(digest);
+  });
 }
-BENCHMARK_CAPTURE(digestOurs, sha1, "SHA1")->Name("provider-sha1/ours");
-BENCHMARK_CAPTURE(digestPeer, sha1, "SHA1")->Name("provider-sha1/peer");
-BENCHMARK_CAPTURE(digestOurs, md5, "md5")->Name("provider-md5/ours");
-BENCHMARK_CAPTURE(digestPeer, md5, "md5")->Name("provider-md5/peer");
 
-void cipherOurs(benchmark::State& state) {
-  void* ctx = provider();
-  unsigned char out[64];
-  int first = 0;
-  int last = 0;
-  for (auto _ : state) {
+void addCipher(const std::string& row) {
+  bench::measure(row + "/ours", [ctx = provider()] {
+    unsigned char out[64];
+    int first = 0;
+    int last = 0;
     void* cipherCtx = pQEL_EVP_CIPHER_CTX_new(ctx);
     pQEL_EVP_CIPHER_CTX_init(ctx, cipherCtx);
-    const void* cipher = pQEL_EVP_get_cipherbyname(ctx, "AES-256-ECB");
+    const void* cipher = pQEL_EVP_get_cipherbyname(ctx, kCipher);
     pQEL_EVP_EncryptInit(ctx, cipherCtx, cipher, bench::keys()->aesKeys[2].data, nullptr);
-    pQEL_EVP_EncryptUpdate(ctx, cipherCtx, out, &first, password(), 16);
-    benchmark::DoNotOptimize(pQEL_EVP_EncryptFinal(ctx, cipherCtx, out + first, &last));
+    pQEL_EVP_EncryptUpdate(ctx, cipherCtx, out, &first, bytesOf(kPassword), static_cast<int>(kPassword.size()));
+    pQEL_EVP_EncryptFinal(ctx, cipherCtx, out + first, &last);
     pQEL_EVP_CIPHER_CTX_cleanup(ctx, cipherCtx);
     pQEL_EVP_CIPHER_CTX_free(ctx, cipherCtx);
-  }
-}
-BENCHMARK(cipherOurs)->Name("provider-aes256/ours");
-
-void cipherPeer(benchmark::State& state) {
-  EVP_CIPHER* cipher = EVP_CIPHER_fetch(nullptr, "AES-256-ECB", nullptr);
-  unsigned char out[64];
-  int first = 0;
-  int last = 0;
-  for (auto _ : state) {
+  });
+  bench::measure(row + "/openssl", [cipher = EVP_CIPHER_fetch(nullptr, kCipher, nullptr)] {
+    unsigned char out[64];
+    int first = 0;
+    int last = 0;
     EVP_CIPHER_CTX* cipherCtx = EVP_CIPHER_CTX_new();
     EVP_EncryptInit_ex2(cipherCtx, cipher, bench::keys()->aesKeys[2].data, nullptr, nullptr);
-    EVP_EncryptUpdate(cipherCtx, out, &first, password(), 16);
-    benchmark::DoNotOptimize(EVP_EncryptFinal_ex(cipherCtx, out + first, &last));
+    EVP_EncryptUpdate(cipherCtx, out, &first, bytesOf(kPassword), static_cast<int>(kPassword.size()));
+    EVP_EncryptFinal_ex(cipherCtx, out + first, &last);
     EVP_CIPHER_CTX_free(cipherCtx);
-  }
-  EVP_CIPHER_free(cipher);
+  });
 }
-BENCHMARK(cipherPeer)->Name("provider-aes256/peer");
 
-void roundsOurs(benchmark::State& state) {
-  void* ctx = provider();
-  void* digestCtx = pQEL_EVP_MD_CTX_new(ctx);
-  const void* digest = pQEL_EVP_get_digestbyname(ctx, "SHA1");
-  unsigned char block[20] = {};
-  for (auto _ : state) {
-    for (int i = 0; i < kRounds; ++i) {
-      pQEL_EVP_DigestInit(ctx, digestCtx, digest);
-      pQEL_EVP_DigestUpdate(ctx, digestCtx, block, sizeof block);
-      pQEL_EVP_DigestFinal(ctx, digestCtx, block, nullptr);
-    }
-  }
-  pQEL_EVP_MD_CTX_free(ctx, digestCtx);
-}
-BENCHMARK(roundsOurs)->Name("provider-rounds/ours");
-
-void roundsPeer(benchmark::State& state) {
-  EVP_MD* digest = EVP_MD_fetch(nullptr, "SHA1", nullptr);
-  EVP_MD_CTX* digestCtx = EVP_MD_CTX_new();
-  unsigned char block[20] = {};
-  for (auto _ : state) {
+void addRounds(const std::string& row) {
+  void* const ctx = provider();
+  bench::measure(row + "/ours",
+                 [ctx, digestCtx = pQEL_EVP_MD_CTX_new(ctx), digest = pQEL_EVP_get_digestbyname(ctx, "SHA1")] {
+                   unsigned char block[20] = {};
+                   for (int i = 0; i < kRounds; ++i) {
+                     pQEL_EVP_DigestInit(ctx, digestCtx, digest);
+                     pQEL_EVP_DigestUpdate(ctx, digestCtx, block, sizeof block);
+                     pQEL_EVP_DigestFinal(ctx, digestCtx, block, nullptr);
+                   }
+                 });
+  bench::measure(row + "/openssl", [digestCtx = EVP_MD_CTX_new(), digest = EVP_MD_fetch(nullptr, "SHA1", nullptr)] {
+    unsigned char block[20] = {};
     for (int i = 0; i < kRounds; ++i) {
       EVP_DigestInit_ex2(digestCtx, digest, nullptr);
       EVP_DigestUpdate(digestCtx, block, sizeof block);
       EVP_DigestFinal_ex(digestCtx, block, nullptr);
     }
-  }
-  EVP_MD_CTX_free(digestCtx);
-  EVP_MD_free(digest);
+  });
 }
-BENCHMARK(roundsPeer)->Name("provider-rounds/peer");
+
+const bench::Rows kRows([] {
+  addDigest("provider-sha1", "SHA1");
+  addDigest("provider-md5", "md5");
+  addCipher("provider-aes256");
+  addRounds("provider-rounds");
+});
 
 }  // namespace
