@@ -1,7 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
-// AES encryption of buffers against OpenSSL, and each way in which it can fail.
+// AES encryption of buffers, random texts, key derivation and key generation. Expected bytes come from OpenSSL and from
+// vectors that another language's digests made. What memory and the provider can do to them stands in ledger_test.cpp.
+#include <sys/resource.h>
+
 #include <climits>
 
+#include "aes_salt.h"
 #include "failures.h"
 #include "oracle.h"
 
@@ -40,112 +44,57 @@ TEST(AesBuffers, AgreeWithOpensslAndComeBack) {
   }
 }
 
-int unreleased;  // cipher contexts
-void* (*realNew)(void*);
-int (*realFree)(void*, void*);
-constexpr auto kFails = [](auto...) { return 0; };
+// What a provider claims to have written, for the entries that the two directions end with.
+template <int kCount>
+constexpr auto kClaims = [](void*, void*, unsigned char*, int* count, auto...) { return *count = kCount, 1; };
 
-class AesFailures : public testing::Test {
- protected:
-  void SetUp() override {
-    ASSERT_EQ(initQelCrypto(&context_), 0);
-    realNew = std::exchange(pQEL_EVP_CIPHER_CTX_new, [](void* ctx) { return ++unreleased, realNew(ctx); });
-    realFree =
-        std::exchange(pQEL_EVP_CIPHER_CTX_free, [](void* ctx, void* c) { return --unreleased, realFree(ctx, c); });
-  }
-  void TearDown() override {
-    EXPECT_EQ(unreleased, 0);
-    EXPECT_EQ(out, nullptr);
-    pQEL_EVP_CIPHER_CTX_new = realNew;
-    pQEL_EVP_CIPHER_CTX_free = realFree;
-  }
-
-  void* context_ = nullptr;
-  std::string keyBytes_ = kKey;
-  const SecBuffer keyBuffer_{bytesOf(keyBytes_), 16};
-  const std::string clear_ = std::string(300, 'x');  // more than any buffer of usual size holds
-  const std::string text_ = opensslBase64(opensslCipher({"AES-128-ECB", kKey, "", true, true}, clear_));
-  // The arguments, for rows to replace.
-  const char *text = text_.c_str(), *clear = clear_.c_str(), *name = "AES-128-ECB";
-  char *out = nullptr, **slot = &out;
-  const SecBuffer *key = &keyBuffer_, *iv = &keyBuffer_;
-  int length = 300;
-  const Operation encrypt{"aesEncryptBuffer", [this] { return aesEncryptBuffer(clear, slot, name, key, iv, length); },
-                          LDTR_DEBUG};
-  const Operation decrypt{"aesDecryptBuffer", [this] { return aesDecryptBuffer(text, slot, name, key, iv, &length); },
-                          LDTR_DEBUG};
+TEST(AesBuffers, SurviveWhatIsWrong) {
+  void* context = nullptr;
+  ASSERT_EQ(initQelCrypto(&context), 0);
+  std::string keyBytes = kKey;
+  const SecBuffer key{bytesOf(keyBytes), 16};
+  const char *name = "AES-128-ECB", *text = "AAAAAAAAAAA=";
+  char* out = nullptr;
+  int length = 20;
+  const auto encrypt = [&] { return aesEncryptBuffer("20 bytes of the text", &out, name, &key, &key, length); };
+  const auto decrypt = [&] { return aesDecryptBuffer(text, &out, name, &key, &key, &length); };
   const Failure longVector = replacing(pQEL_EVP_CIPHER_iv_length, [](auto...) { return 1000; });
-  const Failure noPadding = replacing(pQEL_EVP_CIPHER_CTX_set_padding, [](auto...) { return 2; });
-};
-
-TEST_F(AesFailures, OfBothDirections) {
-  for (const Operation& each : {encrypt, decrypt}) {
-    each.refusesNulls(slot, name, key, iv);
-    each.fails({{1, "initQelCrypto() failed.", withoutProvider()},
-                {1, "initQelCipher() failed.", replacing(name, "AES-512-ECB")},
-                {1, "QEL_EVP_CIPHER_CTX_set_padding() failed.", noPadding}});
-  }
-}
-
-TEST_F(AesFailures, OfEncryption) {
-  encrypt.refusesNulls(clear);
-  encrypt.fails({{1, "Invalid parameter.", replacing(length, -1)},
-                 {90, "calloc() returned NULL.", replacing(length, INT_MAX)},
-                 {90, "calloc() returned NULL.", replacing(length, INT_MAX - 64)},
-                 {90, "Error - aesEncryptBuffer: calloc() failed.\n", both(longVector, failingAllocation(0))},
-                 {90, "calloc() returned NULL.", failingAllocation(0)},
-                 {1, "QEL_EVP_EncryptInit() failed.", replacing(pQEL_EVP_EncryptInit, kFails)},
-                 {1, "QEL_EVP_EncryptUpdate() failed.", replacing(pQEL_EVP_EncryptUpdate, kFails)},
-                 {1, "QEL_EVP_EncryptFinal() failed.", replacing(pQEL_EVP_EncryptFinal, kFails)},
-                 {1, "binaryBlobToBase64() returned NULL.", failingAllocation(1)}});
-}
-
-// A provider that claims more than it writes.
-TEST_F(AesFailures, YieldZerosForWhatWasNotWritten) {
-  const auto claims = [](void*, void*, unsigned char*, int* count, auto...) { return *count = 20, 1; };
-  const auto claimsTooMuch = [](void*, void*, unsigned char*, int* count, auto...) { return *count = 2000, 1; };
-  const auto claimsLess = [](void*, void*, unsigned char*, int* count, auto...) { return *count = -1, 1; };
-  replacing(pQEL_EVP_EncryptUpdate, claims)([&] {
-    replacing(pQEL_EVP_EncryptFinal, [](auto...) { return 1; })([&] {
-      dirtyStack();
-      ASSERT_EQ(aesEncryptBuffer("20 bytes of the text", &out, name, key, iv, 20), 0);
-      EXPECT_EQ(taken(std::exchange(out, nullptr)), opensslBase64(std::string(20, '\0')));
-    });
-  });
-  encrypt.fails(
-      {{1, "QEL_EVP_EncryptUpdate() failed.", replacing(pQEL_EVP_EncryptUpdate, claimsTooMuch)},
-       {1, "QEL_EVP_EncryptUpdate() failed.", replacing(pQEL_EVP_EncryptUpdate, claimsLess)},
-       {1, "QEL_EVP_EncryptFinal() failed.",
-        replacing(pQEL_EVP_EncryptFinal, [](void*, void*, unsigned char*, int* count) { return *count = 2000, 1; })}});
-}
-
-// Key wrapping adds more than a block.
-TEST_F(AesFailures, AreNotThoseOfRoom) {
-  const auto widest = [](void*, void*, unsigned char* to, int* count) {
-    std::memset(to, 'w', 64);
-    return *count = 64, 1;
+  const auto calloc = [](const std::string& operation) {
+    return "90 debug: Error - " + operation + ": calloc() failed.\n";
   };
-  replacing(pQEL_EVP_EncryptFinal, widest)([&] { ASSERT_EQ(encrypt(), 0); });
-  EXPECT_EQ(opensslDecoded(taken(std::exchange(out, nullptr))).substr(288), std::string(64, 'w'));
-}
-
-TEST_F(AesFailures, OfDecryption) {
-  const Failure noBase64 = both(replacing(text, "AAAA-AAA"), withoutProvider());  // the text is looked at first
-  decrypt.refusesNulls(text);
-  decrypt.fails({{1, "base64ToBinaryBlob() returned NULL.", noBase64},
-                 {1, "base64ToBinaryBlob() returned NULL.", failingAllocation(0)},
-                 {90, "Error - aesDecryptBuffer: calloc() failed.\n", both(longVector, failingAllocation(1))},
-                 {90, "QEL_EVP_DecryptInit() failed.", failingAllocation(1)},
-                 {1, "QEL_EVP_DecryptInit() failed.", replacing(pQEL_EVP_DecryptInit, kFails)},
-                 {1, "QEL_EVP_DecryptUpdate() failed.", replacing(pQEL_EVP_DecryptUpdate, kFails)},
-                 {1, "QEL_EVP_DecryptFinal() failed.", replacing(text, "AAAAAAAAAAA=")}});
-  EXPECT_EQ(length, 300) << "written without a result";
-}
-
-TEST_F(AesFailures, ClearTheSlotFromTheStatedStepOn) {
-  const auto clears = [&](const Operation& operation, const Failure& failure) {
-    char* const held = strdup("held");
-    out = held;
+  expectOutcomes("aesEncryptBuffer",
+                 {{"1 debug: Invalid parameter.", replacing(length, -1)},
+                  {"90 debug: calloc() returned NULL.", replacing(length, INT_MAX)},
+                  {"90 debug: calloc() returned NULL.", replacing(length, INT_MAX - 64)},
+                  {"1 debug: initQelCipher() failed.", replacing(name, "AES-512-ECB")},
+                  {calloc("aesEncryptBuffer"), both(longVector, failingAllocation(0))},
+                  {"1 debug: QEL_EVP_EncryptUpdate() failed.", replacing(pQEL_EVP_EncryptUpdate, kClaims<2000>)},
+                  {"1 debug: QEL_EVP_EncryptUpdate() failed.", replacing(pQEL_EVP_EncryptUpdate, kClaims<-1>)},
+                  {"1 debug: QEL_EVP_EncryptFinal() failed.", replacing(pQEL_EVP_EncryptFinal, kClaims<2000>)}},
+                 encrypt);
+  expectOutcomes(
+      "aesDecryptBuffer",
+      {{"1 debug: base64ToBinaryBlob() returned NULL.", both(replacing(text, "AAAA-AAA"), withoutProvider())},
+       {calloc("aesDecryptBuffer"), both(longVector, failingAllocation(0))},
+       {"1 debug: QEL_EVP_DecryptFinal() failed.", [](const Body& body) { body(); }}},
+      decrypt);
+  EXPECT_EQ(out, nullptr);
+  EXPECT_EQ(length, 20) << "written without a result";
+  // What is not written is zeros; key wrapping adds more than a block.
+  const auto widest = [](void*, void*, unsigned char* to, int* count) {
+    return std::memset(to, 'w', 64), *count = 64, 1;
+  };
+  const auto result = [&](const Failure& failure) {
+    dirtyStack();
+    failure([&] { EXPECT_EQ(encrypt(), 0); });
+    return opensslDecoded(taken(std::exchange(out, nullptr)));
+  };
+  EXPECT_EQ(result(both(replacing(pQEL_EVP_EncryptUpdate, kClaims<20>), replacing(pQEL_EVP_EncryptFinal, kClaims<0>))),
+            std::string(20, '\0'));
+  EXPECT_EQ(result(replacing(pQEL_EVP_EncryptFinal, widest)).substr(16), std::string(64, 'w'));
+  // The slot is cleared from a stated step on.
+  const auto clears = [&](const std::function<int()>& operation, const Failure& failure) {
+    char* const held = out = strdup("held");
     failure([&] { EXPECT_EQ(operation(), 1); });
     if (out == held) free(held);
     return std::exchange(out, nullptr) == nullptr;
@@ -154,6 +103,164 @@ TEST_F(AesFailures, ClearTheSlotFromTheStatedStepOn) {
   EXPECT_TRUE(clears(encrypt, replacing(name, "AES-512-ECB")));
   EXPECT_FALSE(clears(decrypt, replacing(text, "-")));
   EXPECT_TRUE(clears(decrypt, withoutProvider()));
+}
+
+class Derivation : public testing::Test {
+ protected:
+  void SetUp() override {
+    ASSERT_EQ(initQelCrypto(&ctx), 0);
+    ASSERT_EQ(initQelDigest(ctx, &digestCtx, "SHA1", &digest), 0);
+  }
+  void TearDown() override {
+    EXPECT_EQ(record, nullptr);
+    freeQelDigest(ctx, digestCtx);
+  }
+
+  std::string pbkdf2(const std::string& seedText, const std::string& saltText, int iterations, size_t length) {
+    Guarded guardedSeed(seedText), guardedSalt(saltText), key(std::string(length, '?'));
+    EXPECT_EQ(morva_pbkdf2(ctx, digestCtx, digest, bytesOf(guardedSeed.data()), static_cast<uint32_t>(seedText.size()),
+                           bytesOf(guardedSalt.data()), saltText.size(), static_cast<uint32_t>(iterations),
+                           bytesOf(key.data()), length),
+              0);
+    return std::string(key.data(), length);
+  }
+  // What the record holds, which is dropped.
+  Lines taken() {
+    const std::string content = contentOf(*record), keys = content.substr(content.size() - 72);
+    const Lines texts = {textOf(record->cryptoSync), textOf(record->cryptoSalt), keys};
+    freeAesKeyData(std::exchange(record, nullptr));
+    return texts;
+  }
+
+  void expectKey(const std::string& seedText, const std::string& saltText, int iterations, const std::string& key) {
+    for (size_t length = iterations < 10 ? 0 : key.size(); length <= key.size(); ++length) {
+      EXPECT_EQ(pbkdf2(seedText, saltText, iterations, length), key.substr(0, length));
+    }
+  }
+  void expectRecord(const std::string& seedText, const std::string& saltText, const std::string& sync,
+                    const std::string& key) {
+    seed = seedText.c_str();
+    salt = saltText.c_str();
+    for (const auto& make : {generate, generateAlone}) {
+      ASSERT_EQ(make(), 0);
+      EXPECT_STREQ(reinterpret_cast<char*>(record->cryptoSync.data), sync.c_str());
+      EXPECT_STREQ(reinterpret_cast<char*>(record->cryptoSalt.data), salt);
+      EXPECT_EQ(taken(), (Lines{sync, saltText, key.substr(0, 16) + key.substr(0, 24) + key}));
+    }
+  }
+
+  // The arguments, for rows to replace.
+  void *ctx = nullptr, *digestCtx = nullptr, *digest = nullptr;
+  const char *seed = "abcdefghijkl", *salt = "saltsaltsalt";
+  AesKeyData* record = nullptr;
+  const std::function<int()> generate = [this] { return genKeyDataVal(ctx, digestCtx, digest, seed, salt, &record); };
+  const std::function<int()> generateAlone = [this] { return genTmpKeyDataVal(seed, salt, &record); };
+};
+
+// ---- Random texts ----
+
+uint32_t drawn;
+
+TEST_F(Derivation, RandomTextsAreOfTheirRangeAndEndAtTheLastByte) {
+  for (const unsigned size : {1U, 2U, 3000U}) {
+    Guarded buffer(std::string(size, ' '));
+    EXPECT_EQ(morva_rand_ascii(ctx, bytesOf(buffer.data()), size), 0);
+    EXPECT_EQ(buffer.data()[size - 1], '\0');
+    for (unsigned i = 0; i + 1 < size; ++i) EXPECT_TRUE(buffer.data()[i] >= 33 && buffer.data()[i] <= 125) << i;
+  }
+  // Of 94 parts, the first begin at 0 and 45691142, the last but one ends at 4249276153, and the last wraps.
+  static const struct {
+    uint32_t drawn;
+    int low, high, result;
+  } rows[] = {{0, 33, 126, 33},          {45691141, 33, 126, 33},   {45691142, 33, 126, 34}, {4249276153, 33, 126, 125},
+              {4249276154, 33, 126, 33}, {0xffffffff, 33, 126, 34}, {0x80000000, -5, 5, 0}};
+  const Replaced<int (*)(void*, unsigned char*, int)> fixed(pQEL_RAND_bytes, [](void*, unsigned char* out, int count) {
+    std::memcpy(out, &drawn, 4);
+    return count == 4 ? 1 : 0;
+  });
+  for (const auto& row : rows) {
+    drawn = row.drawn;
+    EXPECT_EQ(ldappw::morva_rand_range(ctx, row.low, row.high), row.result) << row.drawn;
+  }
+}
+
+TEST_F(Derivation, AFailingGeneratorEndsTheProcess) {
+  const rlimit none{0, 0};  // and leave no core files
+  unsigned char buffer[4];
+  const testing::KilledBySignal aborted(SIGABRT);
+  replacing(pQEL_RAND_bytes, [](void*, unsigned char*, int) { return 2; })([&] {
+    EXPECT_EXIT((setrlimit(RLIMIT_CORE, &none), morva_rand_ascii(ctx, buffer, 4)), aborted,
+                "^The PRNG is not seeded!\n$");
+  });
+}
+
+// ---- Derivation ----
+
+TEST_F(Derivation, AgreesWithTheRecordedVectors) {
+  std::ifstream file(LDAPPW_TEST_DATA "/derivation.vec");
+  int keys = 0, records = 0;
+  for (std::string line, kind, seedText, saltText, third, hex; std::getline(file, line);) {
+    std::istringstream(line) >> kind >> seedText >> saltText >> third >> hex;
+    if (kind == "key") ++keys, expectKey(fromHex(seedText), fromHex(saltText), std::stoi(third), fromHex(hex));
+    if (kind == "record") ++records, expectRecord(seedText, saltText, third, fromHex(hex));
+  }
+  EXPECT_TRUE(keys == 7 && records == 3);
+  EXPECT_EQ(pbkdf2("s", "t", 0, 6000).substr(5980), opensslDigest("SHA1", std::string("ts\0\0\1\x2c", 6)));
+  const TraceCapture trace;
+  pbkdf2("", "", 9, 5);
+  EXPECT_EQ(trace.records().size(), 12U) << "the rounds are not traced";
+  for (const Record& r : trace.records()) EXPECT_TRUE(r.level == 43 && r.mask == 0x10000);
+}
+
+TEST_F(Derivation, KeepsWhatItHasAndReportsMemoryButNotTheProvider) {
+  std::string key(40, '\0');
+  uint64_t length = 40;
+  const auto derive = [&] {  // the low 32 bits of the salt's length count
+    return morva_pbkdf2(ctx, digestCtx, digest, bytesOf("abcd"), 4, bytesOf("efgh"), 0x100000004, 2, bytesOf(key),
+                        length);
+  };
+  expectOutcomes("morva_pbkdf2",
+                 {{"1 derivedKeyLen too long.", replacing(length, 85899345901)},
+                  {"90 morva_pkcs5_F() failed.", both(replacing(length, 85899345900), failingAllocation(0))},
+                  {"90 morva_pkcs5_F() failed.", failingAllocation(1)}},
+                 derive);
+  EXPECT_EQ(key, pbkdf2("abcd", "efgh", 2, 20) + std::string(20, '\0')) << "a block before the failure stays";
+  replacing(pQEL_EVP_DigestFinal, [](auto...) { return 0; })([&] { EXPECT_EQ(derive(), 0); });
+}
+
+// ---- Generation ----
+
+TEST_F(Derivation, WhatIsNotGivenIsRandomAndOddSaltsKeepTheirLength) {
+  const auto made = [this] { return generate() == 0 ? taken() : Lines(3); };
+  salt = nullptr;
+  EXPECT_NE(made()[1], made()[1]);
+  EXPECT_EQ(upToNul(made()[1]).size(), 12U);
+  seed = nullptr;
+  for (const char* each : {"saltsaltsalt", "", "thirty characters of salt, yes"}) {
+    salt = each;
+    const Lines first = made(), second = made();
+    EXPECT_EQ(first[1], salt);
+    EXPECT_EQ(first[0].size(), 16U);
+    for (const size_t i : {0U, 2U}) EXPECT_NE(first[i], second[i]);
+  }
+}
+
+// A digest that fails in the middle of thousands of rounds must not give other keys; the seed may be the sync text.
+TEST_F(Derivation, StepsAreWholeOrFail) {
+  ASSERT_EQ(initAesKeyData(&record), 0);
+  static int rounds = 0;
+  static const auto realInit = pQEL_EVP_DigestInit;
+  const auto oneRound = [](void* c, void* d, const void* a) { return ++rounds == 7777 ? 0 : realInit(c, d, a); };
+  expectOutcomes("growKeysFromSeed", {{"1 morva_pbkdf2() failed.", replacing(pQEL_EVP_DigestInit, oneRound)}},
+                 [&] { return growKeysFromSeed(ctx, digestCtx, digest, seed, record); });
+  const auto syncOf = [&](const char* text) {
+    EXPECT_EQ(genKeySyncVal(ctx, digestCtx, digest, text, record), 0);
+    return textOf(record->cryptoSync);
+  };
+  const std::string own = syncOf(seed);
+  const std::string ofOwn = syncOf(reinterpret_cast<const char*>(record->cryptoSync.data));
+  EXPECT_EQ(ofOwn, syncOf(own.c_str()));
+  taken();
 }
 
 }  // namespace

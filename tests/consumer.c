@@ -1,6 +1,8 @@
 /* SPDX-License-Identifier: Apache-2.0 */
 /* A program in C that uses the built library as a host does: every header, operations of each, and exported variables
- * that the library must see change. With decoys preloaded it shows that the library keeps to its own functions. */
+ * that the library must see change. With decoys preloaded it shows that the library keeps to its own functions. Each
+ * scheme is used with the stack at every distance from a multiple of 16, as hosts of the older 32-bit convention do. */
+#include <alloca.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
@@ -10,6 +12,25 @@
 #include "crypto_provider.h"
 #include "encoding_utils.h"
 #include "password_schemes.h"
+
+/* Offsets and sizes of the public records, with pointers of 4 and of 8 bytes. */
+#define LAYOUT(what, with4, with8) _Static_assert((what) == (sizeof(void*) == 8 ? (with8) : (with4)), #what)
+LAYOUT(sizeof(SecBuffer), 8, 16);
+LAYOUT(offsetof(SecBuffer, data), 0, 0);
+LAYOUT(offsetof(SecBuffer, length), 4, 8);
+LAYOUT(sizeof(AesKeyData), 40, 80);
+LAYOUT(offsetof(AesKeyData, cryptoSync), 0, 0);
+LAYOUT(offsetof(AesKeyData, cryptoSalt), 8, 16);
+LAYOUT(offsetof(AesKeyData, aesKeys), 16, 32);
+LAYOUT(sizeof(QelStatus), 268, 268);
+LAYOUT(offsetof(QelStatus, minRC), 4, 4);
+LAYOUT(offsetof(QelStatus, desc), 8, 8);
+LAYOUT(sizeof(sha_digest), 20, 20);
+LAYOUT(sizeof(ldappw_crypt_data), 898, 898);
+LAYOUT(_Alignof(ldappw_crypt_data), 1, 1);
+LAYOUT(offsetof(ldappw_crypt_data, KS), 48, 48);
+LAYOUT(offsetof(ldappw_crypt_data, block), 816, 816);
+LAYOUT(offsetof(ldappw_crypt_data, iobuf), 882, 882);
 
 #define CHECK(condition)                                                    \
   do {                                                                      \
@@ -26,6 +47,18 @@ static int noRandomBytes(void* ctx, unsigned char* buffer, int count) {
 
 static int matches(const char* password, const char* stored, AesKeyData* keys) {
   return verify_password(password, (int)strlen(password), stored, (int)strlen(stored), 1, keys) == 0;
+}
+
+static int usedOnStackMovedBy(size_t distance, int scheme, char* salt, AesKeyData* keys) {
+  volatile char* moved = alloca(distance);
+  char value[1024];
+  char* clear = NULL;
+  moved[0] = 0;
+  CHECK(format_password(scheme, salt, keys, "secret", 6, value, (int)sizeof value) > 0);
+  CHECK(matches("secret", value, keys) && !matches("Secret", value, keys));
+  CHECK(scheme < FORMAT_QVEIL || (unformat_password(value, &clear, keys, NULL) == 1 && strcmp(clear, "secret") == 0));
+  _morva_utils_decode_buffer_free(&clear);
+  return 0;
 }
 
 /* The tags are arrays of the library's own, back to back with one NUL behind the last, that a host may write to. */
@@ -54,7 +87,6 @@ int main(void) {
   char folder[] = "/tmp/ldappw-consumer-XXXXXX";
   char stash[64];
   char salt[3];
-  char value[1024];
   char* sync = NULL;
   char* text = NULL;
   AesKeyData* keys = NULL;
@@ -67,9 +99,8 @@ int main(void) {
 
   generate_crypt_salt(salt);
   for (size_t i = 0; i < sizeof schemes / sizeof schemes[0]; ++i) {
-    const int length = format_password(schemes[i], salt, keys, "secret", 6, value, (int)sizeof value);
-    CHECK(length > 0);
-    CHECK(matches("secret", value, keys) && !matches("Secret", value, keys));
+    for (size_t distance = 4; distance <= 64; distance += 4)
+      CHECK(usedOnStackMovedBy(distance, schemes[i], salt, keys) == 0);
   }
 
   CHECK(tagsHold() == 0);

@@ -61,52 +61,36 @@ inline Failure withoutDigests() {
   return replacing(pQEL_EVP_get_digestbyname, [](void*, const char*) -> const void* { return nullptr; });
 }
 
-struct FailureCase {
-  int rc;
-  Lines lines;
-  Failure failure;
-};
-
-// The last line is the operation's own, and of its class.
-inline void expectFailures(const std::vector<FailureCase>& rows, int severity, const std::function<int()>& call) {
-  for (const FailureCase& row : rows) {
-    SCOPED_TRACE(row.lines.back());
-    const TraceCapture trace(TraceCapture::kLinesOnly);
-    row.failure([&] { EXPECT_EQ(call(), row.rc); });
-    const Lines lines = trace.messages();
-    ASSERT_GE(lines.size(), row.lines.size());
-    EXPECT_EQ(Lines(lines.end() - static_cast<long>(row.lines.size()), lines.end()), row.lines);
-    for (const Record& r : trace.records()) {
-      if (r.text == row.lines.back() && r.severity != severity) ADD_FAILURE() << "of the wrong class";
-    }
+// What a call gives and the last line that it traces: without what is usual about it, and with its class unless it is
+// of the error class.
+inline std::string outcomeOf(const std::string& operation, const std::function<std::string()>& call) {
+  const TraceCapture trace(TraceCapture::kLinesOnly);
+  const std::string result = call();
+  const Lines lines = trace.messages();
+  std::string line = lines.empty() ? "" : lines.back();
+  const std::string start = "Error - " + operation.substr(0, operation.find(',')) + ": ",
+                    end = " rc = " + result + "\n";
+  std::string lineClass;
+  for (const Record& r : trace.records()) {
+    if (r.kind == LDTR_LINE && r.text == line) lineClass = r.severity == LDTR_DEBUG ? "debug: " : "";
   }
+  const bool isUsual = line.rfind(start, 0) == 0 && line.size() >= start.size() + end.size() &&
+                       line.compare(line.size() - end.size(), end.size(), end) == 0;
+  if (isUsual) line = line.substr(start.size(), line.size() - start.size() - end.size());
+  return result + " " + lineClass + line;
 }
 
-// A failing step, and what is reported of it: whole, or without the name before it and the code behind it.
-struct FailingStep {
-  int rc;
-  std::string says;
+// What a call gives while something is broken, as outcomeOf has it.
+struct BrokenCase {
+  std::string outcome;
   Failure failure;
 };
-
-// An operation with its arguments, the name that its lines give, and their class.
-struct Operation {
-  std::string name;
-  std::function<int()> call;
-  int severity = LDTR_ERROR;
-
-  int operator()() const { return call(); }
-  void fails(const std::vector<FailingStep>& rows) const {
-    for (const FailingStep& row : rows) {
-      const std::string usual = "Error - " + name + ": " + row.says + " rc = " + std::to_string(row.rc) + "\n";
-      expectFailures({{row.rc, {row.says.back() == '\n' ? row.says : usual}, row.failure}}, severity, call);
-    }
+inline void expectOutcomes(const std::string& operation, const std::vector<BrokenCase>& rows,
+                           const std::function<int()>& call) {
+  for (const BrokenCase& row : rows) {
+    row.failure([&] { EXPECT_EQ(outcomeOf(operation, [&] { return std::to_string(call()); }), row.outcome); });
   }
-  template <class... Slots>
-  void refusesNulls(Slots&... slots) const {
-    fails({{1, "Invalid parameter.", replacing(slots, nullptr)}...});
-  }
-};
+}
 
 // Digests that do nothing, for failures that lie behind thousands of rounds.
 inline Failure withQuickDigests() {

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // The built library in hosts that do what hosts do at the worst moment. Each case runs in a child process, in which
-// nothing has been used before, and has a minute.
+// nothing has been used before, and has a minute. The argument is how often those run that count on bad luck.
 #include <dlfcn.h>
 #include <pthread.h>
 #include <sys/wait.h>
@@ -11,12 +11,15 @@
 #include <cstdlib>
 #include <cstring>
 #include <iterator>
+#include <string>
 #include <thread>
 #include <vector>
 
 #include "crypto_provider.h"
 #include "ldtr.h"
 #include "password_schemes.h"
+
+extern "C" int bump_refuse(long number, int andLater) __attribute__((weak));  // of bump.c, where that is preloaded
 
 namespace {
 
@@ -36,14 +39,95 @@ AesKeyData* newKeys() {
 
 AesKeyData* const keys = newKeys();
 
-void useEachScheme() {
+// In an order of each caller's own.
+void useEachScheme(unsigned first = 0) {
+  static constexpr int kSchemes[] = {FORMAT_SSHA, FORMAT_AES256, FORMAT_CRYPT, FORMAT_QVEIL, FORMAT_MD5, FORMAT_SHA};
   char salt[] = "ab";
-  for (const int scheme : {FORMAT_SSHA, FORMAT_AES256, FORMAT_CRYPT, FORMAT_QVEIL, FORMAT_MD5, FORMAT_SHA}) {
+  const std::string password = "secret " + std::to_string(first), wrong = "Secret " + std::to_string(first);
+  const int size = static_cast<int>(password.size());
+  for (unsigned i = 0; i < std::size(kSchemes); ++i) {
+    const int scheme = kSchemes[(first + i) % std::size(kSchemes)];
     char value[256];
-    const int length = format_password(scheme, salt, keys, "secret", 6, value, sizeof value);
+    char* clear = nullptr;
+    const int length = format_password(scheme, salt, keys, password.data(), size, value, sizeof value);
     CHECK(length > 0);
-    CHECK(verify_password("secret", 6, value, length, 1, keys) == 0);
-    CHECK(verify_password("Secret", 6, value, length, 1, keys) != 0);
+    CHECK(verify_password(password.data(), size, value, length, 1, keys) == 0);
+    CHECK(verify_password(wrong.data(), size, value, length, 1, keys) != 0);
+    if (scheme < FORMAT_QVEIL) continue;
+    CHECK(unformat_password(std::string(value, value + length).c_str(), &clear, keys, nullptr) == 1);
+    CHECK(clear == password);
+    _morva_utils_decode_buffer_free(&clear);
+  }
+}
+
+// Threads that begin at once.
+void inThreads(unsigned count, void (*run)(unsigned number)) {
+  std::atomic<unsigned> waiting{count};
+  std::vector<std::thread> threads;
+  for (unsigned number = 0; number < count; ++number) {
+    threads.emplace_back([&waiting, run, number] {
+      for (--waiting; waiting > 0;) std::this_thread::yield();
+      run(number);
+    });
+  }
+  for (std::thread& thread : threads) thread.join();
+}
+
+void startsManyThreads() {
+  inThreads(32, [](unsigned number) { useEachScheme(number); });
+}
+
+void worksInThreads() {
+  inThreads(16, [](unsigned number) {
+    for (unsigned round = 0; round < 200; ++round) useEachScheme(number + round);
+  });
+}
+
+// Another sink comes with another user, and never with the former one's.
+template <int kNumber>
+void setSink() {
+  static char user;
+  ldtr_set_sink([](const ldtr_record*, void* given) { CHECK(given == &user); }, &user);
+}
+
+void changesItsSink() {
+  std::atomic<bool> done{false};
+  setSink<0>();
+  trcEvents = LDTR_EVENT_DEBUG;
+  std::thread other([&done] {
+    for (int i = 0; i < 300000; ++i) i % 2 == 0 ? setSink<0>() : setSink<1>();
+    done = true;
+  });
+  while (!done) check_format("{unknown}", 9);
+  other.join();
+  trcEvents = 0;
+}
+
+// Memory runs out somewhere in the first use: a refusal or a sound result, and no crash then or later.
+void runsOutOfMemory() {
+  if (bump_refuse == nullptr) return;
+  for (const int andLater : {0, 1}) {
+    int status = 0;
+    for (long number = 0; status == 0; number += 1 + number / 50) {
+      const pid_t child = fork();
+      if (child == 0) {
+        alarm(20);
+        char value[2][64];
+        int length[2];
+        bump_refuse(number, andLater);
+        length[0] = format_password(FORMAT_SSHA, nullptr, nullptr, "secret", 6, value[0], 64);
+        const bool isEnd = bump_refuse(-1, 0) != 0;
+        length[1] = format_password(FORMAT_SSHA, nullptr, nullptr, "secret", 6, value[1], 64);
+        for (int i = 0; i < 2; ++i) {
+          CHECK(length[i] == 0 || verify_password("secret", 6, value[i], length[i], 1, nullptr) == 0 || length[1] == 0);
+        }
+        _exit(isEnd ? 77 : 0);
+      }
+      CHECK(waitpid(child, &status, 0) == child);
+      if (status != 0 && status != 77 << 8U)
+        std::fprintf(stderr, "request %ld%s\n", number, andLater ? " and later" : "");
+    }
+    CHECK(status == 77 << 8U);
   }
 }
 
@@ -181,9 +265,14 @@ void asksTheLoader() {
 struct Host {
   const char* name;
   void (*run)();
+  bool countsOnLuck = false;
 };
 
 constexpr Host kHosts[] = {
+    {"starts many threads", startsManyThreads, true},
+    {"works in threads", worksInThreads},
+    {"changes its sink", changesItsSink},
+    {"runs out of memory", runsOutOfMemory},
     {"is cancelled", isCancelled},
     {"traces into itself", tracesIntoItself},
 #ifndef __SANITIZE_ADDRESS__
@@ -196,20 +285,23 @@ constexpr Host kHosts[] = {
 
 }  // namespace
 
-int main() {
+int main(int argc, char** argv) {
+  const int times = argc > 1 ? std::atoi(argv[1]) : 20;
   int failed = 0;
   for (const Host& host : kHosts) {
-    const pid_t child = fork();
-    if (child == 0) {
-      alarm(60);
-      host.run();
-      std::exit(0);
+    for (int i = 0; i < (host.countsOnLuck ? times : 1); ++i) {
+      const pid_t child = fork();
+      if (child == 0) {
+        alarm(60);
+        host.run();
+        std::exit(0);
+      }
+      int status = -1;
+      waitpid(child, &status, 0);
+      if (status == 0) continue;
+      std::fprintf(stderr, "a host that %s: status %#x\n", host.name, static_cast<unsigned>(status));
+      failed = 1;
     }
-    int status = -1;
-    waitpid(child, &status, 0);
-    if (status == 0) continue;
-    std::fprintf(stderr, "a host that %s: status %#x\n", host.name, static_cast<unsigned>(status));
-    failed = 1;
   }
   return failed;
 }

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Finding, loading and unloading the provider, and its one context. That leaves process-wide state behind, so each case
-// runs in a child process, over stand-in providers that tell what was called.
+// Finding, loading and unloading the provider, its one context and its statuses. Loading leaves process-wide state
+// behind, so each case runs in a child process, over stand-in providers that report what was called.
 #include <gtest/gtest.h>
 #include <sys/wait.h>
 
@@ -231,6 +231,39 @@ TEST(ProviderContext, FailuresLeaveItAbsentAndMayBeRetried) {
     EXPECT_EQ(initQelCrypto(&context), 1);
     EXPECT_EQ(context, nullptr);
   });
+}
+
+char provider;
+QelStatus known;
+
+TEST(ProviderStatus, MapsToAnLdapCodeAndShowsItselfGivenOrAskedFor) {
+  const std::string longest(sizeof known.desc, 'x');
+  const struct {
+    int major, minor, rc;
+    std::string description, output;
+  } rows[] = {
+      {0, 15, 0, "unseen", ""},
+      {3, 14, 1, "what happened", "QEL Status - \nmajRC: 3\nminRC: 14\ndesc: what happened\n"},
+      {-1, 16, 1, "", "QEL Status - \nmajRC: -1\nminRC: 16\ndesc: \n"},
+      {1, 15, 90, longest, "QEL Status - \nmajRC: 1\nminRC: 15\ndesc: " + longest + "\n"},
+  };
+  const test::Replaced asked(
+      pQEL_GetStatus, +[](void* context, QelStatus* status) {
+        EXPECT_EQ(context, &provider);
+        EXPECT_EQ(test::toHex(status, sizeof *status), std::string(536, '0'));
+        return *status = known, 0;
+      });
+  for (const auto& row : rows) {
+    known = {row.major, row.minor, ""};
+    row.description.copy(known.desc, sizeof known.desc);
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(qelStatusToLdap(nullptr, &known), row.rc);
+    EXPECT_EQ(qelStatusToLdap(&provider, nullptr), row.rc);
+    EXPECT_EQ(testing::internal::GetCapturedStdout(), row.output + row.output);
+  }
+  const TraceCapture trace;
+  EXPECT_EQ(qelStatusToLdap(nullptr, nullptr), 1);
+  EXPECT_EQ(trace.messages(), Lines{"Error - qelStatusToLdap: Invalid parameter. rc = 1\n"});
 }
 
 }  // namespace

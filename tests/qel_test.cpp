@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// The crypto provider: OpenSSL's answers for every algorithm, misuse of every entry, wiping, refused memory, threads,
-// forks and exits, and the built library as the loader sees it. OpenSSL's allocator is replaced, so that blocks can be
-// searched and refused.
+// The crypto provider: OpenSSL's answers for every algorithm, misuse of every entry, wiping, refused memory, threads, and
+// the built library as the loader sees it. OpenSSL's allocator is replaced, so that blocks can be searched and refused.
+// Hosts that fork, exit and cancel threads stand in hosts.cpp.
 #include "qel.h"
 
 #include <dlfcn.h>
@@ -26,19 +26,6 @@
 
 #include "oracle.h"
 
-#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
-#define LDAPPW_OWN_MALLOC
-namespace {
-long mallocsLeft = -1;  // the one after these fails; negative: none does
-}
-extern "C" void* __libc_malloc(size_t size);
-#pragma GCC visibility push(default)
-extern "C" void* malloc(size_t size) {
-  return mallocsLeft >= 0 && mallocsLeft-- == 0 ? nullptr : __libc_malloc(size);
-}
-#pragma GCC visibility pop
-#endif
-
 namespace {
 
 // ---- OpenSSL's memory ----
@@ -46,8 +33,7 @@ namespace {
 constexpr char kWord[] = "sEcReT?!";  // what any part of the secret holds that is long enough
 unsigned char secret[512];            // the word, over and over
 std::mutex blocksMutex;
-std::set<void*>* blocks = nullptr;   // live ones; never destroyed, OpenSSL releases some at exit
-std::atomic<bool> isSearched{true};  // else the lock over them is left alone, which a fork could leave taken
+std::set<void*>* blocks = nullptr;  // live ones; never destroyed, OpenSSL releases some at exit
 std::atomic<int> secretsReleased{0};
 std::atomic<long> allocationsLeft{-1};  // those after these fail; negative: none does
 
@@ -56,7 +42,7 @@ bool holdsSecret(void* block) {
 }
 
 void opensslFree(void* block, const char*, int) {
-  if (block != nullptr && isSearched) {
+  if (block != nullptr) {
     if (holdsSecret(block)) ++secretsReleased;
     const std::lock_guard<std::mutex> lock{blocksMutex};
     blocks->erase(block);
@@ -70,7 +56,6 @@ void* opensslRealloc(void* old, size_t size, const char* file, int line) {
   void* block = std::calloc(1, size);
   if (old != nullptr) std::memcpy(block, old, std::min(size, malloc_usable_size(old)));
   opensslFree(old, file, line);
-  if (!isSearched) return block;
   const std::lock_guard<std::mutex> lock{blocksMutex};
   blocks->insert(block);
   return block;
@@ -523,48 +508,6 @@ int endOpenssl() {
   std::exit(isBegun && goesOn ? kGood : kBad);
 }
 
-int cancelInFirstDraw() {
-  static const Handles h;
-  std::thread{[] {
-    pthread_cancel(pthread_self());
-    h.drawsRandom();
-    pthread_testcancel();
-  }}.join();
-  return h.drawsRandom() && h.works() ? kGood : kBad;
-}
-
-// Works with what it is given until it is refused.
-void workOn(QEL_CTX* ctx) {
-  unsigned char room[64];
-  for (int length = 0; QEL_RAND_bytes(ctx, room, 32) == 1;) {
-    const Handles own{ctx}, passing;
-    QEL_SetValue(ctx, nullptr, QEL_VALUE_LOAD_PATH, "some path or other");
-    own.digestInit();
-    own.encryptInit();
-    QEL_EVP_DigestUpdate(ctx, own.digestCtx, room, 32);
-    QEL_EVP_DigestFinal(ctx, own.digestCtx, room, nullptr);
-    QEL_EVP_EncryptUpdate(ctx, own.cipherCtx, room, &length, secret, 48);
-    QEL_EVP_CIPHER_CTX_free(ctx, own.cipherCtx);
-    QEL_EVP_MD_CTX_free(ctx, own.digestCtx);
-    QEL_Cleanup(passing.ctx, nullptr);
-  }
-}
-
-// Threads that work on this provider context, and others that work on one that is never cleaned up.
-const Handles& sharedWithThreads() {
-  isSearched = false;
-  static const Handles h, lasting;
-  for (QEL_CTX* ctx : {h.ctx, h.ctx, lasting.ctx, lasting.ctx}) std::thread{workOn, ctx}.detach();
-  usleep(2000);
-  return h;
-}
-
-int exitAmongThreads() {
-  const Handles& h = sharedWithThreads();
-  const bool isReleased = QEL_Cleanup(h.ctx, nullptr) == 1;
-  std::exit(isReleased && !h.works() && !h.drawsRandom() ? kGood : kBad);
-}
-
 // OpenSSL's own exit handler would have run before this one.
 int outliveExit() {
   static const Handles* lasting = nullptr;
@@ -574,27 +517,10 @@ int outliveExit() {
   std::exit(kBad);
 }
 
-[[maybe_unused]] int forkAmongThreads() {
-  const Handles& h = sharedWithThreads();
-  const auto child = [&h] {
-    const Handles own;
-    return h.setValue(QEL_VALUE_LOAD_PATH, "x") && own.works() && QEL_Cleanup(own.ctx, nullptr) == 1 ? kGood : kBad;
-  };
-  for (int i = 0; i < 100; ++i) {
-    if (inChild(child) != kGood) return kBad;
-  }
-  return kGood;
-}
-
 TEST(QelDeathTest, WhatHappensOnce) {
   EXPECT_EQ(inChild(startWithoutMemory), kGood);
   EXPECT_EQ(inChild(endOpenssl), kGood);
   EXPECT_EQ(inChild(outliveExit), kGood);
-  EXPECT_EQ(inChild(cancelInFirstDraw), kGood);
-#ifndef __SANITIZE_ADDRESS__  // its own allocator leaves locks taken in the child
-  EXPECT_EQ(inChild(forkAmongThreads), kGood);
-#endif
-  for (int i = 0; i < 20; ++i) EXPECT_EQ(inChild(exitAmongThreads), kGood);
 }
 
 // ---- The library as the loader sees it ----
@@ -625,8 +551,6 @@ TEST(QelDeathTest, ReportsItsFolder) {
       {kFolder, 0, "qellib/libtresk7qels.so", kFolder, 1024},
       {kFolder + "/qellib", 0, "./libtresk7qels.so", kFolder, 1024},
       {"/", 0, root + "/qellib/sub/../libtresk7qels.so", root + "/qellib/sub/../..", 1024},
-      {root, 15, "./libtresk7qels.so", "", 1024},
-      {root, 19, std::string(300, '/').replace(0, 1, ".") + "libtresk7qels.so", "", 20000},
       {root, 45, "./libtresk7qels.so", "", 20000},
   };
   for (const auto& row : rows) {
@@ -666,17 +590,6 @@ int closeAndOpen() {
 
 TEST(QelDeathTest, IsClosedAndOpenedAgain) {
   EXPECT_EQ(inChild(closeAndOpen), kGood);
-#ifdef LDAPPW_OWN_MALLOC
-  for (long n = 0; n < 60; ++n) {  // the loader has no memory for the library's origin, or for something else
-    const auto open = [n] {
-      mallocsLeft = n;
-      void* library = dlopen(kProvider.c_str(), RTLD_NOW | RTLD_LOCAL);
-      mallocsLeft = -1;
-      return library == nullptr ? kRefused : entry(library, "treskqels_path", treskqels_path)(text, sizeof text);
-    };
-    EXPECT_NE(inChild(open), kCrashed) << n;
-  }
-#endif
 }
 
 }  // namespace

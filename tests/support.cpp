@@ -9,13 +9,52 @@ namespace {
 thread_local bool watching = false;
 thread_local long counted = 0;
 thread_local long failing = -1;
+thread_local bool laterOnesToo = false;
+thread_local long live = 0;
 
 thread_local const std::string* soughtSecret = nullptr;
 thread_local long released = 0;
 thread_local long releasedWithSecret = 0;
 
 bool fails() {
-  return watching && counted++ == failing;
+  if (!watching) return false;
+  const long number = counted++;
+  const bool failed = number == failing || (laterOnesToo && number > failing);
+  live += failed ? 0 : 1;
+  return failed;
+}
+
+// New memory is full of junk, which goes on behind its end up to a mark with the size: nothing may be taken for zero, and
+// nothing written there, without being noticed.
+constexpr unsigned char kJunk = 0xa5;
+struct Mark {
+  static constexpr uint64_t kSign = 0x6c64617070770a5aU;
+  uint64_t sign;
+  uint64_t size;
+};
+constexpr size_t kFence = 2 * sizeof(Mark);
+
+unsigned char* markOf(void* data) {
+  return static_cast<unsigned char*>(data) + malloc_usable_size(data) - sizeof(Mark);
+}
+
+void* fenced(void* data, size_t size) {
+  if (data == nullptr) return nullptr;
+  const Mark mark{Mark::kSign, size};
+  std::memset(data, kJunk, malloc_usable_size(data));
+  std::memcpy(markOf(data), &mark, sizeof mark);
+  return data;
+}
+
+void checkFence(void* data) {
+  Mark mark{};
+  if (malloc_usable_size(data) < kFence) return;
+  std::memcpy(&mark, markOf(data), sizeof mark);
+  if (mark.sign != Mark::kSign) return;  // from elsewhere
+  for (auto* at = static_cast<unsigned char*>(data) + mark.size; at < markOf(data); ++at) {
+    if (*at != kJunk) std::abort();
+  }
+  std::memset(markOf(data), 0, sizeof mark);
 }
 
 }  // namespace
@@ -24,25 +63,28 @@ bool fails() {
 #pragma GCC visibility push(default)
 extern "C" {
 void* __real_malloc(size_t size);
-void* __real_calloc(size_t count, size_t size);
-char* __real_strdup(const char* text);
 void __real_free(void* data);
 
 void* __wrap_malloc(size_t size) {
-  return fails() ? nullptr : __real_malloc(size);
+  return fails() ? nullptr : fenced(__real_malloc(size + kFence), size);
 }
 void* __wrap_calloc(size_t count, size_t size) {
-  return fails() ? nullptr : __real_calloc(count, size);
+  if (fails()) return nullptr;
+  void* data = fenced(__real_malloc(count * size + kFence), count * size);
+  return data == nullptr ? nullptr : std::memset(data, 0, count * size);
 }
 char* __wrap_strdup(const char* text) {
-  return fails() ? nullptr : __real_strdup(text);
+  void* data = __wrap_malloc(std::strlen(text) + 1);
+  return data == nullptr ? nullptr : std::strcpy(static_cast<char*>(data), text);
 }
 void __wrap_free(void* data) {
+  if (data != nullptr) checkFence(data);
   if (data != nullptr && soughtSecret != nullptr) {
     ++released;
     const size_t bytes = malloc_usable_size(data);
     if (memmem(data, bytes, soughtSecret->data(), soughtSecret->size()) != nullptr) ++releasedWithSecret;
   }
+  if (data != nullptr && watching) --live;
   __real_free(data);
 }
 }
@@ -50,9 +92,10 @@ void __wrap_free(void* data) {
 
 namespace test {
 
-AllocationWatch::AllocationWatch(long failingNumber) {
-  counted = 0;
+AllocationWatch::AllocationWatch(long failingNumber, bool andLater) {
+  counted = live = 0;
   failing = failingNumber;
+  laterOnesToo = andLater;
   watching = true;
 }
 
@@ -62,6 +105,10 @@ AllocationWatch::~AllocationWatch() {
 
 long AllocationWatch::count() const {
   return counted;
+}
+
+long AllocationWatch::unreleased() const {
+  return live;
 }
 
 ReleaseWatch::ReleaseWatch(std::string secret) : secret_(std::move(secret)) {

@@ -71,13 +71,15 @@ class TraceCapture {
   std::vector<Record> records_;
 };
 
-// Counts the product's allocations on this thread and fails the one with the given number (from 0; -1 for none). Calls
-// of malloc, calloc and strdup in the product's objects are routed here by the linker.
+// Counts the product's allocations on this thread and fails the one with the given number (from 0; -1 for none), or all
+// from that one on. Calls of malloc, calloc, strdup and free in the product's objects are routed here by the linker, and
+// a write behind the end of what they give ends the suite.
 class AllocationWatch {
  public:
-  explicit AllocationWatch(long failing = -1);
+  explicit AllocationWatch(long failing = -1, bool andLater = false);
   ~AllocationWatch();
   long count() const;
+  long unreleased() const;
 };
 
 // Looks into what the product releases on this thread, just before it goes: whether the secret still lies in it.
