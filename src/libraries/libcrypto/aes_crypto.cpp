@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // AES encryption of buffers through the crypto provider, with base64 text around it. Log readers match the texts as
-// they are, the two without a code and the allocation failure that speaks of DecryptInit among them; the AesFailures
-// suite pins all.
+// they are, the two without a code and the allocation failure that speaks of DecryptInit among them; the Ledger and
+// AesBuffers suites pin all.
 #include "aes_keys.h"
 
 #include <climits>

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Creating and rebuilding stash files, and what seeds and salts must look like. Log readers match the texts as they
-// are, those that name another function or call a bad salt an invalid parameter among them; the StashFileMaking and
+// are, those that name another function or call a bad salt an invalid parameter among them; the Keys, Ledger and
 // CryptoStrings suites pin all.
 #include <cstring>
 

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // The one process-wide provider context, and cipher and digest contexts over it. Log readers match the texts as they
-// are, the one that shows no code among them; the ProviderContext and ProviderPairs suites pin all.
+// are, the one that shows no code among them; the ProviderContext and Ledger suites pin all.
 #include "qel_utils.h"
 
 #include <sys/stat.h>

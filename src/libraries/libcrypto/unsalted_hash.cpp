@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // Plain digests through the crypto provider: the payload of {MD5} values. Log readers match the lines as they are,
 // which lack the code, the newline or a blank here and there, and there is none about entering. Any value of the
-// provider but 0 is a success. UnsaltedHash.ReportsProviderFailuresInItsOwnWords pins both.
+// provider but 0 is a success. Ledger and SaltedAndUnsalted pin both.
 #include "password_schemes.h"
 
 #include <cstring>
