@@ -10,6 +10,7 @@
 #include <chrono>
 #include <condition_variable>
 #include <exception>
+#include <map>
 #include <mutex>
 #include <system_error>
 #include <thread>
@@ -36,6 +37,7 @@ class Progress {
   Progress(const Progress&) = delete;
   Progress& operator=(const Progress&) = delete;
 
+  // Counts entries; bytes is how far the input has been read.
   void advance(std::uint64_t entries, std::uint64_t bytes);
   // Takes the line away, so that a message can be written.
   void hide() noexcept;
@@ -60,7 +62,7 @@ Progress::Progress(int inputFd, bool resultsOnStdout)
 
 void Progress::advance(std::uint64_t entries, std::uint64_t bytes) {
   entries_ += entries;
-  bytes_ += bytes;
+  bytes_ = bytes;
   const Clock::time_point now = Clock::now();
   if (!shown_ || now < next_) return;
   next_ = now + kStep;
@@ -83,7 +85,8 @@ class Run {
  public:
   Run(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
       const std::function<void(const Part&)>& deliver)
-      : reader_(input),
+      : input_(input),
+        reader_(input),
         attributes_(options.attributes, options.others),
         progress_(input.fd(), options.resultsOnStdout),
         work_(work),
@@ -100,7 +103,9 @@ class Run {
     loop();
     for (std::thread& helper : helpers) helper.join();
     progress_.hide();
+    reportRest();
     if (failure_) std::rethrow_exception(failure_);
+    reportWhole();
     return std::move(sum_);
   }
 
@@ -113,7 +118,9 @@ class Run {
         RecordWalker walker(batch, attributes_);
         work_(walker, part);
         part.tally.entries = walker.entries();
-        if (!hand(batch, part)) return;
+        part.tally.outside = walker.outside().size();
+        for (const std::uint64_t line : walker.outside()) part.report(line, "", kBadValue, kOutsideText);
+        if (!hand(batch, part, walker.seen())) return;
         part.out.clear();
         part = {std::move(part.out), {}, {}, kSuccess, nullptr};
       }
@@ -123,23 +130,50 @@ class Run {
   }
 
   bool take(Batch& batch) {
-    const std::lock_guard<std::mutex> lock(input_);
-    return !stopped() && reader_.next(batch);
+    const std::lock_guard<std::mutex> lock(reading_);
+    if (stopped() || !reader_.next(batch)) return false;
+    batch.inputBytes = input_.bytesRead();
+    return true;
   }
 
-  bool hand(const Batch& batch, const Part& part) {
+  bool hand(const Batch& batch, const Part& part, std::uint64_t seen) {
     std::unique_lock<std::mutex> lock(output_);
     turn_.wait(lock, [&] { return failure_ || due_ == batch.number; });
     if (failure_) return false;
     deliver_(part);
     if (!part.messages.empty()) progress_.hide();
-    for (const std::string& text : part.messages) message(text);
+    for (const Part::Message& one : part.messages) {
+      if (++shown_[one.kind] <= Part::kMostOfAKind) message(one.text);
+    }
+    if (batch.number == 0 && batch.text.view().substr(0, 3) == "\xEF\xBB\xBF") {
+      warning(input_.name() + " begins with a byte order mark, which LDIF does not have");
+    }
+    seen_ |= seen;
+    cutOff_ = batch.text.view().back() != '\n';
     keepFirst(sum_.exitCode, part.exitCode);
     sum_.tally.add(part.tally);
-    progress_.advance(part.tally.entries, batch.text.size());
+    progress_.advance(part.tally.entries, batch.inputBytes);
     ++due_;
     turn_.notify_all();
     return true;
+  }
+
+  // The kinds of which not all were shown.
+  void reportRest() const {
+    for (const auto& [kind, count] : shown_) {
+      if (count > Part::kMostOfAKind) message(std::to_string(count - Part::kMostOfAKind) + " more: " + kind);
+    }
+  }
+
+  void reportWhole() const {
+    if (sum_.tally.entries == 0) {
+      throw Failure(kBadValue, input_.name() + " has no entry, no line that begins with \"dn:\"; it seems to be " +
+                                   input_.seems());
+    }
+    if (cutOff_) warning(input_.name() + ": the last line does not end in a newline; the export may be cut off");
+    for (std::size_t i = 0; i < attributes_.given(); ++i) {
+      if ((seen_ >> i & 1U) == 0) warning("no entry has an attribute " + attributes_.name(i));
+    }
   }
 
   bool stopped() {
@@ -153,29 +187,36 @@ class Run {
     turn_.notify_all();
   }
 
+  Input& input_;
   RecordReader reader_;
   const AttributeSet attributes_;
   Progress progress_;
   const std::function<void(RecordWalker&, Part&)>& work_;
   const std::function<void(const Part&)>& deliver_;
-  std::mutex input_;
+  std::mutex reading_;
   std::mutex output_;
   std::condition_variable turn_;
   std::uint64_t due_ = 0;
   std::exception_ptr failure_;
+  std::map<std::string, std::uint64_t> shown_;
+  std::uint64_t seen_ = 0;
+  bool cutOff_ = false;
   Part sum_;
 };
 
 }  // namespace
 
 void Part::report(std::uint64_t line, const std::string& dn, ExitCode code, const std::string& text) {
-  messages.push_back("line " + std::to_string(line) + ": " + (dn.empty() ? "(no dn)" : dn) + ": " + text);
+  messages.push_back({"line " + std::to_string(line) + ": " + (dn.empty() ? "(no dn)" : dn) + ": " + text, text});
   keepFirst(exitCode, code);
 }
 
 Input openExport(const ExportOptions& options) {
   ldifLibrary();
-  return options.in == "-" ? Input() : Input(options.in);
+  const AttributeSet checked(options.attributes);
+  Input input = options.in == "-" ? Input() : Input(options.in);
+  input.requireText();
+  return input;
 }
 
 Part runExport(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,

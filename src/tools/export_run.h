@@ -21,11 +21,18 @@ namespace tool {
 struct Gathered {
   virtual ~Gathered() = default;
 };
+constexpr char kOutsideText[] = "lines that belong to no entry";
 
 // What comes of one batch, and in sum of all.
 struct Part {
+  struct Message {
+    std::string text;
+    std::string kind;  // the text without the place: of one kind only the first kMostOfAKind are shown
+  };
+  static constexpr std::uint64_t kMostOfAKind = 1000;
+
   Secret out;
-  std::vector<std::string> messages;
+  std::vector<Message> messages;
   Tally tally;
   ExitCode exitCode = kSuccess;  // of the first problem
   std::unique_ptr<Gathered> gathered;
@@ -36,17 +43,19 @@ struct Part {
 
 struct ExportOptions {
   std::string in = "-";                 // "-" for standard input
-  std::vector<std::string> attributes;  // none: userPassword
+  std::vector<std::string> attributes;  // none: those of AttributeSet
   std::vector<std::string> others;      // attributes that hold no passwords and are stopped at all the same
   unsigned threads = 0;                 // 0: one a processor
   bool resultsOnStdout = false;         // the progress line stays away from them
 };
 
-// Opens the export, and the library that its lines need. Throws Failure.
+// Opens the export, compressed or not, and the library that its lines need. Throws Failure.
 Input openExport(const ExportOptions& options);
 
 // work runs on many threads at once; deliver, and all reporting, on one at a time, in order. An exception of either
 // ends all and leaves runExport. Returns the sum of the parts, without their output, messages and what was gathered.
+// Lines that belong to no entry are reported here, and what is odd about the export as a whole; one without entries is
+// a Failure (kBadValue).
 Part runExport(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
                const std::function<void(const Part& part)>& deliver);
 

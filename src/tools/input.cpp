@@ -13,7 +13,34 @@
 namespace tool {
 namespace {
 
+using namespace std::string_view_literals;
+
 constexpr std::size_t kReadBytes = std::size_t{1} << 16;
+constexpr std::size_t kMarkBytes = 4;  // the longest beginning of kMarks
+
+// What begins like this is no LDIF.
+constexpr struct {
+  std::string_view mark;
+  const char* text;
+} kMarks[] = {
+    {"\xFF\xFE"sv, "UTF-16 text (iconv -f UTF-16 -t UTF-8 turns it into UTF-8)"},
+    {"\xFE\xFF"sv, "UTF-16 text (iconv -f UTF-16 -t UTF-8 turns it into UTF-8)"},
+    {"\xFD"
+     "7zX"sv,
+     "compressed by xz (xz -dc decompresses it)"},
+    {"BZh"sv, "compressed by bzip2 (bzip2 -dc decompresses it)"},
+    {"PK\x03\x04"sv, "a zip archive"},
+    {"\x1F\x8B"sv, "compressed twice"},
+    {"\x28\xB5\x2F\xFD"sv, "compressed twice"},
+};
+
+// What text that is not LDIF can be taken for.
+const char* kindOfText(std::string_view text) noexcept {
+  const std::size_t start = text.find_first_not_of(" \t\r\n");
+  if (start == std::string_view::npos) return text.empty() ? "empty" : "blank";
+  const char first = text[start];
+  return first == '<' ? "XML or HTML" : first == '{' || first == '[' ? "JSON" : "text of another kind";
+}
 
 }  // namespace
 
@@ -25,7 +52,7 @@ int Input::fd() const noexcept {
   return file_.valid() ? file_.get() : STDIN_FILENO;
 }
 
-bool Input::more(Secret& buffer, std::size_t bytes) {
+bool Input::readOnce(Secret& buffer, std::size_t bytes) {
   const std::size_t before = buffer.size();
   buffer.resize(before + bytes);
   ssize_t count = 0;
@@ -34,7 +61,57 @@ bool Input::more(Secret& buffer, std::size_t bytes) {
   } while (count < 0 && errno == EINTR);
   if (count < 0) throw ioFailure(name_);
   buffer.resize(before + static_cast<std::size_t>(count));
+  bytesRead_ += static_cast<std::uint64_t>(count);
   return count > 0;
+}
+
+bool Input::decodeMore(Secret& buffer, std::size_t bytes) {
+  const std::size_t before = buffer.size();
+  for (;;) {
+    std::string_view rest = raw_.view().substr(rawAt_);
+    try {
+      decompressor_->decode(rest, buffer, bytes);
+    } catch (const Failure& failure) {
+      throw Failure(failure.code(), name_ + ": " + failure.what());
+    }
+    rawAt_ = raw_.size() - rest.size();
+    if (buffer.size() > before) return true;
+    if (!rest.empty()) continue;
+    raw_.clear();
+    rawAt_ = 0;
+    if (readOnce(raw_, kReadBytes)) continue;
+    if (decompressor_->complete()) return false;
+    throw Failure(kIoError, name_ + ": the compressed data ends too early");
+  }
+}
+
+bool Input::more(Secret& buffer, std::size_t bytes) {
+  if (!ahead_.empty()) {
+    buffer.append(ahead_.view());
+    ahead_.clear();
+    return true;
+  }
+  return decompressor_ ? decodeMore(buffer, bytes) : readOnce(buffer, bytes);
+}
+
+void Input::requireText() {
+  while (raw_.size() < kMarkBytes && readOnce(raw_, kFirstBytes - kMarkBytes)) {
+  }
+  decompressor_ = decompressorFor(raw_.view());
+  if (!decompressor_) std::swap(ahead_, raw_);
+  while (decompressor_ && ahead_.size() < kMarkBytes && decodeMore(ahead_, kFirstBytes - kMarkBytes)) {
+  }
+  const std::string_view text = ahead_.view();
+  seems_ = kindOfText(text);
+  for (const auto& row : kMarks) {
+    if (text.substr(0, row.mark.size()) == row.mark) {
+      throw Failure(kBadValue, name_ + " is no LDIF: it seems to be " + row.text);
+    }
+  }
+  const std::size_t zero = text.find('\0');
+  if (zero == std::string_view::npos) return;
+  const bool wide = zero < 2 && text.size() > 3 && text[zero + 2] == '\0';
+  throw Failure(kBadValue, name_ + " is no LDIF: it seems to be " + (wide ? kMarks[0].text : "binary"));
 }
 
 bool LineReader::lineBuffered() const noexcept {

@@ -4,9 +4,11 @@
 #define LDAPPW_TOOLS_INPUT_H
 
 #include <cstddef>
+#include <cstdint>
 #include <string>
 #include <utility>
 
+#include "decompress.h"
 #include "descriptor.h"
 #include "secret.h"
 
@@ -21,12 +23,31 @@ class Input {
   int fd() const noexcept;
   const std::string& name() const noexcept { return name_; }  // for messages
 
-  // Appends what one read of at most so many bytes delivers; false at the end of the input.
+  // Appends what one read of at most so many bytes delivers, kFirstBytes at least; false at the end of the input.
   bool more(Secret& buffer, std::size_t bytes);
 
+  // Looks at the beginning: a compressed input is decoded from now on, and the content has to be text. Throws Failure
+  // (kBadValue) that says what it seems to be otherwise.
+  void requireText();
+  // What the content seems to be, judged by its beginning.
+  const char* seems() const noexcept { return seems_; }
+  // Of the file, as far as it has been read: where it is compressed, not those of its content.
+  std::uint64_t bytesRead() const noexcept { return bytesRead_; }
+
  private:
+  static constexpr std::size_t kFirstBytes = 4096;
+
+  bool readOnce(Secret& buffer, std::size_t bytes);
+  bool decodeMore(Secret& buffer, std::size_t bytes);
+
   Descriptor file_;
   std::string name_;
+  std::unique_ptr<Decompressor> decompressor_;
+  Secret ahead_;  // of the content
+  Secret raw_;    // of the file, not decoded yet from rawAt_ on
+  std::size_t rawAt_ = 0;
+  std::uint64_t bytesRead_ = 0;
+  const char* seems_ = "text";
 };
 
 // Splits an input into lines. The newline is no part of a line, a carriage return stays, and a last line without a

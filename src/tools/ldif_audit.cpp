@@ -10,11 +10,12 @@ namespace tool {
 namespace {
 
 // Totals; the conditions follow the last one. Columns by scheme.
-enum Total : std::size_t { kValues, kUrls, kDeleted, kFirstCondition };
+enum Total : std::size_t { kValues, kUrls, kDeleted, kAuthPasswords, kFirstCondition };
 enum Column : std::size_t { kAll, kOpened, kNotText, kUnopened };
 static_assert(kFirstCondition + kConditionCount <= Tally::kTotals);
 
-constexpr CountName kTotalNames[] = {{"values", "values"}, {"urls", "behind a URL"}, {"deleted", "to be deleted"}};
+constexpr CountName kTotalNames[] = {
+    {"values", "values"}, {"urls", "behind a URL"}, {"deleted", "to be deleted"}, {"authPasswords", "of authPassword"}};
 constexpr CountName kColumnNames[] = {
     {"values", "values"}, {"opened", "opened"}, {"notText", "not text"}, {"unopened", "unopened"}};
 
@@ -56,9 +57,11 @@ Verdict auditLine(const PasswordLine& password, const KeyRecord& keys, bool allo
   ++tally.totals[kValues];
   if (password.form == ValueForm::kBytes) return auditValue(StoredValue(password.value), keys, allowBinary, tally);
   if (password.form == ValueForm::kBroken) return {"unknown", Condition::kBroken, password.problem};
-  const bool url = password.form == ValueForm::kUrl;
-  ++tally.totals[url ? kUrls : kDeleted];
-  return {url ? "url" : "deleted", Condition::kFine, ""};
+  constexpr Total kKept[] = {kValues, kUrls, kDeleted, kAuthPasswords};
+  constexpr const char* kKinds[] = {"", "url", "deleted", "authPassword"};
+  const auto form = static_cast<std::size_t>(password.form);
+  ++tally.totals[kKept[form]];
+  return {kKinds[form], Condition::kFine, ""};
 }
 
 void appendText(const RecordWalker& walker, const Verdict& verdict, Secret& out) {
@@ -118,6 +121,7 @@ void writeTable(const Tally& tally, Results& results) {
     const std::uint64_t count = tally.totals[kFirstCondition + i];
     if (count > 0) write({kConditions[i].name, kConditions[i].text}, count, "finding: ");
   }
+  if (tally.outside > 0) write({"outside", kOutsideText}, tally.outside, "finding: ");
 }
 
 void writeObject(const Tally& tally, Results& results) {
@@ -134,7 +138,7 @@ void writeObject(const Tally& tally, Results& results) {
   for (std::size_t i = 1; i < kConditionCount; ++i) {
     json.number(kConditions[i].name, tally.totals[kFirstCondition + i]);
   }
-  results.line(json.close().end());
+  results.line(json.number("outside", tally.outside).close().end());
 }
 
 }  // namespace

@@ -6,7 +6,11 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <functional>
 #include <optional>
+#include <unordered_map>
+#include <utility>
 
 #include "condition.h"
 #include "messages.h"
@@ -27,17 +31,32 @@ enum Total : std::size_t {
   kOneWay,
   kUrls,
   kDeleted,
+  kAuthPasswords,
+  kFixed,
+  kDropped,
+  kLocked,
+  kWrapped,
   kUnknownTags,
   kMalformed,
   kFailed
 };
 
 constexpr CountName kNames[] = {
-    {"values", "password values"},         {"made", "converted"},
-    {"cut", "of these cut by the scheme"}, {"asTheyAre", "clear already, kept"},
-    {"oneWay", "one-way, kept"},           {"urls", "behind a URL, kept"},
-    {"deleted", "to be deleted, kept"},    {"unknownTags", "with an unknown tag, kept"},
-    {"malformed", "malformed, kept"},      {"failed", "failed, kept"},
+    {"values", "password values"},
+    {"made", "converted"},
+    {"cut", "of these cut by the scheme"},
+    {"asTheyAre", "clear already, kept"},
+    {"oneWay", "one-way, kept"},
+    {"urls", "behind a URL, kept"},
+    {"deleted", "to be deleted, kept"},
+    {"authPasswords", "of authPassword, kept"},
+    {"fixed", "unwrapped and one-way"},
+    {"dropped", "equal to another value of the entry, dropped"},
+    {"locked", "locked, kept"},
+    {"wrapped", "padded or encoded, kept"},
+    {"unknownTags", "with an unknown tag, kept"},
+    {"malformed", "malformed, kept"},
+    {"failed", "failed, kept"},
 };
 
 struct Conversion {
@@ -45,6 +64,7 @@ struct Conversion {
   KeyRecord oldKeys;
   KeyRecord newKeys;
   bool allowBinary;
+  bool fix;
 };
 
 // What became of one value, and the problem if there is one.
@@ -74,9 +94,13 @@ Status makeTarget(const Secret& clear, const Conversion& conversion, Secret& mad
 Outcome convertValue(const Secret& whole, const Conversion& conversion, Secret& made) {
   const StoredValue value(whole);
   const Scheme& source = value.scheme();
+  const ConditionText& condition = textOf(conditionOf(value, value.problem()));
+  const Wrapping wrapping = wrappingOf(value);
   if (source.kind == Kind::kUnknown) return {kUnknownTags, {kBadValue, "unknown tag; the value is kept"}};
+  if (wrapping != Wrapping::kNone) {
+    return {wrapping == Wrapping::kLocked ? kLocked : kWrapped, {condition.code, condition.text}};
+  }
   if (source.kind == Kind::kOneWay) {
-    const ConditionText& condition = textOf(conditionOf(value, value.problem()));
     return {condition.code == kSuccess ? kOneWay : kMalformed, {condition.code, condition.text}};
   }
   if (source.isClear() && conversion.target.isClear()) return {kAsTheyAre, {}};
@@ -87,29 +111,75 @@ Outcome convertValue(const Secret& whole, const Conversion& conversion, Secret& 
   return {conversion.target.cuts(clear.size()) ? kCut : kMade, {}};
 }
 
-Outcome outcomeOf(const PasswordLine& password, const Conversion& conversion, Secret& made) {
-  if (password.form == ValueForm::kBytes) return convertValue(password.value, conversion, made);
-  if (password.form == ValueForm::kBroken) return {kFailed, {kBadValue, password.problem}};
-  return {password.form == ValueForm::kUrl ? kUrls : kDeleted, {}};
+// What is within a padded or encoded value takes its place, converted where it can be.
+Outcome fixValue(const Secret& whole, const Conversion& conversion, Secret& made) {
+  const Wrapping wrapping = wrappingOf(StoredValue(whole));
+  if (!conversion.fix || wrapping == Wrapping::kNone || wrapping == Wrapping::kLocked) {
+    return convertValue(whole, conversion, made);
+  }
+  Secret inner = unwrapped(whole, wrapping);
+  const Outcome outcome = convertValue(inner, conversion, made);
+  if (outcome.total != kOneWay && outcome.total != kAsTheyAre) return outcome;
+  made = std::move(inner);
+  return {kFixed, {}};
 }
 
-void convertLine(const RecordWalker& walker, const Conversion& conversion, Part& part) {
+Outcome outcomeOf(const PasswordLine& password, const Conversion& conversion, Secret& made) {
+  constexpr Total kKept[] = {kMade, kUrls, kDeleted, kAuthPasswords};
+  if (password.form == ValueForm::kBytes) return fixValue(password.value, conversion, made);
+  if (password.form == ValueForm::kBroken) return {kFailed, {kBadValue, password.problem}};
+  return {kKept[static_cast<std::size_t>(password.form)], {}};
+}
+
+// The values that the lines of one entry have come to. Servers refuse an entry with two equal ones.
+class EntryValues {
+ public:
+  // True when an equal value stands in the entry already and one of the two is new.
+  bool repeats(const RecordWalker& walker, const Secret& value, bool changed) {
+    if (group_ != walker.group()) values_.clear();
+    group_ = walker.group();
+    const std::string& name = walker.password().description;
+    const std::size_t hash = std::hash<std::string_view>()(value.view());
+    const auto equal = values_.equal_range(hash);
+    const bool found = std::any_of(equal.first, equal.second, [&](const auto& row) {
+      const Value& other = row.second;
+      return (changed || other.changed) && sameName(other.name, name) && other.value.view() == value.view();
+    });
+    if (!found) values_.emplace(hash, Value{name, Secret(value.view()), changed});
+    return found;
+  }
+
+ private:
+  struct Value {
+    std::string name;
+    Secret value;
+    bool changed;
+  };
+  std::unordered_multimap<std::size_t, Value> values_;
+  std::uint64_t group_ = 0;
+};
+
+void convertLine(const RecordWalker& walker, const Conversion& conversion, EntryValues& values, Part& part) {
   Secret made;
-  const Outcome outcome = outcomeOf(walker.password(), conversion, made);
+  const PasswordLine& password = walker.password();
+  const Outcome outcome = outcomeOf(password, conversion, made);
+  const bool changed = outcome.total == kMade || outcome.total == kCut || outcome.total == kFixed;
   ++part.tally.totals[kValues];
+  if (!outcome.status.ok()) part.report(walker.lineNumber(), walker.dn(), outcome.status.code, outcome.status.text);
+  const Secret whole = password.whole(changed ? made : password.value);
+  if (password.form == ValueForm::kBytes && values.repeats(walker, whole, changed)) {
+    ++part.tally.totals[kDropped];
+    return;
+  }
   ++part.tally.totals[outcome.total];
   if (outcome.total == kCut) ++part.tally.totals[kMade];
-  if (!outcome.status.ok()) part.report(walker.lineNumber(), walker.dn(), outcome.status.code, outcome.status.text);
-  if (outcome.total == kMade || outcome.total == kCut) {
-    writeChanged(walker.line(), walker.password().description, made, part.out);
-  } else {
-    part.out.append(walker.line().raw);
-  }
+  changed ? writeChanged(walker.line(), password.description, whole, part.out) : part.out.append(walker.line().raw);
 }
 
 void convertBatch(RecordWalker& walker, const Conversion& conversion, Part& part) {
+  EntryValues values;
   while (walker.next()) {
-    walker.atPassword() ? convertLine(walker, conversion, part) : part.out.append(walker.line().raw);
+    walker.atPassword() ? convertLine(walker, conversion, values, part) : part.out.append(walker.line().raw);
   }
 }
 
@@ -157,7 +227,7 @@ ExitCode convertExport(const LdifOptions& options) {
   const Scheme& target = targetOf(options);
   requireProvider();
   const Conversion conversion{target, KeyRecord::load(options.keys), KeyRecord::load(options.newKeys),
-                              options.allowBinary};
+                              options.allowBinary, options.fix};
   Input input = openExport(options.source);
   std::optional<OutputFile> file;
   if (options.out != "-") file.emplace(options.out, modeFor(options.out), options.force);

@@ -39,6 +39,7 @@ void foldInto(std::string_view text, std::string_view lineEnd, Secret& out);
 struct Batch {
   std::uint64_t number = 0;
   std::uint64_t firstLine = 1;
+  std::uint64_t inputBytes = 0;  // how far the file had been read
   Secret text;
 };
 

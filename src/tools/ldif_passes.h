@@ -16,6 +16,7 @@ struct LdifOptions {
   std::string newKeys;
   std::string out = "-";
   bool audit = false;
+  bool fix = false;  // values that are padded or encoded once more are unwrapped
   bool force = false;
   bool allowClear = false;
   bool allowBinary = false;  // what opens into bytes that are not text is taken for right

@@ -3,6 +3,9 @@
 // checked first, because a value that two readers take differently must not be replaced.
 #include "ldif_record.h"
 
+#include <iterator>
+
+#include "failure.h"
 #include "ldif_library.h"
 #include "text.h"
 
@@ -10,6 +13,60 @@ namespace tool {
 namespace {
 
 constexpr std::size_t kNone = std::string_view::npos;
+constexpr std::string_view kMark = "\xEF\xBB\xBF";  // a byte order mark
+
+// userPassword by name and number, the passwords that it had before, those of slapd's and 389's own administrators, and
+// the attribute of RFC 3112.
+constexpr const char* kDefaultNames[] = {"userPassword", "2.5.4.35",       "pwdHistory",
+                                         "olcRootPW",    "nsslapd-rootpw", "authPassword"};
+
+constexpr std::string_view kNameCharacters = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-";
+constexpr std::size_t kLetters = 52;
+constexpr std::string_view kDigits = kNameCharacters.substr(kLetters, 10);
+
+std::string_view typeOf(std::string_view description) noexcept {
+  return trimSpaces(description.substr(0, description.find(';')));
+}
+
+// Cuts the part before the next separator off the text.
+std::string_view takePart(std::string_view& text, char separator) noexcept {
+  const std::size_t end = text.find(separator);
+  const std::string_view part = text.substr(0, end);
+  text.remove_prefix(end == kNone ? text.size() : end + 1);
+  return part;
+}
+
+bool hasOptions(std::string_view description, std::string_view wanted) noexcept {
+  takePart(wanted, ';');
+  while (!wanted.empty()) {
+    const std::string_view option = takePart(wanted, ';');
+    std::string_view rest = description;
+    takePart(rest, ';');
+    bool found = false;
+    while (!found && !rest.empty()) found = sameName(trimSpaces(takePart(rest, ';')), option);
+    if (!found) return false;
+  }
+  return true;
+}
+
+bool isWord(std::string_view text, std::string_view characters) noexcept {
+  return !text.empty() && text.find_first_not_of(characters) == kNone;
+}
+
+// RFC 4512, section 2.5: a name or a dotted number, and options.
+bool isDescription(std::string_view text) noexcept {
+  std::string_view type = text.substr(0, text.find(';'));
+  const bool named = isWord(type, kNameCharacters) && isWord(type.substr(0, 1), kNameCharacters.substr(0, kLetters));
+  if (!named && (type.empty() || type.back() == '.' || type.find('.') == kNone)) return false;
+  while (!named && !type.empty()) {
+    if (!isWord(takePart(type, '.'), kDigits)) return false;
+  }
+  if (text.back() == ';') return false;
+  for (takePart(text, ';'); !text.empty();) {
+    if (!isWord(takePart(text, ';'), kNameCharacters)) return false;
+  }
+  return true;
+}
 
 // Why the text behind "attribute:" is not to be taken for a value, or null.
 const char* valueProblem(std::string_view text) noexcept {
@@ -38,29 +95,52 @@ bool parseValue(Secret& text, Secret& value) {
 
 }  // namespace
 
-AttributeSet::AttributeSet(std::vector<std::string> names, const std::vector<std::string>& others)
-    : names_(std::move(names)) {
-  if (names_.empty()) names_ = {"userPassword", "2.5.4.35"};
+AttributeSet::AttributeSet(const std::vector<std::string>& names, const std::vector<std::string>& others)
+    : names_(names.empty() ? std::vector<std::string>(std::begin(kDefaultNames), std::end(kDefaultNames)) : names),
+      given_(names.size()) {
+  for (const std::string& name : names_) {
+    if (!isDescription(name)) throw Failure(kUsage, "'" + name + "' is no attribute description");
+  }
   names_.insert(names_.end(), others.begin(), others.end());
+  if (names_.size() > kMost) throw Failure(kUsage, "more than " + std::to_string(kMost) + " attributes are given");
 }
 
-bool AttributeSet::matches(std::string_view description) const noexcept {
-  const std::string_view type = trimSpaces(description.substr(0, description.find(';')));
-  for (const std::string& name : names_) {
-    if (sameName(type, name)) return true;
+std::size_t AttributeSet::find(std::string_view description) const noexcept {
+  const std::string_view type = typeOf(description);
+  for (std::size_t i = 0; i < names_.size(); ++i) {
+    const std::string_view name = names_[i];
+    if (sameName(type, typeOf(name)) && hasOptions(description, name)) return i;
   }
-  return false;
+  return kNone;
+}
+
+Secret PasswordLine::whole(const Secret& changed) const {
+  Secret text(history);
+  if (!history.empty()) text.append(std::to_string(changed.size()) + "#");
+  text.append(changed.view());
+  return text;
 }
 
 void RecordWalker::startRecord() noexcept {
   dn_.clear();
-  modify_ = inBlock_ = deleting_ = false;
+  ++group_;
+  inEntry_ = strayed_ = modify_ = inBlock_ = deleting_ = false;
+}
+
+// Outside an entry its dn is awaited, and the lines that frame an export or the answer to a search are let through.
+bool RecordWalker::beginsEntry(std::string_view name) {
+  if (sameName(name, "dn")) return inEntry_ = true;
+  const bool frame = sameName(name, "version") || sameName(name, "search") || sameName(name, "result");
+  if (!frame && !strayed_) outside_.push_back(lineNumber_);
+  strayed_ = strayed_ || !frame;
+  return false;
 }
 
 // Most lines are found to be none of ours without undoing their folding.
 bool RecordWalker::matters(std::string_view description) const noexcept {
   const std::string_view name = trimSpaces(description);
-  return modify_ || attributes_.matches(name) || sameName(name, "dn") || sameName(name, "changetype");
+  return !inEntry_ || modify_ || attributes_.find(name) != AttributeSet::kNone || sameName(name, "dn") ||
+         sameName(name, "changetype");
 }
 
 void RecordWalker::readName(std::string_view text) {
@@ -89,7 +169,31 @@ void RecordWalker::readPassword(std::string_view description) {
   unfold(line_, text_);
   password_.description.assign(description);
   password_.problem = "";
-  password_.form = readValue(text_.view().substr(description.size() + 1));
+  password_.history.clear();
+  password_.form = readValue(text_.view().substr(text_.view().find(':') + 1));
+  if (password_.form == ValueForm::kBytes) password_.form = readFields(typeOf(description));
+}
+
+// Attributes whose values have fields.
+ValueForm RecordWalker::readFields(std::string_view type) {
+  std::string_view rest = password_.value.view();
+  if (sameName(type, "authPassword")) {
+    takePart(rest, '$');
+    if (rest.find('$') != kNone) return ValueForm::kAuthPassword;
+    password_.problem = "the value is not of the form scheme$info$value";
+    return ValueForm::kBroken;
+  }
+  if (!sameName(type, "pwdHistory")) return ValueForm::kBytes;
+  takePart(rest, '#');
+  takePart(rest, '#');
+  password_.history.assign(password_.value.view().substr(0, password_.value.size() - rest.size()));
+  const std::string_view length = takePart(rest, '#');
+  if (length != std::to_string(rest.size())) {
+    password_.problem = "the value is not of the form time#syntax#length#password";
+    return ValueForm::kBroken;
+  }
+  password_.value = Secret(rest);
+  return ValueForm::kBytes;
 }
 
 ValueForm RecordWalker::readValue(std::string_view text) {
@@ -107,23 +211,32 @@ bool RecordWalker::next() {
   lineNumber_ = nextLineNumber_;
   nextLineNumber_ += line_.physicalLines;
   if (line_.blank()) startRecord();
-  if (line_.blank() || line_.first.front() == '#' || line_.first.front() == ' ') return true;
   std::string_view text = line_.first;
+  if (lineNumber_ == 1 && text.substr(0, kMark.size()) == kMark) text.remove_prefix(kMark.size());
+  if (text.empty() || text.front() == '#') return true;
   std::size_t colon = text.find(':');
   if (colon != kNone && !matters(text.substr(0, colon))) return true;
   Secret whole;
   if (line_.folded()) {  // a fold can stand anywhere, within the name of an attribute too
     unfold(line_, whole);
-    text = whole.view();
+    text = whole.view().substr(static_cast<std::size_t>(text.data() - line_.first.data()));
     colon = text.find(':');
   }
+  const std::string_view name = text.substr(0, colon);
+  if (!inEntry_ && !beginsEntry(trimSpaces(name))) return true;
   if (colon == kNone) {
-    if (text == "-") inBlock_ = false;
-  } else if (attributes_.matches(text.substr(0, colon))) {
-    readPassword(text.substr(0, colon));
-  } else {
-    readControl(trimSpaces(text.substr(0, colon)), text.substr(colon + 1));
+    if (text != "-") return true;
+    inBlock_ = false;
+    ++group_;
+    return true;
   }
+  const std::size_t found = attributes_.find(name);
+  if (found == AttributeSet::kNone) {
+    readControl(trimSpaces(name), text.substr(colon + 1));
+    return true;
+  }
+  seen_ |= std::uint64_t{1} << found;
+  readPassword(name);
   return true;
 }
 

@@ -14,23 +14,33 @@
 
 namespace tool {
 
-// The attributes whose values are passwords. A description matches by its type: "userPassword;x-tag" is userPassword.
+// The attributes whose values are passwords. A name covers what has its type and at least its options: "userPassword"
+// covers "userPassword;x-tag".
 class AttributeSet {
  public:
-  // No names mean userPassword, which is also known as 2.5.4.35.
-  // others are covered as well.
-  explicit AttributeSet(std::vector<std::string> names, const std::vector<std::string>& others = {});
-  bool matches(std::string_view description) const noexcept;
+  static constexpr std::size_t kMost = 64;  // names
+  static constexpr std::size_t kNone = kMost;
+
+  // No names mean those that servers keep passwords in; others are covered as well. Throws Failure (kUsage) for a text
+  // that is no attribute description (RFC 4512, section 2.5), and for too many.
+  explicit AttributeSet(const std::vector<std::string>& names, const std::vector<std::string>& others = {});
+  // The place of the name that covers the description, or kNone.
+  std::size_t find(std::string_view description) const noexcept;
+  const std::string& name(std::size_t place) const { return names_[place]; }
+  // How many of the first are names that were given, not those that are meant without any.
+  std::size_t given() const noexcept { return given_; }
 
  private:
   std::vector<std::string> names_;
+  std::size_t given_;
 };
 
 enum class ValueForm {
-  kBytes,    // the value is there
-  kUrl,      // "attribute:< url": the value is elsewhere
-  kDeleted,  // in a delete block of a change record, where it names what is stored and must stay what it is
-  kBroken    // not what RFC 2849 allows; problem says why
+  kBytes,         // the value is there
+  kUrl,           // "attribute:< url": the value is elsewhere
+  kDeleted,       // in a delete block of a change record, where it names what is stored and must stay what it is
+  kAuthPassword,  // a value of authPassword, "scheme$info$value" (RFC 3112): one-way, under schemes of its own
+  kBroken         // not what RFC 2849 or the attribute allows; problem says why
 };
 
 // One line of a wanted attribute.
@@ -38,7 +48,11 @@ struct PasswordLine {
   ValueForm form = ValueForm::kBroken;
   const char* problem = "";
   std::string description;  // the attribute and its options as spelt
-  Secret value;             // of kBytes
+  std::string history;      // of a pwdHistory value: its first two fields, "time#syntax#"
+  Secret value;             // of kBytes; of a pwdHistory value the last field
+
+  // What stands in the entry when value becomes this one.
+  Secret whole(const Secret& changed) const;
 };
 
 // Walks over a batch. Views stay valid until the next step.
@@ -57,25 +71,38 @@ class RecordWalker {
   const std::string& dn() const noexcept { return dn_; }  // decoded; empty when the record has none
   std::uint64_t entries() const noexcept { return entries_; }
   bool modifies() const noexcept { return modify_; }  // the record changes an entry and does not describe it
+  // Counts the entries, and the blocks of change records: equal values within one are refused by servers.
+  std::uint64_t group() const noexcept { return group_; }
+  // The first of each run of lines that belong to no entry; none of them is looked at for passwords.
+  const std::vector<std::uint64_t>& outside() const noexcept { return outside_; }
+  // A bit for each name of the attributes that has occurred.
+  std::uint64_t seen() const noexcept { return seen_; }
 
  private:
   void startRecord() noexcept;
+  bool beginsEntry(std::string_view name);
   bool matters(std::string_view description) const noexcept;
   void readControl(std::string_view name, std::string_view text);
   void readName(std::string_view text);
   void readPassword(std::string_view description);
   ValueForm readValue(std::string_view text);
+  ValueForm readFields(std::string_view type);
 
   std::string_view rest_;
   const AttributeSet& attributes_;
   std::uint64_t nextLineNumber_;
   std::uint64_t lineNumber_ = 0;
   std::uint64_t entries_ = 0;
+  std::uint64_t group_ = 0;
+  std::uint64_t seen_ = 0;
+  std::vector<std::uint64_t> outside_;
   LogicalLine line_;
   Secret text_;
   std::string dn_;
   PasswordLine password_;
   bool atPassword_ = false;
+  bool inEntry_ = false;   // the record has begun with its dn
+  bool strayed_ = false;   // it has begun with something else, which has been noted
   bool modify_ = false;    // a record with "changetype: modify"
   bool inBlock_ = false;   // between "add: ..." and "-"
   bool deleting_ = false;  // the block is a "delete: ..." one

@@ -17,11 +17,12 @@
 namespace tool {
 
 struct Tally {
-  static constexpr std::size_t kTotals = 16;
+  static constexpr std::size_t kTotals = 24;
   static constexpr std::size_t kColumns = 6;
   using Row = std::array<std::uint64_t, kColumns>;
 
   std::uint64_t entries = 0;
+  std::uint64_t outside = 0;  // runs of lines that belong to no entry
   std::array<std::uint64_t, kTotals> totals{};
   std::vector<Row> schemes = std::vector<Row>(kSchemes.size() + kForeignSchemes.size());
 
@@ -29,6 +30,7 @@ struct Tally {
   const Row& of(const Scheme& scheme) const { return const_cast<Tally*>(this)->of(scheme); }
   void add(const Tally& part) noexcept {
     entries += part.entries;
+    outside += part.outside;
     addRow(totals, part.totals);
     for (std::size_t i = 0; i < schemes.size(); ++i) addRow(schemes[i], part.schemes[i]);
   }
