@@ -44,6 +44,7 @@ table=(
   "crypt variant|3|dn: a\nuserPassword: {crypt}\$6\$salt\$hash\n|="
   "damaged base64|3|dn: a\nuserPassword:: c2Vjc*\n|="
   "base64 after the padding|3|dn: a\nuserPassword:: YQ==YQ==\n|="
+  "blank after base64|3|dn: a\nuserPassword:: YWJj \n|="
   "NUL byte|3|dn: a\nuserPassword:: YQBi\n|="
   "leading tab|3|dn: a\nuserPassword: \tsecret\n|="
   "carriage return within|3|dn: a\nuserPassword: sec\rret\n|="
@@ -193,7 +194,8 @@ clear without leave|2||ldif --to clear --in sample
 no new keys|2||ldif --to aes128 --keys A --in sample
 audit with output|2||ldif --audit --out x --in sample
 audit with new keys|2||ldif --audit --new-keys A --in sample
-JSON among the export|2||ldif --to sha --json --in sample
+JSON among the export|2|.*"code":2\}|ldif --to sha --json --in sample
+the same keys|2||ldif --to aes256 --keys A --new-keys A --in sample
 no threads|2||ldif --to sha --threads 0 --in sample
 words for threads|2||ldif --to sha --threads two --in sample
 missing export|5||ldif --to sha --in none
@@ -231,6 +233,11 @@ sameFile 'the old output after runs that failed' kept old
 run 'the input as output' 0 ldif --to sha --in old --out old --force
 sameFile 'the input as output' one old
 same 'mode of a file that is replaced' 640 "$(mode old)"
+acl() { python3 -c 'import os, sys; print(os.getxattr(sys.argv[1], "system.posix_acl_access").hex())' "$1"; }
+if python3 -c 'import os, struct; os.setxattr("old", "system.posix_acl_access", struct.pack("<I", 2) + b"".join(struct.pack(
+  "<HHI", *row) for row in ((1, 6, 2**32 - 1), (2, 4, 65534), (4, 4, 2**32 - 1), (16, 4, 2**32 - 1), (32, 0, 2**32 - 1))))' 2>err; then
+  list=$(acl old); run 'an access list' 0 ldif --to sha --in old --out old --force; same 'an access list' "$list" "$(acl old)"
+fi
 printf 'dn: a\nuserPassword: {Z}\n' >in
 "$tool" ldif --to sha --in in --out closed <&- 2>&-
 same 'closed descriptors' 3 $?

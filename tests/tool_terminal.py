@@ -91,7 +91,7 @@ class Terminal:
 
 
 def stored(password):
-    return subprocess.run([TOOL, "format", "--scheme", "ssha"], input=password + b"\n", check=True,
+    return subprocess.run([TOOL, "format", "--scheme", "ssha", "--allow-empty"], input=password + b"\n", check=True,
                           capture_output=True).stdout.decode().strip()
 
 
@@ -142,11 +142,14 @@ def create_keys(second, expected):
 
 
 def format_one():
-    """One password is asked for, and its value shown."""
-    with Terminal("format", "--scheme", "sha") as terminal:
-        terminal.asks(b"Password: ")
-        terminal.type(b"secret\n")
-        assert terminal.end() == (0, (True, True)) and b"{SHA}5en6G6MezRroT3XKqkdPOmY/BfQ=" in terminal.seen
+    """One password is asked for twice, and its value shown."""
+    for typed, again, code, shown in ((b"secret", b"secret", 0, b"{SHA}5en6G6MezRroT3XKqkdPOmY/BfQ="),
+                                      (b"secret", b"secreT", 2, b"the second password"), (b"", b"", 3, b"is empty")):
+        with Terminal("format", "--scheme", "sha") as terminal:
+            for prompt, answer in ((b"Password: ", typed), (b"Password again: ", again)):
+                terminal.asks(prompt)
+                terminal.type(answer + b"\n")
+            assert terminal.end() == (code, (True, True)) and shown in terminal.seen, terminal.seen
 
 
 def from_file():

@@ -41,8 +41,8 @@ restore long salt|3|$seed\n${salt}c\n|restore new
 check without --sync|2||check dir
 ROWS
 unsaid 'a refused seed' "$seed"
-(ulimit -f 0; check 'create on a full disk' 5 '' keys create --config cfg --directory dir --force <seed; exit $failures) \
-  2>/dev/null || fail 'full disk'
+same 'create on a full disk' "ldappw: $work/cfg: File too large"$'\n'5 \
+  "$(ulimit -f 0; "$tool" keys create --config cfg --directory dir --force 2>&1 <seed | cat; echo "${PIPESTATUS[0]}")"
 sync=$("$tool" keys show --json dir | sed 's/.*"sync":"\([^"]*\)".*/\1/')
 check 'restore other sync' 1 '' keys restore dir --force --expect-sync "${sync}x" < <(cat seed salt)
 sameFile 'refused or failed runs' dir.good dir
@@ -70,12 +70,12 @@ json 'show JSON' "d == [{'file': 'dir', 'sync': '$sync', 'salt': '$salt', 'keys'
   {'scheme': 'aes192', 'bytes': 24, 'fingerprint': '$(fingerprint 16 24)'},
   {'scheme': 'aes256', 'bytes': 32, 'fingerprint': '$(fingerprint 40 32)'}]}]"
 run 'create JSON' 0 keys create --config c3 --directory d3 --seed-file seed --json </dev/null
-json 'create JSON' "list(d[0]) == ['config', 'directory', 'sync', 'directory_sync', 'directory_salt']"
+json 'create JSON' "list(d[0]) == ['config', 'directory', 'sync', 'directorySync', 'directorySalt']"
 same 'the sync text is the configuration'"'"'s' "$("$tool" keys show c3 | sed -n 's/^sync: \(.*\) (.*/\1/p')" \
   "$(sed 's/.*"sync":"\([^"]*\).*/\1/' out)"
 ! cmp -s d3 dir || fail 'the salts that are drawn are the same'
 echo 0123456789aX >salt.other; head -c 100 dir >short; head -c 200 /dev/zero >zeros; chmod 600 short zeros; cp dir open
-chmod 640 open
+chmod 604 open
 rows <<ROWS
 check|0|match|keys check dir --sync "$sync" --salt-file salt
 check no sync|1|no match|keys check dir --sync other
@@ -88,6 +88,12 @@ folder as stash|5||keys show .
 open stash|0|match|keys check open --sync "$sync"
 ROWS
 said 'open stash' 'warning: open is open to other'
+chmod 640 open; run 'stash of its owner'"'"'s group' 0 keys show open; same 'stash of its group' '' "$(<err)"
+if [ $UID = 0 ]; then
+  chgrp daemon open
+  run 'stash of a foreign group' 0 keys show open; said 'stash of a foreign group' 'warning: open is open to its group'
+  run 'stash of the right group' 0 keys show open --keys-group daemon; same 'stash of the right group' '' "$(<err)"
+fi
 
 # A run that is stopped when both temporary files are complete: whatever ends it, the stash files stay what they were.
 preload() { HELD_SYNC=$1 LD_PRELOAD=$held ASAN_OPTIONS=${ASAN_OPTIONS:-}:verify_asan_link_order=0 "${@:2}"; }
@@ -129,7 +135,7 @@ passwords=('' a 12345678 123456789 "$(printf 'y%.0s' {1..46})" "$(printf 'z%.0s'
   ' blanks ' $'return\r' '{SSHA}abc' '{XYZ}' '>1abcdef<' '$(id)`"\')
 printf '%s\n' "${passwords[@]}" >passwords
 for scheme in sha ssha MD5 '{crypt}' qVEIL aes128 aes192 aes256; do
-  run "format $scheme" 0 format --scheme "$scheme" --keys dir --password-file passwords </dev/null
+  run "format $scheme" 0 format --scheme "$scheme" --allow-empty --keys dir --password-file passwords </dev/null
   mapfile -t values <out
   same "format $scheme" ${#passwords[@]} ${#values[@]}
   for i in "${!passwords[@]}"; do
@@ -169,7 +175,7 @@ ssha='{SSHA}'$(printf 'secretsalt' | openssl dgst -sha1 -binary | cat - <(printf
 newline=$(aes $'a\nb' 128 0)
 wrap=$(printf '%s' "$aesValue" | head -c -5)
 printf '%s\n' "$ssha" other >value; printf 'secret\nother\n' >password; echo wrong >wrong; echo '{sha}abc' >tagged
-printf 'a\0b\n' >nul; printf 'secret\n{SHA}x\n123456789\n' >three; echo 123456789 >nine; : >empty
+printf 'a\0b\n' >nul; printf 'secret\n{SHA}x\n123456789\n' >three; printf "%s\n" 123456789{,,} >nine; echo >blank; printf "secret\0xyz\n" >cut; printf "a\n\n\n\nb" >holes; : >empty
 printf '%s\n' secret "$ssha" "$masked" "{XYZ}a" >mixed; printf 'a\nb' >two
 rows <<'ROWS'
 foreign salt|0|match|verify "$ssha"
@@ -179,7 +185,7 @@ missing value file|5||verify --value-file none
 json match|0|\{"scheme":"ssha","match":true\}|verify --json "$ssha"
 json no match|1|\{"scheme":"ssha","match":false\}|verify --json "$ssha" --password-file wrong
 json no match, by opening|1|\{"scheme":"aes256","match":false\}|verify --json --keys dir "$aesValue" --password-file wrong
-json problem|3|\{"index":1,"error":"there is no payload","code":3\}|verify --json '{SHA}'
+json problem|3|\{"error":"there is no payload","code":3\}|verify --json '{SHA}'
 tag in another case|0|match|verify "{ssha}${ssha#*\}}"
 payload in another case|1|no match|verify "{SHA}${swapped}"
 masked without a tag, as the server takes it|1|no match|verify "${masked#*\}}"
@@ -211,7 +217,17 @@ missing key file|5||verify --keys none "$aesValue"
 a key file that is not needed|0|match|verify --keys none "$ssha"
 damaged key file|4||verify --keys short "$aesValue"
 no password|2||verify "$ssha" --password-file /dev/null
-no passwords|0||format --scheme sha --password-file /dev/null
+no passwords|2||format --scheme sha --password-file /dev/null
+an empty password|3||format --scheme md5 --password-file blank
+an empty password that may be|0|\{MD5\}1B2M2Y8AsgTpgAmY7PhCfg==|format --scheme md5 --allow-empty --password-file blank
+empty lines for what fails|3|\{MD5\}.{24}....\{MD5\}.{24}|format --scheme md5 --password-file holes
+NUL in a check|3||verify --password-file cut "$ssha"
+password from standard input by name|0|match|verify --password-file - "$ssha"
+a verb with a slip|2||fromat --scheme md5
+a key verb with a slip|2||keys crate
+a failure as JSON|5|\{"error":"none: No such file or directory","code":5\}|verify --json --keys none "$aesValue"
+no such group|2||keys show dir --keys-group no.such.group
+stash to standard output|2||keys restore - --seed-file seed --salt-file salt
 {SHA} password|3||format --scheme sha --password-file tagged
 NUL password|3||format --scheme ssha --password-file nul
 last line without newline|0|\{MD5\}.{24}.\{MD5\}.{24}|format --scheme md5 --password-file two
@@ -222,11 +238,11 @@ reveal unknown tag|3||reveal '{XYZ}a'
 reveal vldl|3||reveal '{VLDL}secret'
 reveal untagged|0|secret|reveal "${masked#*\}}"
 reveal without a key|4||reveal "$aesValue"
-first problem wins|4|secret|reveal --keys d2 "$aesValue" "$ssha" secret
+first problem wins|4|..secret|reveal --keys d2 "$aesValue" "$ssha" secret
 values like options and lists|0|.a,b..-x|reveal -- '[a,b]' -x
 newline in the password|3||reveal --keys dir "{AES128}$newline"
-newline in JSON|0|.*"password_base64":"YQpi"\}|reveal --json --keys dir "{AES128}$newline"
-bytes in JSON|0|.*"password_base64":"/w=="\}|reveal --json $'\xff'
+newline in JSON|0|.*"passwordBase64":"YQpi"\}|reveal --json --keys dir "{AES128}$newline"
+bytes in JSON|0|.*"passwordBase64":"/w=="\}|reveal --json $'\xff'
 JSON escapes|0|.*"password":"a\\"b\\\\\\u0001\\u007f\\u009bé"\}|reveal --json $'a"b\\\x01\x7f\xc2\x9bé'
 ROWS
 for arguments in 'hunter2' '--pass=hunter2' '-phunter2' '--pass hunter2' '--json=hunter2'; do
@@ -234,11 +250,35 @@ for arguments in 'hunter2' '--pass=hunter2' '-phunter2' '--pass hunter2' '--json
   unsaid "format $arguments" hunter2
 done
 run 'a cut' 0 format --scheme crypt --password-file nine </dev/null
-said 'a cut' 'warning: password 1 is cut: crypt takes its first 8 bytes'
+said 'a cut' 'warning: line 1: the password is cut: crypt takes the first 8 bytes'
+said 'the other cuts' '^ldappw: warning: 2 more: passwords cut'
+same 'the other cuts' 2 "$(grep -c cut err)"
+run 'stray bytes' 0 format --scheme md5 < <(printf '\xef\xbb\xbfa\r\nb\r\n')
+said 'stray bytes' '^ldappw: warning: standard input, line 1 begins with a byte order mark'
+said 'stray bytes' '^ldappw: warning: standard input, line 1 ends in a carriage return.*'
+said 'stray bytes' '^ldappw: warning: 1 more: with a carriage return'
+while IFS='|' read -r arguments text; do
+  run "$arguments" 2 $arguments </dev/null
+  said "$arguments" "^ldappw: $text$"
+done <<'ROWS'
+fromat --scheme md5|there is no verb fromat; did you mean format\?
+keys crate|there is no verb crate; did you mean create\?
+hunter2|there is no such verb \(--help lists them\)
+keys|a verb is missing \(--help lists them\)
+format -scheme md5|unknown option: -s
+--frob=hunter2 format|unknown option: --frob
+ROWS
+yes '{AES128}AAAAAAAAAAAAAAAAAAAAAA==' | head -1500 >many
+run 'many problems' 4 reveal <many
+same 'many problems' '1000 ldappw: 500 more: an AES value needs the key stash (--keys)' \
+  "$(grep -c '^ldappw: line ' err) $(grep more: err)"
+same 'results keep step' 1500 "$(wc -l <out)"
+mkfifo pipe; cat dir >pipe &
+check 'keys from a pipe' 0 match verify --keys pipe "$aesValue" <<<secret
 run 'a cut in a check' 1 verify --clear 123 < <(printf '%047d\n' 0)
 said 'a cut in a check' 'warning: with clear only the first 46 bytes'
-check 'reveal from standard input' 3 'secret.secret' reveal <mixed
-said 'the number of the value' '^ldappw: value 4: the tag is of no known scheme'
+check 'reveal from standard input' 3 'secret..secret' reveal <mixed
+said 'the number of the value' '^ldappw: line 4: the tag is of no known scheme'
 
 # ---- identify: value, columns ----
 rows=()
@@ -294,13 +334,13 @@ same 'identify: no more and no less' 0 ${#rows[@]}
 check 'identify well formed values' 0 'sha.*ssha.*' identify "$hidden" "$ssha"
 run 'identify JSON' 3 identify --json "$hidden" secret $'{X\e}a' '>hello there<'
 json 'identify JSON' "d == [
-  {'index': 1, 'scheme': 'sha', 'code': 2, 'kind': 'one-way', 'tag': '{SHA}', 'well_formed': True,
+  {'index': 1, 'scheme': 'sha', 'code': 2, 'kind': 'one-way', 'tag': '{SHA}', 'wellFormed': True,
    'strength': 'unsalted', 'writers': d[0]['writers']},
-  {'index': 2, 'scheme': 'clear', 'code': 1, 'kind': 'clear', 'tag': None, 'well_formed': True,
+  {'index': 2, 'scheme': 'clear', 'code': 1, 'kind': 'clear', 'tag': None, 'wellFormed': True,
    'strength': 'clear', 'writers': 'any'},
-  {'index': 3, 'scheme': None, 'code': 1, 'kind': 'unknown', 'tag': '{X\\\\x1B}', 'well_formed': False,
+  {'index': 3, 'scheme': None, 'code': 1, 'kind': 'unknown', 'tag': '{X\\\\x1B}', 'wellFormed': False,
    'problem': 'the tag is of no known scheme', 'strength': 'unknown', 'writers': ''},
-  {'index': 4, 'scheme': 'qveil', 'code': 128, 'kind': 'reversible', 'tag': None, 'well_formed': False,
+  {'index': 4, 'scheme': 'qveil', 'code': 128, 'kind': 'reversible', 'tag': None, 'wellFormed': False,
    'problem': d[3]['problem'], 'strength': 'reversible', 'writers': 'ldappw'}]"
 check 'NUL in the payload' 3 'sha.2.one-way.*NUL byte.unsalted' identify < <(printf '{SHA}a\0b\n')
 same 'identify lines' 100000 "$(yes '{MD5}Xr4ilOzQ4PCOq3aQ0qbuaQ==' | head -100000 | "$tool" identify | grep -c 'well formed')"

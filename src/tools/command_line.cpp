@@ -3,6 +3,7 @@
 #include "command_line.h"
 
 #include "input.h"
+#include "key_record.h"
 
 namespace tool {
 
@@ -16,6 +17,13 @@ CLI::Option* addPath(CLI::App& verb, const std::string& name, std::string& path,
   return verb.add_option(name, path, help)->type_name(name.front() == '-' ? "FILE" : "");
 }
 
+CLI::Option* addKeys(CLI::App& verb, const std::string& name, std::string& path, const std::string& help) {
+  verb.add_option_function<std::string>("--keys-group", allowKeysGroup,
+                                        "group that may read stash files; without it that of their owner")
+      ->type_name("GROUP");
+  return addPath(verb, name, path, help);
+}
+
 // A value list of the parser's own would split a value that is wrapped in brackets and drop "{}".
 CLI::Option* addValues(CLI::App& verb, const std::string& name, const std::string& help) {
   constexpr int kMany = 1 << 20;
@@ -24,17 +32,26 @@ CLI::Option* addValues(CLI::App& verb, const std::string& name, const std::strin
   return option->option_text("...");
 }
 
-void forEachValue(const CLI::Option& given, Results& results, const std::function<void(const Secret&)>& work) {
-  for (const std::string& value : given.results()) work(Secret(value));
+void forEachValue(const CLI::Option& given, Results& results, const ValueWork& work) {
+  std::size_t index = 0;
+  for (const std::string& value : given.results()) {
+    ++index;
+    work(Secret(value), index, "value " + std::to_string(index));
+  }
   if (given.empty()) {
     LineReader lines{Input()};
     Secret value;
     while (lines.next(value)) {
-      work(value);
+      ++index;
+      work(value, index, "line " + std::to_string(index));
       if (!lines.lineBuffered()) results.flush();
     }
   }
   results.flush();
+}
+
+void showProblem(bool json, const Status& status, std::size_t index, Results& results) {
+  results.line(json ? Json().number("index", index).problem(status).end() : "");
 }
 
 CLI::Option* addRefusedSecrets(CLI::App& verb, const std::string& name) {

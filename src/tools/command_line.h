@@ -36,12 +36,21 @@ void addVerb(CLI::App& app, const Verb& row, ExitCode& exitCode);
 // An option, or an argument, that takes a path.
 CLI::Option* addPath(CLI::App& verb, const std::string& name, std::string& path, const std::string& help);
 
+// --keys, or an argument in its place; and --keys-group.
+CLI::Option* addKeys(CLI::App& verb, const std::string& name, std::string& path, const std::string& help);
+
 // Any number of positional values.
 CLI::Option* addValues(CLI::App& verb, const std::string& name, const std::string& help);
 
-// Hands on the values of the command line or, where there are none, the lines of standard input. Results are flushed
-// whenever the next line may have to be waited for, and at the end.
-void forEachValue(const CLI::Option& given, Results& results, const std::function<void(const Secret&)>& work);
+// Hands on the values of the command line or, where there are none, the lines of standard input, each with its number
+// and its place ("line 3") for messages. Results are flushed whenever the next line may have to be waited for, and at
+// the end.
+using ValueWork = std::function<void(const Secret& value, std::size_t index, const std::string& place)>;
+void forEachValue(const CLI::Option& given, Results& results, const ValueWork& work);
+
+// What takes the place of a result that cannot be given, so that results keep step with the input: an error object, or
+// an empty line.
+void showProblem(bool json, const Status& status, std::size_t index, Results& results);
 
 // Catches arguments that can only be secrets, so that the message can say why they are refused without showing them.
 CLI::Option* addRefusedSecrets(CLI::App& verb, const std::string& name);

@@ -10,7 +10,6 @@
 #include <chrono>
 #include <condition_variable>
 #include <exception>
-#include <map>
 #include <mutex>
 #include <system_error>
 #include <thread>
@@ -103,7 +102,7 @@ class Run {
     loop();
     for (std::thread& helper : helpers) helper.join();
     progress_.hide();
-    reportRest();
+    messages_.finish();
     if (failure_) std::rethrow_exception(failure_);
     reportWhole();
     return std::move(sum_);
@@ -142,10 +141,8 @@ class Run {
     if (failure_) return false;
     deliver_(part);
     if (!part.messages.empty()) progress_.hide();
-    for (const Part::Message& one : part.messages) {
-      if (++shown_[one.kind] <= Part::kMostOfAKind) message(one.text);
-    }
-    if (batch.number == 0 && batch.text.view().substr(0, 3) == "\xEF\xBB\xBF") {
+    for (const Part::Message& one : part.messages) messages_.add(one.text, one.kind);
+    if (batch.number == 0 && batch.text.view().substr(0, kByteOrderMark.size()) == kByteOrderMark) {
       warning(input_.name() + " begins with a byte order mark, which LDIF does not have");
     }
     seen_ |= seen;
@@ -156,13 +153,6 @@ class Run {
     ++due_;
     turn_.notify_all();
     return true;
-  }
-
-  // The kinds of which not all were shown.
-  void reportRest() const {
-    for (const auto& [kind, count] : shown_) {
-      if (count > Part::kMostOfAKind) message(std::to_string(count - Part::kMostOfAKind) + " more: " + kind);
-    }
   }
 
   void reportWhole() const {
@@ -198,7 +188,7 @@ class Run {
   std::condition_variable turn_;
   std::uint64_t due_ = 0;
   std::exception_ptr failure_;
-  std::map<std::string, std::uint64_t> shown_;
+  Repeated messages_{kMostOfAKind, message};
   std::uint64_t seen_ = 0;
   bool cutOff_ = false;
   Part sum_;
@@ -214,7 +204,7 @@ void Part::report(std::uint64_t line, const std::string& dn, ExitCode code, cons
 Input openExport(const ExportOptions& options) {
   ldifLibrary();
   const AttributeSet checked(options.attributes);
-  Input input = options.in == "-" ? Input() : Input(options.in);
+  Input input = Input(options.in);
   input.requireText();
   return input;
 }

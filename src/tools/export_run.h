@@ -27,9 +27,8 @@ constexpr char kOutsideText[] = "lines that belong to no entry";
 struct Part {
   struct Message {
     std::string text;
-    std::string kind;  // the text without the place: of one kind only the first kMostOfAKind are shown
+    std::string kind;  // the text without the place
   };
-  static constexpr std::uint64_t kMostOfAKind = 1000;
 
   Secret out;
   std::vector<Message> messages;

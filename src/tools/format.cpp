@@ -13,8 +13,11 @@ struct Options {
   std::string keys;
   std::string passwordFile;
   CLI::Option* secrets = nullptr;
+  bool allowEmpty = false;
   bool json = false;
 };
+
+constexpr Status kEmpty{kBadValue, "the password is empty (--allow-empty accepts it)"};
 
 const Scheme& chosenScheme(const Options& options) {
   const Scheme* scheme = findScheme(options.scheme);
@@ -27,43 +30,62 @@ const Scheme& chosenScheme(const Options& options) {
   return *scheme;
 }
 
-void warnOfCut(const Scheme& scheme, const Secret& password, std::size_t index) {
-  if (!scheme.cuts(password.size())) return;
-  warning("password " + std::to_string(index) + " is cut: " + scheme.name + " takes its first " +
-          std::to_string(scheme.cutBytes) + " bytes");
-}
+// Makes the values, one after the other.
+class Maker {
+ public:
+  Maker(const Options& options, const Scheme& scheme, const KeyRecord& key)
+      : options_(options), scheme_(scheme), key_(key) {}
 
-void show(const Options& options, const Scheme& scheme, const Secret& value, std::size_t index, Results& results) {
-  if (!options.json) return results.line(value.view());
-  results.line(Json().number("index", index).text("scheme", scheme.name).text("value", value.view()).end());
-}
+  void make(const Secret& password, std::size_t index, const std::string& place) {
+    const Status status =
+        password.empty() && !options_.allowEmpty ? kEmpty : makeValue(scheme_, key_, password, value_);
+    keepFirst(exitCode_, status.code);
+    if (!status.ok()) {
+      problems_.add(place + ": " + status.text, status.text);
+      return showProblem(options_.json, status, index, results);
+    }
+    warnOfCut(password, place);
+    if (!options_.json) return results.line(value_.view());
+    results.line(Json().number("index", index).text("scheme", scheme_.name).text("value", value_.view()).end());
+  }
 
-void showProblem(const Options& options, const Status& status, std::size_t index, Results& results) {
-  message("password " + std::to_string(index) + ": " + status.text);
-  if (options.json) results.line(problemJson(index, status).end());
-}
+  ExitCode exitCode() const noexcept { return exitCode_; }
+
+  Results results;
+
+ private:
+  void warnOfCut(const Secret& password, const std::string& place) {
+    if (!scheme_.cuts(password.size())) return;
+    const std::string what =
+        " cut: " + (scheme_.name + (" takes the first " + std::to_string(scheme_.cutBytes))) + " bytes";
+    warnings_.add(place + ": the password is" + what, "passwords" + what);
+  }
+
+  const Options& options_;
+  const Scheme& scheme_;
+  const KeyRecord& key_;
+  Secret value_;
+  ExitCode exitCode_ = kSuccess;
+  Repeated problems_{kMostOfAKind, message};
+  Repeated warnings_{1, warning};
+};
 
 ExitCode format(const Options& options) {
   refuseSecrets(options.secrets, "password");
   const Scheme& scheme = chosenScheme(options);
   if (scheme.needsProvider) requireProvider();
   const KeyRecord key = KeyRecord::load(scheme.needsKey() ? options.keys : "");
-  ExitCode exitCode = kSuccess;
-  Results results;
+  Maker maker(options, scheme, key);
   SecretSource passwords(options.passwordFile);
-  Secret password;
-  Secret value;
-  for (std::size_t index = 1; passwords.next("Password: ", password); ++index) {
-    warnOfCut(scheme, password, index);
-    const Status status = makeValue(scheme, key, password, value);
-    if (status.ok()) show(options, scheme, value, index, results);
-    if (!status.ok()) showProblem(options, status, index, results);
-    keepFirst(exitCode, status.code);
-    if (!passwords.lineBuffered()) results.flush();
-    if (passwords.interactive()) break;
-  }
-  results.flush();
-  return exitCode;
+  Secret password = passwords.requireTwice("Password: ", "Password again: ", "password");
+  std::size_t index = 1;
+  do {
+    maker.make(password, index, passwords.interactive() ? "standard input" : "line " + std::to_string(index));
+    if (!passwords.lineBuffered()) maker.results.flush();
+    ++index;
+  } while (!passwords.interactive() && passwords.next("", password));
+  maker.results.flush();
+  return maker.exitCode();
 }
 
 }  // namespace
@@ -71,8 +93,9 @@ ExitCode format(const Options& options) {
 void setUpFormat(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
   verb.add_option("--scheme", options->scheme, "sha, ssha, md5, crypt, qveil, aes128, aes192 or aes256")->required();
-  addPath(verb, "--keys", options->keys, "key stash file, for the AES schemes");
+  addKeys(verb, "--keys", options->keys, "key stash file, for the AES schemes");
   addPath(verb, "--password-file", options->passwordFile, "read the passwords, one a line, from this file");
+  verb.add_flag("--allow-empty", options->allowEmpty, "make a value of the empty password too");
   verb.add_flag("--json", options->json, "one JSON object a line");
   options->secrets = addRefusedSecrets(verb, "PASSWORD");
   verb.callback([options, &exitCode] { exitCode = format(*options); });

@@ -35,7 +35,7 @@ void showJson(const StoredValue& value, const char* problem, std::size_t index, 
   scheme.kind == Kind::kUnknown ? json.null("scheme") : json.text("scheme", scheme.name);
   json.number("code", static_cast<unsigned>(scheme.code)).text("kind", kindName(scheme));
   value.tag().empty() ? json.null("tag") : json.text("tag", printable(value.tag()));
-  json.flag("well_formed", problem == nullptr);
+  json.flag("wellFormed", problem == nullptr);
   if (problem != nullptr) json.text("problem", problem);
   json.text("strength", nameOf(scheme.strength)).text("writers", scheme.writers);
   results.line(json.end());
@@ -44,12 +44,10 @@ void showJson(const StoredValue& value, const char* problem, std::size_t index, 
 ExitCode identify(const Options& options) {
   ExitCode exitCode = kSuccess;
   Results results;
-  std::size_t index = 0;
-  forEachValue(*options.values, results, [&](const Secret& whole) {
+  forEachValue(*options.values, results, [&](const Secret& whole, std::size_t index, const std::string&) {
     const StoredValue value(whole);
     const char* problem = value.problem();
     if (problem != nullptr) keepFirst(exitCode, kBadValue);
-    ++index;
     options.json ? showJson(value, problem, index, results) : showText(value, problem, results);
   });
   return exitCode;

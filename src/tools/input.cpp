@@ -44,7 +44,13 @@ const char* kindOfText(std::string_view text) noexcept {
 
 }  // namespace
 
-Input::Input(const std::string& path) : file_(openPath(path, O_RDONLY)), name_(path) {
+std::string Input::nameOf(const std::string& path) {
+  return path.empty() || path == "-" ? "standard input" : path;
+}
+
+Input::Input(const std::string& path) : name_(nameOf(path)) {
+  if (path.empty() || path == "-") return;
+  file_ = openPath(path, O_RDONLY);
   if (!file_.valid()) throw ioFailure(path);
 }
 

@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <string>
+#include <string_view>
 #include <utility>
 
 #include "decompress.h"
@@ -14,11 +15,14 @@
 
 namespace tool {
 
-// A file, or standard input. Every operation throws Failure with kIoError.
+constexpr std::string_view kByteOrderMark = "\xEF\xBB\xBF";
+
+// A file, or standard input, which an empty path or "-" stands for. Every operation throws Failure with kIoError.
 class Input {
  public:
-  Input() : name_("standard input") {}
+  Input() : Input("") {}
   explicit Input(const std::string& path);
+  static std::string nameOf(const std::string& path);
 
   int fd() const noexcept;
   const std::string& name() const noexcept { return name_; }  // for messages

@@ -3,16 +3,47 @@
 #include "key_record.h"
 
 #include <errno.h>
+#include <grp.h>
+#include <pwd.h>
 #include <sys/stat.h>
+
+#include <algorithm>
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+#include <iterator>
+#include <new>
+#include <optional>
 
 #include "crypto_provider.h"
 #include "failure.h"
 #include "input.h"
 #include "messages.h"
+#include "secret.h"
 #include "text.h"
 
 namespace tool {
 namespace {
+
+constexpr std::size_t kReadBytes = std::size_t{1} << 16;  // far more than a stash file has
+constexpr std::size_t kLengthBytes = sizeof(std::uint32_t);
+
+std::optional<gid_t> allowedGroup;
+
+bool mayRead(const struct stat& file) {
+  if (allowedGroup == file.st_gid) return true;
+  const passwd* owner = getpwuid(file.st_uid);
+  return owner != nullptr && owner->pw_gid == file.st_gid;
+}
+
+void warnOfReaders(const std::string& path, const struct stat& file) {
+  if (!S_ISREG(file.st_mode)) return;
+  if ((file.st_mode & S_IRWXO) != 0) {
+    warning(path + " is open to other users of the system; its mode should be 0600");
+  } else if ((file.st_mode & S_IRWXG) != 0 && !mayRead(file)) {
+    warning(path + " is open to its group; its mode should be 0600, or --keys-group names the right group");
+  }
+}
 
 // A file of other content can be long enough, but it has other texts in these places.
 bool looksLikeStash(const KeyRecord& record) {
@@ -20,7 +51,49 @@ bool looksLikeStash(const KeyRecord& record) {
          validateCryptoString(std::string(record.salt()).c_str(), 1) == LDAPPW_SUCCESS;
 }
 
+void fill(SecBuffer& buffer, std::string_view& from) {
+  memcpy(buffer.data, from.data(), buffer.length);
+  from.remove_prefix(buffer.length);
+}
+
+// Takes a stash file apart; gives no record for one that is too short. The library's own reader takes a path, and would
+// open a pipe a second time.
+KeyRecord parse(const Secret& file) {
+  AesKeyData* made = nullptr;
+  if (initAesKeyData(&made) != LDAPPW_SUCCESS) throw std::bad_alloc();
+  KeyRecord record(made);
+  std::string_view rest = file.view();
+  std::uint64_t syncBytes = 0;
+  for (std::size_t i = 0; i < kLengthBytes && i < rest.size(); ++i) {
+    syncBytes |= std::uint64_t{static_cast<unsigned char>(rest[i])} << (8 * i);
+  }
+  std::uint64_t needed = kLengthBytes + syncBytes + made->cryptoSalt.length;
+  for (const SecBuffer& key : made->aesKeys) needed += key.length;
+  if (rest.size() < needed) return KeyRecord();
+  rest.remove_prefix(kLengthBytes);
+  made->cryptoSync.data = static_cast<unsigned char*>(calloc(static_cast<std::size_t>(syncBytes) + 1, 1));
+  if (made->cryptoSync.data == nullptr) throw std::bad_alloc();
+  made->cryptoSync.length = static_cast<std::uint32_t>(syncBytes);
+  fill(made->cryptoSync, rest);
+  fill(made->cryptoSalt, rest);
+  for (SecBuffer& key : made->aesKeys) fill(key, rest);
+  return record;
+}
+
 }  // namespace
+
+void allowKeysGroup(const std::string& name) {
+  const bool number = !name.empty() && name.size() < 10 && name.find_first_not_of("0123456789") == std::string::npos;
+  const group* found = number ? nullptr : getgrnam(name.c_str());
+  if (!number && found == nullptr) throw Failure(kUsage, "there is no group " + name);
+  allowedGroup = number ? static_cast<gid_t>(std::stoul(name)) : found->gr_gid;
+}
+
+bool sameRecord(const KeyRecord& a, const KeyRecord& b) {
+  const auto same = [](const SecBuffer& x, const SecBuffer& y) { return equalBytes(viewOf(x), viewOf(y)); };
+  return a.sync() == b.sync() && a.salt() == b.salt() &&
+         std::equal(std::begin(a.get()->aesKeys), std::end(a.get()->aesKeys), b.get()->aesKeys, same);
+}
 
 std::string_view viewOf(const SecBuffer& buffer) noexcept {
   if (buffer.data == nullptr) return {};
@@ -29,20 +102,17 @@ std::string_view viewOf(const SecBuffer& buffer) noexcept {
 
 KeyRecord KeyRecord::load(const std::string& path) {
   if (path.empty()) return KeyRecord();
-  const Input file(path);
+  Input file(path);
   struct stat found {};
   if (fstat(file.fd(), &found) != 0) throw ioFailure(path);
   if (S_ISDIR(found.st_mode)) throw ioFailure(path, EISDIR);
-  if (S_ISREG(found.st_mode) && (found.st_mode & (S_IRWXG | S_IRWXO)) != 0) {
-    warning(path + " is open to other users of the system; its mode should be 0600");
+  warnOfReaders(path, found);
+  Secret bytes;
+  while (bytes.size() < kReadBytes && file.more(bytes, kReadBytes)) {
   }
-  AesKeyData* loaded = nullptr;
-  const int code = setAESKeyData(path.c_str(), &loaded);
-  KeyRecord record(loaded);
-  if (code == LDAPPW_NO_MEMORY) throw Failure(kInternal, path + ": out of memory");
-  if (code != LDAPPW_SUCCESS || !looksLikeStash(record)) {
-    throw Failure(kBadKey, path + " is not a whole key stash file");
-  }
+  KeyRecord record = parse(bytes);
+  if (!record || !looksLikeStash(record)) throw Failure(kBadKey, file.name() + " is not a whole key stash file");
+  setCipherNameGlobal();
   return record;
 }
 

@@ -16,8 +16,8 @@ class KeyRecord {
  public:
   explicit KeyRecord(AesKeyData* record = nullptr) noexcept : record_(record) {}
 
-  // Loads a stash file and warns when others can read it; an empty path gives no record. Throws Failure: kIoError when
-  // the file cannot be opened, kBadKey when it is not a stash file.
+  // Reads a stash file, once, and warns when others can read it; an empty path gives no record. Throws Failure: kIoError
+  // when the file cannot be read, kBadKey when it is not a stash file.
   static KeyRecord load(const std::string& path);
 
   AesKeyData* get() const noexcept { return record_.get(); }
@@ -31,6 +31,12 @@ class KeyRecord {
   };
   std::unique_ptr<AesKeyData, Free> record_;
 };
+
+bool sameRecord(const KeyRecord& a, const KeyRecord& b);
+
+// The group that may read stash files beside their owner and its own group. Throws Failure (kUsage) when there is none
+// of that name or number.
+void allowKeysGroup(const std::string& name);
 
 std::string_view viewOf(const SecBuffer& buffer) noexcept;
 

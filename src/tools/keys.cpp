@@ -4,9 +4,7 @@
 
 #include <sys/stat.h>
 
-#include <algorithm>
 #include <cstdint>
-#include <iterator>
 
 #include "input.h"
 
@@ -64,12 +62,6 @@ KeyRecord deriveRecord(const Secret& seed, std::string_view salt) {
   KeyRecord record(made);
   requireDone(code, "the keys could not be derived");
   return record;
-}
-
-bool sameRecord(const KeyRecord& a, const KeyRecord& b) {
-  const auto same = [](const SecBuffer& x, const SecBuffer& y) { return equalBytes(viewOf(x), viewOf(y)); };
-  return a.sync() == b.sync() && a.salt() == b.salt() &&
-         std::equal(std::begin(a.get()->aesKeys), std::end(a.get()->aesKeys), b.get()->aesKeys, same);
 }
 
 void requireDone(int code, const std::string& what) {

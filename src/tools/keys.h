@@ -13,6 +13,7 @@
 namespace tool {
 
 constexpr mode_t kStashMode = 0600;
+constexpr off_t kStashRoom = 2048;  // bytes, more than any stash file has
 
 void setUpKeysCreate(CLI::App& verb, ExitCode& exitCode);
 void setUpKeysRestore(CLI::App& verb, ExitCode& exitCode);
@@ -37,8 +38,6 @@ void requireSalt(const Secret& salt);
 Secret readSaltFile(const std::string& path);
 
 KeyRecord deriveRecord(const Secret& seed, std::string_view salt);
-
-bool sameRecord(const KeyRecord& a, const KeyRecord& b);
 
 // Throw the Failure that a library code stands for; nothing for success. what begins its message. requireWritten is for
 // a code from writing a file: a failed file operation and a failed provider have one code, and the provider was asked

@@ -30,7 +30,7 @@ ExitCode check(const Options& options) {
 
 void setUpKeysCheck(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  addPath(verb, "FILE", options->file, "key stash file")->required();
+  addKeys(verb, "FILE", options->file, "key stash file")->required();
   verb.add_option("--sync", options->sync, "sync text")->required();
   addPath(verb, "--salt-file", options->saltFile, "compare the salt too, with the first line of this file");
   verb.add_flag("--json", options->json, "the result as a JSON object");

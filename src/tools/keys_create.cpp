@@ -19,13 +19,8 @@ bool sameFile(const std::string& a, const std::string& b) {
   return a == b || std::filesystem::equivalent(a, b, missing);
 }
 
-Secret askSeedTwice(const std::string& seedFile) {
-  SecretSource source(seedFile);
-  Secret seed = source.require("Seed: ", "seed");
-  if (source.interactive()) {
-    const Secret again = source.require("Seed again: ", "seed");
-    if (!equalBytes(seed.view(), again.view())) throw Failure(kUsage, "the two seeds are not the same");
-  }
+Secret askSeed(const std::string& seedFile) {
+  Secret seed = SecretSource(seedFile).requireTwice("Seed: ", "Seed again: ", "seed");
   requireSeed(seed);
   return seed;
 }
@@ -35,7 +30,7 @@ void showCreated(const Options& options, const KeyRecord& config, const KeyRecor
   if (options.json) {
     Json json;
     json.text("config", options.config).text("directory", options.directory).text("sync", config.sync());
-    json.text("directory_sync", directory.sync()).text("directory_salt", directory.salt());
+    json.text("directorySync", directory.sync()).text("directorySalt", directory.salt());
     results.line(json.end());
   } else {
     results.line(config.sync());
@@ -62,10 +57,12 @@ ExitCode create(const Options& options) {
   requireProvider();
   Secret salt;
   if (!options.saltFile.empty()) salt = readSaltFile(options.saltFile);
-  const Secret seed = askSeedTwice(options.seedFile);
+  const Secret seed = askSeed(options.seedFile);
   OutputFile config(options.config, kStashMode, options.force);
   OutputFile directory(options.directory, kStashMode, options.force);
   if (config.target() == directory.target()) throw sameTarget;
+  config.requireRoom(kStashRoom);
+  directory.requireRoom(kStashRoom);
   char* syncText = nullptr;
   const int code = createKeyStashFiles(config.temporaryPath().c_str(), directory.temporaryPath().c_str(), seed.c_str(),
                                        &syncText, salt.empty() ? nullptr : salt.c_str());

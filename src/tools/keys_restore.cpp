@@ -40,6 +40,7 @@ ExitCode restore(const Options& options) {
     return kNoMatch;
   }
   OutputFile file(options.file, kStashMode, options.force);
+  file.requireRoom(kStashRoom);
   requireWritten(restoreKeyStashFile(file.temporaryPath().c_str(), seed.c_str(), salt.c_str()), options.file);
   if (!sameRecord(readBack(file), expected)) {
     throw Failure(kIoError, options.file + " could not be written whole; nothing was replaced");

@@ -66,7 +66,7 @@ ExitCode show(const Options& options) {
 
 void setUpKeysShow(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  addPath(verb, "FILE", options->file, "key stash file")->required();
+  addKeys(verb, "FILE", options->file, "key stash file")->required();
   verb.add_flag("--json", options->json, "the result as a JSON object");
   verb.callback([options, &exitCode] { exitCode = show(*options); });
 }

@@ -37,7 +37,7 @@ void setUpLdif(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<LdifOptions>();
   verb.add_option("--to", options->to, "scheme to convert the values to");
   verb.add_flag("--audit", options->audit, "count schemes and findings instead");
-  addPath(verb, "--keys", options->keys, "key stash file that opens the AES values of the export");
+  addKeys(verb, "--keys", options->keys, "key stash file that opens the AES values of the export");
   addPath(verb, "--new-keys", options->newKeys, "key stash file for the new values");
   verb.add_option("--attribute", options->source.attributes,
                   "attribute that holds passwords, as often as there are such; without it userPassword, pwdHistory, "

@@ -3,7 +3,6 @@
 // the only copy of the passwords in it.
 #include "ldif_passes.h"
 
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -58,6 +57,8 @@ constexpr CountName kNames[] = {
     {"malformed", "malformed, kept"},
     {"failed", "failed, kept"},
 };
+
+constexpr mode_t kNewFileMode = 0600;
 
 struct Conversion {
   const Scheme& target;
@@ -195,12 +196,6 @@ const Scheme& targetOf(const LdifOptions& options) {
   return *scheme;
 }
 
-// A file that is replaced keeps its mode; a new one is closed to others.
-mode_t modeFor(const std::string& path) {
-  struct stat old {};
-  return stat(path.c_str(), &old) == 0 ? old.st_mode & 07777 : 0600;
-}
-
 void showSummary(const Tally& tally, const Scheme& target, bool json) {
   if (tally.totals[kCut] > 0) {
     warning(std::to_string(tally.totals[kCut]) + " passwords are longer than the " + std::to_string(target.cutBytes) +
@@ -228,9 +223,15 @@ ExitCode convertExport(const LdifOptions& options) {
   requireProvider();
   const Conversion conversion{target, KeyRecord::load(options.keys), KeyRecord::load(options.newKeys),
                               options.allowBinary, options.fix};
+  if (conversion.oldKeys && conversion.newKeys && sameRecord(conversion.oldKeys, conversion.newKeys)) {
+    throw Failure(kUsage, "--keys and --new-keys hold the same keys");
+  }
   Input input = openExport(options.source);
   std::optional<OutputFile> file;
-  if (options.out != "-") file.emplace(options.out, modeFor(options.out), options.force);
+  if (options.out != "-") {
+    file.emplace(options.out, kNewFileMode, options.force);
+    file->keepAccess();
+  }
   const auto deliver = [&](const Part& part) {
     file ? file->write(part.out.view()) : writeAll(STDOUT_FILENO, part.out.view(), "standard output");
   };

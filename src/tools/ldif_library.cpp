@@ -19,6 +19,14 @@ void resolve(void* library, const char* name, Function& function) {
   memcpy(&function, &address, sizeof function);
 }
 
+// What it writes to standard error of lines that it does not like is said here in other words.
+void silence(void* library) {
+  decltype(&ber_set_option) setOption = nullptr;
+  resolve(library, "ber_set_option", setOption);
+  const BER_LOG_PRINT_FN keepQuiet = [](const char*) {};
+  setOption(nullptr, LBER_OPT_LOG_PRINT_FN, reinterpret_cast<const void*>(keepQuiet));
+}
+
 LdifLibrary openLibrary() {
   void* library = dlopen(LDAPPW_LDAP_SONAME, RTLD_NOW | RTLD_LOCAL);
   LdifLibrary functions{};
@@ -26,6 +34,7 @@ LdifLibrary openLibrary() {
   resolve(library, "ldif_sput_wrap", functions.putLine);
   resolve(library, "ldif_is_not_printable", functions.isNotPrintable);
   resolve(library, "ber_memfree", functions.release);
+  silence(library);
   return functions;
 }
 

@@ -13,7 +13,6 @@ namespace tool {
 namespace {
 
 constexpr std::size_t kNone = std::string_view::npos;
-constexpr std::string_view kMark = "\xEF\xBB\xBF";  // a byte order mark
 
 // userPassword by name and number, the passwords that it had before, those of slapd's and 389's own administrators, and
 // the attribute of RFC 3112.
@@ -212,7 +211,9 @@ bool RecordWalker::next() {
   nextLineNumber_ += line_.physicalLines;
   if (line_.blank()) startRecord();
   std::string_view text = line_.first;
-  if (lineNumber_ == 1 && text.substr(0, kMark.size()) == kMark) text.remove_prefix(kMark.size());
+  if (lineNumber_ == 1 && text.substr(0, kByteOrderMark.size()) == kByteOrderMark) {
+    text.remove_prefix(kByteOrderMark.size());
+  }
   if (text.empty() || text.front() == '#') return true;
   std::size_t colon = text.find(':');
   if (colon != kNone && !matters(text.substr(0, colon))) return true;

@@ -8,8 +8,13 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <new>
+#include <numeric>
+#include <utility>
+#include <vector>
 
+#include "descriptor.h"
 #include "messages.h"
 
 namespace tool {
@@ -62,9 +67,45 @@ std::string optionName(const std::string& argument) {
   return argument[1] == '-' ? argument.substr(0, argument.find('=')) : argument.substr(0, 2);
 }
 
+// The least number of letters to change, drop or add that makes the one word of the other.
+std::size_t distance(std::string_view a, std::string_view b) {
+  std::vector<std::size_t> row(b.size() + 1);
+  std::iota(row.begin(), row.end(), std::size_t{0});
+  for (std::size_t i = 0; i < a.size(); ++i) {
+    std::size_t diagonal = std::exchange(row[0], i + 1);
+    for (std::size_t j = 0; j < b.size(); ++j) {
+      const std::size_t changed = diagonal + (a[i] == b[j] ? 0 : 1);
+      diagonal = std::exchange(row[j + 1], std::min({changed, row[j] + 1, row[j + 1] + 1}));
+    }
+  }
+  return row.back();
+}
+
+// The verb that a word is nearest to, if it is near to one. Another word may be a secret and is not shown.
+std::string unknownVerb(const CLI::App& app, const std::string& word) {
+  constexpr std::size_t kNear = 2;
+  std::string nearest;
+  std::size_t least = kNear + 1;
+  for (const CLI::App* verb : app.get_subcommands(nullptr)) {
+    const std::size_t away = distance(word, verb->get_name());
+    if (away < least) nearest = verb->get_name();
+    least = std::min(least, away);
+  }
+  if (nearest.empty()) return "there is no such verb (--help lists them)";
+  return "there is no verb " + word + "; did you mean " + nearest + "?";
+}
+
 ExitCode reportUsage(const CLI::App& app, const CLI::ParseError& error) {
+  const CLI::App* verb = &app;
+  while (!verb->get_subcommands().empty()) verb = verb->get_subcommands().front();
+  const bool wantsVerb = !verb->get_subcommands(nullptr).empty();
+  const std::vector<std::string> rest = app.remaining(true);
+  if (wantsVerb && (rest.empty() || optionName(rest.front()).empty())) {
+    message(rest.empty() ? "a verb is missing (--help lists them)" : unknownVerb(*verb, rest.front()));
+    return kUsage;
+  }
   std::string names;
-  for (const std::string& argument : app.remaining(true)) {
+  for (const std::string& argument : rest) {
     const std::string name = optionName(argument);
     if (!name.empty()) names += " " + name;
   }
@@ -78,6 +119,19 @@ ExitCode reportUsage(const CLI::App& app, const CLI::ParseError& error) {
     message(error.what());
   }
   return kUsage;
+}
+
+// Reports a failure; with --json as an error object too.
+ExitCode reportFailure(const CLI::App& app, const Failure& failure) {
+  message(failure.what());
+  const CLI::App* verb = &app;
+  while (!verb->get_subcommands().empty()) verb = verb->get_subcommands().front();
+  const CLI::Option* json = verb->get_option_no_throw("--json");
+  if (json != nullptr && !json->empty()) {
+    Json object;
+    tryWrite(STDOUT_FILENO, std::string(object.problem(failure.what(), failure.code()).end()) + "\n");
+  }
+  return failure.code();
 }
 
 ExitCode parseAndRun(int argc, char** argv) {
@@ -96,6 +150,8 @@ ExitCode parseAndRun(int argc, char** argv) {
     app.exit(error);  // --help or --version
     std::cout.flush();
     return std::cout ? kSuccess : kIoError;
+  } catch (const Failure& failure) {
+    return reportFailure(app, failure);
   }
   return exitCode;
 }
@@ -103,9 +159,6 @@ ExitCode parseAndRun(int argc, char** argv) {
 ExitCode guarded(int argc, char** argv) {
   try {
     return parseAndRun(argc, argv);
-  } catch (const Failure& failure) {
-    message(failure.what());
-    return failure.code();
   } catch (const std::bad_alloc&) {
     message("out of memory");
   } catch (const std::exception& error) {

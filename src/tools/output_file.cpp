@@ -7,6 +7,7 @@
 #include <stdio.h>
 #include <stdlib.h>
 #include <sys/stat.h>
+#include <sys/xattr.h>
 #include <unistd.h>
 
 #include <filesystem>
@@ -18,7 +19,9 @@
 namespace tool {
 namespace {
 
-constexpr std::size_t kShownNameBytes = 200;  // of the target, so that the temporary name is not too long
+constexpr char kAccessList[] = "system.posix_acl_access";
+constexpr std::size_t kAccessListBytes = 4096;  // a page holds it
+constexpr std::size_t kShownNameBytes = 200;    // of the target, so that the temporary name is not too long
 
 // The absolute path of a file that need not exist, links followed.
 std::string resolved(const std::string& path) {
@@ -60,10 +63,30 @@ void OutputFile::resolveTarget(const std::string& target, bool overwrite) {
   const std::string name = std::filesystem::path(target).filename();
   struct stat found {};
   const bool exists = stat(target.c_str(), &found) == 0;
+  if (target == "-") throw Failure(kUsage, "this file is not written to standard output");
   if (exists && !S_ISREG(found.st_mode)) throw Failure(kIoError, target + " is not a regular file");
   if (name.empty() || name == "." || name == "..") throw Failure(kUsage, "'" + target + "' does not name a file");
   if (!overwrite && lstat(target.c_str(), &found) == 0) throw existsFailure(target);
   target_ = resolved(target);
+}
+
+void OutputFile::keepAccess() {
+  struct stat old {};
+  if (stat(target_.c_str(), &old) != 0) return;
+  char list[kAccessListBytes];
+  const ssize_t bytes = getxattr(target_.c_str(), kAccessList, list, sizeof list);
+  if (bytes < 0 && errno == ENODATA) fremovexattr(fd_.get(), kAccessList);  // one that the folder gives to new files
+  if (fchmod(fd_.get(), old.st_mode & 07777) != 0) throw ioFailure(target_);
+  const bool unknown = bytes < 0 && errno != ENODATA && errno != EOPNOTSUPP;
+  if (unknown || (bytes > 0 && fsetxattr(fd_.get(), kAccessList, list, static_cast<std::size_t>(bytes), 0) != 0)) {
+    warning(target_ + " will not keep its access list: " + strerror(errno));
+  }
+}
+
+void OutputFile::requireRoom(off_t bytes) {
+  const int error = posix_fallocate(fd_.get(), 0, bytes);
+  if (error != 0 && error != EINVAL && error != EOPNOTSUPP) throw ioFailure(target_, error);
+  if (ftruncate(fd_.get(), 0) != 0) throw ioFailure(target_);
 }
 
 void OutputFile::write(std::string_view bytes) {

@@ -26,6 +26,11 @@ class OutputFile {
   const std::string& temporaryPath() const noexcept { return temporary_.path(); }
   int fd() const noexcept { return fd_.get(); }
 
+  // Gives the file the mode and the access list of the one that it replaces, where there is one.
+  void keepAccess();
+  // Throws when there is no room for so many bytes, for a writer that does not say why it fails.
+  void requireRoom(off_t bytes);
+
   void write(std::string_view bytes);
   // Brings the content to the disk. Nothing has appeared under the target's name yet.
   void sync();

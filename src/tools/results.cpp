@@ -89,10 +89,4 @@ Json& Json::null(std::string_view name) {
   return begin(name, "null");
 }
 
-Json problemJson(std::size_t index, const Status& status) {
-  Json json;
-  json.number("index", index).text("error", status.text).number("code", static_cast<std::uint64_t>(status.code));
-  return json;
-}
-
 }  // namespace tool

@@ -32,6 +32,11 @@ class Json {
   Json& number(std::string_view name, std::uint64_t value);
   Json& flag(std::string_view name, bool value);
   Json& null(std::string_view name);
+  // What an error object says of a problem, whatever it is that failed.
+  Json& problem(const Status& status) { return problem(status.text, status.code); }
+  Json& problem(std::string_view text, ExitCode code) {
+    return this->text("error", text).number("code", static_cast<std::uint64_t>(code));
+  }
   // An object or a list within; what stands in a list has an empty name.
   Json& open(std::string_view name) { return begin(name, "{"); }
   Json& close() { return raw("}"); }
@@ -47,9 +52,6 @@ class Json {
 
   Secret text_{"{"};
 };
-
-// The object that stands for a value or password that could not be served; index counts from 1.
-Json problemJson(std::size_t index, const Status& status);
 
 }  // namespace tool
 

@@ -22,7 +22,7 @@ void showJson(const Scheme& scheme, const Secret& clear, std::size_t index, Resu
   Json json;
   json.number("index", index).text("scheme", scheme.name);
   isOneLine(clear) && wellFormedUtf8(clear.view()) ? json.text("password", clear.view())
-                                                   : json.base64("password_base64", clear.view());
+                                                   : json.base64("passwordBase64", clear.view());
   results.line(json.end());
 }
 
@@ -31,8 +31,8 @@ ExitCode reveal(const Options& options) {
   const KeyRecord key = KeyRecord::load(options.keys);
   ExitCode exitCode = kSuccess;
   Results results;
-  std::size_t index = 0;
-  forEachValue(*options.values, results, [&](const Secret& whole) {
+  Repeated problems(kMostOfAKind, message);
+  forEachValue(*options.values, results, [&](const Secret& whole, std::size_t index, const std::string& place) {
     const StoredValue value(whole);
     Secret clear;
     Status status = openValue(value, key, clear);
@@ -40,10 +40,9 @@ ExitCode reveal(const Options& options) {
       status = {kBadValue, "the password is not one line of text: --json shows it"};
     }
     keepFirst(exitCode, status.code);
-    ++index;
     if (!status.ok()) {
-      message("value " + std::to_string(index) + ": " + status.text);
-      if (options.json) results.line(problemJson(index, status).end());
+      problems.add(place + ": " + status.text, status.text);
+      showProblem(options.json, status, index, results);
     } else {
       options.json ? showJson(value.scheme(), clear, index, results) : results.line(clear.view());
     }
@@ -56,10 +55,9 @@ ExitCode reveal(const Options& options) {
 void setUpReveal(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
   options->values = addValues(verb, "VALUE", "stored values; without any, one a line from standard input");
-  addPath(verb, "--keys", options->keys, "key stash file, for the AES schemes");
-  verb.add_flag(
-      "--json", options->json,
-      "one JSON object a line: the password as text, or as password_base64 where it is not one line of UTF-8");
+  addKeys(verb, "--keys", options->keys, "key stash file, for the AES schemes");
+  verb.add_flag("--json", options->json,
+                "one JSON object a line: the password as text, or as passwordBase64 where it is not one line of UTF-8");
   verb.callback([options, &exitCode] { exitCode = reveal(*options); });
 }
 

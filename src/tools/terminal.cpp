@@ -66,10 +66,27 @@ Secret promptSecret(const char* prompt) {
 }  // namespace
 
 SecretSource::SecretSource(const std::string& path)
-    : interactive_(path.empty() && isatty(kInput) == 1), lines_(path.empty() ? Input() : Input(path)) {}
+    : interactive_((path.empty() || path == "-") && isatty(kInput) == 1),
+      name_(Input::nameOf(path)),
+      lines_(Input(path)) {}
+
+// What a line has from the system that it comes from, and nobody types.
+void SecretSource::warnOfStrayBytes(const Secret& line) {
+  const std::string place = name_ + ", line " + std::to_string(++number_);
+  if (line.view().substr(0, kByteOrderMark.size()) == kByteOrderMark) {
+    warnings_.add(place + " begins with a byte order mark, which is taken as part of it", "with a byte order mark");
+  }
+  if (!line.empty() && line.view().back() == '\r') {
+    warnings_.add(place + " ends in a carriage return, which is taken as part of it", "with a carriage return");
+  }
+}
 
 bool SecretSource::next(const char* prompt, Secret& out) {
-  if (!interactive_) return lines_.next(out);
+  if (!interactive_) {
+    if (!lines_.next(out)) return false;
+    warnOfStrayBytes(out);
+    return true;
+  }
   out = promptSecret(prompt);
   return true;
 }
@@ -77,6 +94,14 @@ bool SecretSource::next(const char* prompt, Secret& out) {
 Secret SecretSource::require(const char* prompt, const char* what) {
   Secret secret;
   if (!next(prompt, secret)) throw Failure(kUsage, std::string("there is no ") + what + " in the input");
+  return secret;
+}
+
+Secret SecretSource::requireTwice(const char* prompt, const char* again, const char* what) {
+  Secret secret = require(prompt, what);
+  if (interactive_ && !equalBytes(secret.view(), require(again, what).view())) {
+    throw Failure(kUsage, std::string("the second ") + what + " is not the first one");
+  }
   return secret;
 }
 

@@ -7,6 +7,7 @@
 #include <string>
 
 #include "input.h"
+#include "messages.h"
 #include "secret.h"
 
 namespace tool {
@@ -15,21 +16,29 @@ namespace tool {
 // prompts when standard input is a terminal.
 class SecretSource {
  public:
-  // An empty path means standard input.
+  // An empty path, or "-", means standard input.
   explicit SecretSource(const std::string& path);
 
   bool interactive() const noexcept { return interactive_; }
   // The next secret, or false at the end. At a terminal, prompt (a static text) asks for it and a line of any length is
-  // read without echo. Throws Failure: kUsage when the terminal's input ends without a line, kIoError otherwise.
+  // read without echo. Throws Failure: kUsage when the terminal's input ends without a line, kIoError otherwise. A line
+  // that ends in a carriage return, or begins with a byte order mark, is taken as it is, with a warning.
   bool next(const char* prompt, Secret& out);
   // The same where there has to be one: what names it in the message.
   Secret require(const char* prompt, const char* what);
+  // The same, and at a terminal it has to be typed a second time: again is the prompt for that.
+  Secret requireTwice(const char* prompt, const char* again, const char* what);
   // False when next() may have to wait.
   bool lineBuffered() const noexcept { return !interactive_ && lines_.lineBuffered(); }
 
  private:
+  void warnOfStrayBytes(const Secret& line);
+
   bool interactive_;
+  std::string name_;
   LineReader lines_;
+  std::uint64_t number_ = 0;
+  Repeated warnings_{1, warning};
 };
 
 }  // namespace tool

@@ -11,6 +11,7 @@ namespace {
 constexpr std::size_t kMaxPasswordBytes = std::size_t{1} << 28;
 constexpr std::size_t kMaxValueBytes = kMaxPasswordBytes * 2;
 
+constexpr Status kNulByte{kBadValue, "the password holds a NUL byte"};
 constexpr Status kNoKey{kBadKey, "an AES value needs the key stash (--keys)"};
 constexpr Status kElsewhere{kBadValue, "the password is checked by another service and cannot be computed here"};
 
@@ -28,7 +29,7 @@ Status valueProblem(const StoredValue& value, const KeyRecord& key) {
 
 Status passwordProblem(const Scheme& scheme, std::string_view password) {
   if (scheme.make == nullptr) return {kBadValue, "values of this scheme cannot be made"};
-  if (password.find('\0') != std::string_view::npos) return {kBadValue, "the password holds a NUL byte"};
+  if (password.find('\0') != std::string_view::npos) return kNulByte;
   if (password.size() > kMaxPasswordBytes) return {kBadValue, "the password is longer than 256 MiB"};
   const char* problem = scheme.passwordProblem != nullptr ? scheme.passwordProblem(password) : nullptr;
   return problem != nullptr ? Status{kBadValue, problem} : Status{};
@@ -51,7 +52,9 @@ Status openValue(const StoredValue& value, const KeyRecord& key, Secret& out) {
 
 Status checkValue(const StoredValue& value, const KeyRecord& key, const Secret& password) {
   const Status problem = valueProblem(value, key);
-  return problem.ok() ? value.scheme().check(value, key, password) : problem;
+  if (!problem.ok()) return problem;
+  if (password.view().find('\0') != std::string_view::npos) return kNulByte;
+  return value.scheme().check(value, key, password);
 }
 
 bool serverAccepts(const Secret& value, const KeyRecord& key, const Secret& password) noexcept {

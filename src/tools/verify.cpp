@@ -51,7 +51,7 @@ void show(const Options& options, const Scheme& scheme, const Status& status) {
   Results results;
   if (options.json) {
     results.line(answered ? Json().text("scheme", scheme.name).flag("match", status.ok()).end()
-                          : problemJson(1, status).end());
+                          : Json().problem(status).end());
   } else if (answered) {
     results.line(status.ok() ? "match" : "no match");
   }
@@ -77,7 +77,7 @@ void setUpVerify(CLI::App& verb, ExitCode& exitCode) {
   options->value = verb.add_option("VALUE", "stored value");
   addPath(verb, "--value-file", options->valueFile, "read the stored value from the first line of this file");
   addPath(verb, "--password-file", options->passwordFile, "read the password from the first line of this file");
-  addPath(verb, "--keys", options->keys, "key stash file, for the AES schemes");
+  addKeys(verb, "--keys", options->keys, "key stash file, for the AES schemes");
   verb.add_flag("--clear", options->clear, "take a value without a tag as a clear password");
   verb.add_flag("--json", options->json, "the result as a JSON object");
   verb.footer(
