@@ -157,6 +157,13 @@ for packing in 'gzip -c' 'zstd -qc'; do  # in two pieces, as log rotation append
   sameFile "$packing" <(sed "s|^userPassword: secret$|userPassword: $S|" in | head -4; printf '\n'; cat one) out
 done
 
+# Checks of the entries of an export; an entry may have several values.
+printf 'dn: uid=a, dc=x\nuserPassword: %s\nuserPassword: {X}y\npwdHistory: t#s#3#old\n\ndn:: %s\nuserPassword: b\n\ndn: c\n' \
+  "$S" "$(printf 'uid=b,dc=x' | b64)" >in
+printf '%s\n' $'UID=A,dc = x\tsecret' $'uid=a,dc=x\told' $'uid=b,dc=x\tb' $'c\tc' $'d\td' >pairs
+check 'a batch of entries' 3 'match.the tag is of no known scheme.match.the entry has no password.the export has no such entry' \
+  verify --batch pairs --ldif in --clear
+
 # The audit of a mixed export, against counts made by hand.
 run audit 3 ldif --audit --keys A --json --in "$root/samples/mixed.ldif"
 json audit "d[0]['findings'] == {'unknownTag': 2, 'malformed': 9, 'untagged': 1, 'cryptVariant': 0, 'unopened': 1,

@@ -245,6 +245,27 @@ newline in JSON|0|.*"passwordBase64":"YQpi"\}|reveal --json --keys dir "{AES128}
 bytes in JSON|0|.*"passwordBase64":"/w=="\}|reveal --json $'\xff'
 JSON escapes|0|.*"password":"a\\"b\\\\\\u0001\\u007f\\u009bé"\}|reveal --json $'a"b\\\x01\x7f\xc2\x9bé'
 ROWS
+printf '%s\t%s\n' "$ssha" secret "$aesValue" secret "$ssha" $'se\tcret' '{X}y' a secret secret >pairs; echo tabless >>pairs
+tr '\n' '\0' <pairs >pairs0; head -1 pairs >one
+rows <<'ROWS'
+batch|1|match.match.no match.the tag is of no known scheme.the value has no tag.*.there is no tab.*|verify --batch pairs --keys dir
+batch, clear, the first problem|4|match.an AES value needs.*.no match.*scheme.match.there is no tab.*|verify --batch pairs --clear
+batch, all match|0|match|verify --batch one
+batch as JSON|1|\{"index":1,"match":true\}.*\{"index":3,"match":false\}.\{"index":4,"error":"the tag is of no known scheme","code":3\}.*|verify --batch pairs --keys dir --json
+batch, quiet|1||verify --batch pairs --keys dir --quiet
+empty batch|2||verify --batch empty
+batch and a value|2||verify --batch pairs "$ssha"
+quiet|1||verify --quiet "$ssha" --password-file wrong
+check, quiet|1||keys check dir --sync other --quiet
+too short|2||format --scheme md5 --generate 7
+ROWS
+same 'batch of NUL records' "$("$tool" verify --batch pairs --keys dir)" "$("$tool" verify --batch pairs0 --null --keys dir | tr '\0' '\n')"
+same 'NUL records' '{MD5}kAFQmDzST7DWlj99KOF/cg== {MD5}'"$(printf 'a\nb' | openssl dgst -md5 -binary | b64) " \
+  "$(printf 'abc\0a\nb\0' | "$tool" format --scheme md5 --null | tee values0 | tr '\0' ' ')"
+same 'NUL records of identify and reveal' '2 2' "$(for verb in identify reveal; do "$tool" $verb --null <values0 2>err | tr -dc '\0' | wc -c; done | xargs)"
+IFS=$'\t' read -r password value < <("$tool" format --scheme ssha --generate 40)
+[[ $password =~ ^[a-km-zA-HJ-NP-Z2-9]{40}$ ]] || fail "generated: '$password'"
+check 'generated' 0 match verify "$value" <<<"$password"
 for arguments in 'hunter2' '--pass=hunter2' '-phunter2' '--pass hunter2' '--json=hunter2'; do
   run "format $arguments" 2 format --scheme sha $arguments <<<secret
   unsaid "format $arguments" hunter2

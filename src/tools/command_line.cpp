@@ -32,14 +32,19 @@ CLI::Option* addValues(CLI::App& verb, const std::string& name, const std::strin
   return option->option_text("...");
 }
 
-void forEachValue(const CLI::Option& given, Results& results, const ValueWork& work) {
+void addNull(CLI::App& verb, char& end) {
+  verb.add_flag_callback(
+      "--null", [&end] { end = '\0'; }, "lines end in NUL bytes, in the input and in the results");
+}
+
+void forEachValue(const CLI::Option& given, char end, Results& results, const ValueWork& work) {
   std::size_t index = 0;
   for (const std::string& value : given.results()) {
     ++index;
     work(Secret(value), index, "value " + std::to_string(index));
   }
   if (given.empty()) {
-    LineReader lines{Input()};
+    LineReader lines(Input(), end);
     Secret value;
     while (lines.next(value)) {
       ++index;

@@ -42,11 +42,14 @@ CLI::Option* addKeys(CLI::App& verb, const std::string& name, std::string& path,
 // Any number of positional values.
 CLI::Option* addValues(CLI::App& verb, const std::string& name, const std::string& help);
 
-// Hands on the values of the command line or, where there are none, the lines of standard input, each with its number
+// Hands on the values of the command line or, where there are none, the lines of standard input (with another end than a newline), each with its number
 // and its place ("line 3") for messages. Results are flushed whenever the next line may have to be waited for, and at
 // the end.
 using ValueWork = std::function<void(const Secret& value, std::size_t index, const std::string& place)>;
-void forEachValue(const CLI::Option& given, Results& results, const ValueWork& work);
+void forEachValue(const CLI::Option& given, char end, Results& results, const ValueWork& work);
+
+// --null: records end in NUL bytes instead of newlines, in the input and in the results.
+void addNull(CLI::App& verb, char& end);
 
 // What takes the place of a result that cannot be given, so that results keep step with the input: an error object, or
 // an empty line.

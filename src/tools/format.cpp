@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw format: makes stored values of clear passwords.
 #include "command_line.h"
+#include "generate.h"
 #include "messages.h"
 #include "terminal.h"
 #include "values.h"
@@ -13,6 +14,8 @@ struct Options {
   std::string keys;
   std::string passwordFile;
   CLI::Option* secrets = nullptr;
+  char end = '\n';
+  std::size_t generate = 0;  // characters
   bool allowEmpty = false;
   bool json = false;
 };
@@ -34,7 +37,7 @@ const Scheme& chosenScheme(const Options& options) {
 class Maker {
  public:
   Maker(const Options& options, const Scheme& scheme, const KeyRecord& key)
-      : options_(options), scheme_(scheme), key_(key) {}
+      : results(options.end), options_(options), scheme_(scheme), key_(key) {}
 
   void make(const Secret& password, std::size_t index, const std::string& place) {
     const Status status =
@@ -45,8 +48,7 @@ class Maker {
       return showProblem(options_.json, status, index, results);
     }
     warnOfCut(password, place);
-    if (!options_.json) return results.line(value_.view());
-    results.line(Json().number("index", index).text("scheme", scheme_.name).text("value", value_.view()).end());
+    options_.json ? showJson(password, index) : showText(password);
   }
 
   ExitCode exitCode() const noexcept { return exitCode_; }
@@ -54,6 +56,20 @@ class Maker {
   Results results;
 
  private:
+  // A password that was made here is shown before its value.
+  void showText(const Secret& password) {
+    if (options_.generate > 0) results.write(password.view());
+    if (options_.generate > 0) results.write("\t");
+    results.line(value_.view());
+  }
+
+  void showJson(const Secret& password, std::size_t index) {
+    Json json;
+    json.number("index", index).text("scheme", scheme_.name).text("value", value_.view());
+    if (options_.generate > 0) json.text("password", password.view());
+    results.line(json.end());
+  }
+
   void warnOfCut(const Secret& password, const std::string& place) {
     if (!scheme_.cuts(password.size())) return;
     const std::string what =
@@ -76,7 +92,12 @@ ExitCode format(const Options& options) {
   if (scheme.needsProvider) requireProvider();
   const KeyRecord key = KeyRecord::load(scheme.needsKey() ? options.keys : "");
   Maker maker(options, scheme, key);
-  SecretSource passwords(options.passwordFile);
+  if (options.generate > 0) {
+    maker.make(generatePassword(options.generate), 1, "the new password");
+    maker.results.flush();
+    return maker.exitCode();
+  }
+  SecretSource passwords(options.passwordFile, options.end);
   Secret password = passwords.requireTwice("Password: ", "Password again: ", "password");
   std::size_t index = 1;
   do {
@@ -94,7 +115,14 @@ void setUpFormat(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
   verb.add_option("--scheme", options->scheme, "sha, ssha, md5, crypt, qveil, aes128, aes192 or aes256")->required();
   addKeys(verb, "--keys", options->keys, "key stash file, for the AES schemes");
-  addPath(verb, "--password-file", options->passwordFile, "read the passwords, one a line, from this file");
+  CLI::Option* file =
+      addPath(verb, "--password-file", options->passwordFile, "read the passwords, one a line, from this file");
+  verb.add_option("--generate", options->generate,
+                  "make a password of this many letters and digits, shown before its value")
+      ->check(CLI::Range(std::size_t{8}, std::size_t{1024}))
+      ->type_name("LENGTH")
+      ->excludes(file);
+  addNull(verb, options->end);
   verb.add_flag("--allow-empty", options->allowEmpty, "make a value of the empty password too");
   verb.add_flag("--json", options->json, "one JSON object a line");
   options->secrets = addRefusedSecrets(verb, "PASSWORD");

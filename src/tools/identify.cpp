@@ -10,6 +10,7 @@ namespace {
 
 struct Options {
   CLI::Option* values = nullptr;
+  char end = '\n';
   bool json = false;
 };
 
@@ -43,8 +44,8 @@ void showJson(const StoredValue& value, const char* problem, std::size_t index, 
 
 ExitCode identify(const Options& options) {
   ExitCode exitCode = kSuccess;
-  Results results;
-  forEachValue(*options.values, results, [&](const Secret& whole, std::size_t index, const std::string&) {
+  Results results(options.end);
+  forEachValue(*options.values, options.end, results, [&](const Secret& whole, std::size_t index, const std::string&) {
     const StoredValue value(whole);
     const char* problem = value.problem();
     if (problem != nullptr) keepFirst(exitCode, kBadValue);
@@ -58,6 +59,7 @@ ExitCode identify(const Options& options) {
 void setUpIdentify(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
   options->values = addValues(verb, "VALUE", "stored values; without any, one a line from standard input");
+  addNull(verb, options->end);
   verb.add_flag("--json", options->json, "one JSON object a line");
   verb.callback([options, &exitCode] { exitCode = identify(*options); });
 }

@@ -121,7 +121,7 @@ void Input::requireText() {
 }
 
 bool LineReader::lineBuffered() const noexcept {
-  return ended_ || buffer_.view().find('\n', position_) != std::string_view::npos;
+  return ended_ || buffer_.view().find(end_, position_) != std::string_view::npos;
 }
 
 // Drops what was handed out and reads once more; false at the end of the input.
@@ -141,7 +141,7 @@ bool LineReader::next(Secret& line) {
   line.clear();
   std::size_t searched = position_;
   for (;;) {
-    const std::size_t end = buffer_.view().find('\n', searched);
+    const std::size_t end = buffer_.view().find(end_, searched);
     if (end != std::string_view::npos) {
       line.append(buffer_.view().substr(position_, end - position_));
       position_ = end + 1;

@@ -54,11 +54,11 @@ class Input {
   const char* seems_ = "text";
 };
 
-// Splits an input into lines. The newline is no part of a line, a carriage return stays, and a last line without a
+// Splits an input into lines. The newline, or the other end that is asked for, is no part of a line, a carriage return stays, and a last line without a
 // newline counts.
 class LineReader {
  public:
-  explicit LineReader(Input input) : input_(std::move(input)) {}
+  explicit LineReader(Input input, char end = '\n') : input_(std::move(input)), end_(end) {}
 
   // Puts the next line into line; false at the end of the input.
   bool next(Secret& line);
@@ -69,6 +69,7 @@ class LineReader {
   bool fill();
 
   Input input_;
+  char end_;
   Secret buffer_;
   std::size_t position_ = 0;
   bool ended_ = false;

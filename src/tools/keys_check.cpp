@@ -10,6 +10,7 @@ struct Options {
   std::string sync;
   std::string saltFile;
   bool json = false;
+  bool quiet = false;
 };
 
 ExitCode check(const Options& options) {
@@ -20,6 +21,7 @@ ExitCode check(const Options& options) {
   int isMatch = 0;
   requireDone(checkKeyStashFile(withSalt ? 1 : 0, record.get(), options.sync.c_str(), salt.c_str(), &isMatch),
               options.file);
+  if (options.quiet) return isMatch == 1 ? kSuccess : kNoMatch;
   Results results;
   results.line(options.json ? Json().flag("match", isMatch == 1).end() : isMatch == 1 ? "match" : "no match");
   results.flush();
@@ -33,6 +35,7 @@ void setUpKeysCheck(CLI::App& verb, ExitCode& exitCode) {
   addKeys(verb, "FILE", options->file, "key stash file")->required();
   verb.add_option("--sync", options->sync, "sync text")->required();
   addPath(verb, "--salt-file", options->saltFile, "compare the salt too, with the first line of this file");
+  verb.add_flag("--quiet", options->quiet, "show no result: the exit code has it");
   verb.add_flag("--json", options->json, "the result as a JSON object");
   verb.callback([options, &exitCode] { exitCode = check(*options); });
 }

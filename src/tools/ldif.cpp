@@ -56,7 +56,8 @@ void setUpLdif(CLI::App& verb, ExitCode& exitCode) {
   verb.add_option("--threads", options->source.threads, "threads to work with (default: one a processor)")
       ->check(CLI::Range(1U, 256U));
   verb.add_flag("--verbose", options->verbose, "in an audit, report every value");
-  verb.add_flag("--json", options->json, "counts as JSON, on standard output");
+  CLI::Option* json = verb.add_flag("--json", options->json, "counts as JSON, on standard output");
+  verb.add_flag("--quiet", options->quiet, "no counts after a conversion")->excludes(json);
   verb.footer(kFooter);
   verb.callback([options, &exitCode] { exitCode = run(*options); });
 }

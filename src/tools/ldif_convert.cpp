@@ -240,7 +240,7 @@ ExitCode convertExport(const LdifOptions& options) {
   const Part sum = runExport(
       input, source, [&](RecordWalker& walker, Part& part) { convertBatch(walker, conversion, part); }, deliver);
   if (file) file->commit();
-  showSummary(sum.tally, target, options.json);
+  if (!options.quiet) showSummary(sum.tally, target, options.json);
   return sum.exitCode;
 }
 

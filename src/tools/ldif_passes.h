@@ -22,6 +22,7 @@ struct LdifOptions {
   bool allowBinary = false;  // what opens into bytes that are not text is taken for right
   bool verbose = false;
   bool json = false;
+  bool quiet = false;  // no counts
 };
 
 // Converts the password values to another scheme or other keys, and leaves every other byte alone.

@@ -26,7 +26,7 @@ void Results::write(std::string_view bytes) {
 
 void Results::line(std::string_view text) {
   buffer_.append(text);
-  write("\n");
+  write({&end_, 1});
 }
 
 void Results::flush() {

@@ -15,12 +15,14 @@ namespace tool {
 // Gathers results and writes them to standard output. Its buffer is wiped. Throws Failure with kIoError.
 class Results {
  public:
+  explicit Results(char end = '\n') noexcept : end_(end) {}
   void write(std::string_view bytes);
   void line(std::string_view text);
   void flush();
 
  private:
   Secret buffer_;
+  char end_;  // of a line
 };
 
 // Builds a JSON object in memory that is wiped: a JSON library's buffers are not. Text that is not well-formed UTF-8 is

@@ -11,11 +11,13 @@ namespace {
 struct Options {
   CLI::Option* values = nullptr;
   std::string keys;
+  char end = '\n';
   bool json = false;
 };
 
-bool isOneLine(const Secret& clear) {
-  return clear.view().find_first_of(std::string_view("\n\0", 2)) == std::string_view::npos;
+bool isOneLine(const Secret& clear, char end = '\n') {
+  const char ends[] = {end, '\0'};
+  return clear.view().find_first_of(std::string_view(ends, 2)) == std::string_view::npos;
 }
 
 void showJson(const Scheme& scheme, const Secret& clear, std::size_t index, Results& results) {
@@ -30,23 +32,24 @@ ExitCode reveal(const Options& options) {
   if (!options.keys.empty()) requireProvider();  // no value can be opened by it without keys
   const KeyRecord key = KeyRecord::load(options.keys);
   ExitCode exitCode = kSuccess;
-  Results results;
+  Results results(options.end);
   Repeated problems(kMostOfAKind, message);
-  forEachValue(*options.values, results, [&](const Secret& whole, std::size_t index, const std::string& place) {
-    const StoredValue value(whole);
-    Secret clear;
-    Status status = openValue(value, key, clear);
-    if (status.ok() && !options.json && !isOneLine(clear)) {
-      status = {kBadValue, "the password is not one line of text: --json shows it"};
-    }
-    keepFirst(exitCode, status.code);
-    if (!status.ok()) {
-      problems.add(place + ": " + status.text, status.text);
-      showProblem(options.json, status, index, results);
-    } else {
-      options.json ? showJson(value.scheme(), clear, index, results) : results.line(clear.view());
-    }
-  });
+  forEachValue(*options.values, options.end, results,
+               [&](const Secret& whole, std::size_t index, const std::string& place) {
+                 const StoredValue value(whole);
+                 Secret clear;
+                 Status status = openValue(value, key, clear);
+                 if (status.ok() && !options.json && !isOneLine(clear, options.end)) {
+                   status = {kBadValue, "the password is not one line of text: --json shows it"};
+                 }
+                 keepFirst(exitCode, status.code);
+                 if (!status.ok()) {
+                   problems.add(place + ": " + status.text, status.text);
+                   showProblem(options.json, status, index, results);
+                 } else {
+                   options.json ? showJson(value.scheme(), clear, index, results) : results.line(clear.view());
+                 }
+               });
   return exitCode;
 }
 
@@ -56,6 +59,7 @@ void setUpReveal(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
   options->values = addValues(verb, "VALUE", "stored values; without any, one a line from standard input");
   addKeys(verb, "--keys", options->keys, "key stash file, for the AES schemes");
+  addNull(verb, options->end);
   verb.add_flag("--json", options->json,
                 "one JSON object a line: the password as text, or as passwordBase64 where it is not one line of UTF-8");
   verb.callback([options, &exitCode] { exitCode = reveal(*options); });

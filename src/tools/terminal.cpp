@@ -65,10 +65,10 @@ Secret promptSecret(const char* prompt) {
 
 }  // namespace
 
-SecretSource::SecretSource(const std::string& path)
+SecretSource::SecretSource(const std::string& path, char end)
     : interactive_((path.empty() || path == "-") && isatty(kInput) == 1),
       name_(Input::nameOf(path)),
-      lines_(Input(path)) {}
+      lines_(Input(path), end) {}
 
 // What a line has from the system that it comes from, and nobody types.
 void SecretSource::warnOfStrayBytes(const Secret& line) {

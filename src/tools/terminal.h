@@ -17,7 +17,7 @@ namespace tool {
 class SecretSource {
  public:
   // An empty path, or "-", means standard input.
-  explicit SecretSource(const std::string& path);
+  explicit SecretSource(const std::string& path, char end = '\n');
 
   bool interactive() const noexcept { return interactive_; }
   // The next secret, or false at the end. At a terminal, prompt (a static text) asks for it and a line of any length is

@@ -5,6 +5,7 @@
 #include "messages.h"
 #include "terminal.h"
 #include "values.h"
+#include "verify_batch.h"
 
 namespace tool {
 namespace {
@@ -14,9 +15,11 @@ struct Options {
   std::string valueFile;
   std::string passwordFile;
   std::string keys;
+  BatchOptions batch;
   CLI::Option* secrets = nullptr;
   bool clear = false;
   bool json = false;
+  bool quiet = false;
 };
 
 Secret storedValue(const Options& options) {
@@ -48,6 +51,7 @@ Status checkPassword(const Options& options, const StoredValue& value) {
 void show(const Options& options, const Scheme& scheme, const Status& status) {
   const bool answered = status.code <= kNoMatch;
   if (!answered) message(status.text);
+  if (options.quiet) return;
   Results results;
   if (options.json) {
     results.line(answered ? Json().text("scheme", scheme.name).flag("match", status.ok()).end()
@@ -58,7 +62,20 @@ void show(const Options& options, const Scheme& scheme, const Status& status) {
   results.flush();
 }
 
+ExitCode batch(const Options& options) {
+  if (!options.value->empty() || !options.valueFile.empty() || !options.passwordFile.empty()) {
+    throw Failure(kUsage, "--batch has the values and the passwords");
+  }
+  BatchOptions all = options.batch;
+  all.keys = options.keys;
+  all.clear = options.clear;
+  all.json = options.json;
+  all.quiet = options.quiet;
+  return verifyBatch(all);
+}
+
 ExitCode verify(const Options& options) {
+  if (!options.batch.file.empty()) return batch(options);
   refuseSecrets(options.secrets, "password");
   const Secret whole = storedValue(options);
   const StoredValue value(whole);
@@ -79,6 +96,12 @@ void setUpVerify(CLI::App& verb, ExitCode& exitCode) {
   addPath(verb, "--password-file", options->passwordFile, "read the password from the first line of this file");
   addKeys(verb, "--keys", options->keys, "key stash file, for the AES schemes");
   verb.add_flag("--clear", options->clear, "take a value without a tag as a clear password");
+  CLI::Option* many = addPath(verb, "--batch", options->batch.file,
+                              "check many: lines of value, tab, password in this file; a line of result for each");
+  addPath(verb, "--ldif", options->batch.ldif, "export of the values: --batch has lines of DN, tab, password")
+      ->needs(many);
+  verb.add_flag("--null", options->batch.null, "lines of --batch and of its results end in NUL bytes")->needs(many);
+  verb.add_flag("--quiet", options->quiet, "show no result: the exit code has it");
   verb.add_flag("--json", options->json, "the result as a JSON object");
   verb.footer(
       "Exit code: 0 match, 1 no match, 2 usage, 3 unknown or malformed value, 4 missing or wrong key, "
