@@ -38,7 +38,7 @@ target_compile_options(ldappw_options INTERFACE
   $<$<CONFIG:Release>:-ffile-prefix-map=${PROJECT_SOURCE_DIR}=.>)
 target_compile_definitions(ldappw_options INTERFACE $<$<CONFIG:Release>:_FORTIFY_SOURCE=3>)
 if(LDAPPW_COVERAGE)
-  target_compile_options(ldappw_options INTERFACE --coverage)
+  target_compile_options(ldappw_options INTERFACE --coverage -fprofile-update=atomic)
   target_link_options(ldappw_options INTERFACE --coverage)
 endif()
 

@@ -30,7 +30,7 @@ void toParent(char* path) noexcept {
   const int length = std::snprintf(folder, sizeof folder, "%s%s%s", here, *here == '\0' ? "" : "/", info.dli_fname);
   if (length < 0 || static_cast<std::size_t>(length) + sizeof "/.." > sizeof folder) return void(*folder = '\0');
   toParent(folder);
-  char* end = std::strchr(folder, '\0');
+  char* end = folder + std::strlen(folder);
   if (end - folder < 3 || std::strcmp(end - 3, "/..") != 0) return toParent(folder);
   std::memcpy(end, "/..", sizeof "/..");  // the name of its parent is not in the text
 }
