@@ -27,8 +27,8 @@ bool sameName(std::string_view a, std::string_view b) noexcept {
 }
 
 bool beginsWithName(std::string_view text, std::string_view name) noexcept {
-  return text.size() >= name.size() &&
-         std::equal(name.begin(), name.end(), text.begin(), [](char a, char b) { return lower(a) == lower(b); });
+  return text.size() >= name.size() && std::equal(name.begin(), name.end(), text.begin(),
+                                                  [](char a, char b) { return a == b || lower(a) == lower(b); });
 }
 
 std::string_view trimSpaces(std::string_view text) noexcept {
