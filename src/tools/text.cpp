@@ -2,6 +2,7 @@
 #include "text.h"
 
 #include <algorithm>
+#include <array>
 #include <cstdint>
 #include <cstdio>
 
@@ -16,9 +17,13 @@ std::uint32_t byteAt(std::string_view text, std::size_t i) noexcept {
   return static_cast<unsigned char>(text[i]);
 }
 
-bool isBase64(char c) noexcept {
-  return (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9') || c == '+' || c == '/';
-}
+constexpr auto kIsBase64 = [] {
+  std::array<bool, 256> digits{};
+  for (const char c : std::string_view("ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/")) {
+    digits[static_cast<unsigned char>(c)] = true;
+  }
+  return digits;
+}();
 
 }  // namespace
 
@@ -97,7 +102,8 @@ long base64Bytes(std::string_view text) noexcept {
   std::size_t pads = 0;
   while (pads < 2 && pads < text.size() && text[text.size() - 1 - pads] == '=') ++pads;
   const std::string_view digits = text.substr(0, text.size() - pads);
-  if (!std::all_of(digits.begin(), digits.end(), isBase64)) return -1;
+  if (!std::all_of(digits.begin(), digits.end(), [](char c) { return kIsBase64[static_cast<unsigned char>(c)]; }))
+    return -1;
   return static_cast<long>(text.size() / 4 * 3 - pads);
 }
 
