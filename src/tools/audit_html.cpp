@@ -47,7 +47,7 @@ Html escaped(std::string_view raw) {
     const auto* found = std::find_if(std::begin(kEscapes), std::end(kEscapes),
                                      [&](const auto& row) { return row.first == character.front(); });
     if (const unsigned point = turningPoint(character); point != 0) {
-      char code[8];
+      char code[16];
       snprintf(code, sizeof code, "\\u%04X", point);
       html.text += code;
     } else {
