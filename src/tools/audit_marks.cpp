@@ -98,6 +98,7 @@ void Reuse::add(const Facts& batch) {
 // several, are one entry.
 std::vector<DnStore::Place> Reuse::membersOf(const Run& run) const {
   std::vector<std::pair<std::size_t, DnStore::Place>> named;
+  named.reserve(run.last - run.first);
   for (std::size_t i = run.first; i < run.last; ++i) {
     named.emplace_back(std::hash<std::string>()(dns_.at(sightings_[i].second)), sightings_[i].second);
   }
