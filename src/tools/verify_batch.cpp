@@ -162,7 +162,7 @@ ExitCode checkEntries(const BatchOptions& options, const KeyRecord& key) {
       }
     }
   };
-  runExport(input, source, work, [](std::string_view) {});
+  runExport(input, source, work, [](const Part&) {});
   Answers answers(options);
   for (const Status& status : waiting.answers()) answers.add(status, false);
   return answers.finish();
