@@ -57,10 +57,6 @@ inline Failure withoutProvider() {
               both(replacing(qelLibraryName, "not_there.so"), replacing(pQEL_GetStatus, nullptr)));
 }
 
-inline Failure withoutDigests() {
-  return replacing(pQEL_EVP_get_digestbyname, [](void*, const char*) -> const void* { return nullptr; });
-}
-
 // What a call gives and the last line that it traces: without what is usual about it, and with its class unless it is
 // of the error class.
 inline std::string outcomeOf(const std::string& operation, const std::function<std::string()>& call) {

@@ -573,23 +573,4 @@ TEST(QelDeathTest, ReportsItsFolder) {
   }
 }
 
-// The library leaves nothing behind but what its first use did, and works for those that are inside.
-int closeAndOpen() {
-  size_t blocksBefore = 0;
-  for (int i = 0; i < 200; ++i) {
-    void* library = dlopen(kProvider.c_str(), RTLD_NOW | RTLD_LOCAL);
-    auto* newDigest = entry(library, "QEL_EVP_MD_CTX_new", QEL_EVP_MD_CTX_new);
-    auto* cleanup = entry(library, "QEL_Cleanup", QEL_Cleanup);
-    QEL_CTX* ctx = entry(library, "QEL_Init", QEL_Init)(nullptr, nullptr);
-    if (newDigest(ctx) == nullptr || dlclose(library) != 0 || newDigest(ctx) == nullptr) return kBad;
-    if (cleanup(ctx, nullptr) != 1) return kBad;
-    if (i == 1) blocksBefore = blocks->size();
-  }
-  return blocks->size() == blocksBefore ? kGood : kBad;
-}
-
-TEST(QelDeathTest, IsClosedAndOpenedAgain) {
-  EXPECT_EQ(inChild(closeAndOpen), kGood);
-}
-
 }  // namespace
