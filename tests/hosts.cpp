@@ -83,26 +83,6 @@ void worksInThreads() {
   });
 }
 
-// Another sink comes with another user, and never with the former one's.
-template <int kNumber>
-void setSink() {
-  static char user;
-  ldtr_set_sink([](const ldtr_record*, void* given) { CHECK(given == &user); }, &user);
-}
-
-void changesItsSink() {
-  std::atomic<bool> done{false};
-  setSink<0>();
-  trcEvents = LDTR_EVENT_DEBUG;
-  std::thread other([&done] {
-    for (int i = 0; i < 300000; ++i) i % 2 == 0 ? setSink<0>() : setSink<1>();
-    done = true;
-  });
-  while (!done) check_format("{unknown}", 9);
-  other.join();
-  trcEvents = 0;
-}
-
 // Memory runs out somewhere in the first use: a refusal or a sound result, and no crash then or later.
 void runsOutOfMemory() {
   if (bump_refuse == nullptr) return;
@@ -271,7 +251,6 @@ struct Host {
 constexpr Host kHosts[] = {
     {"starts many threads", startsManyThreads, true},
     {"works in threads", worksInThreads},
-    {"changes its sink", changesItsSink},
     {"runs out of memory", runsOutOfMemory},
     {"is cancelled", isCancelled},
     {"traces into itself", tracesIntoItself},
