@@ -172,11 +172,13 @@ TEST(EachScheme, GivesNothingWhenMemoryRunsOut) {
     const int scheme = code;
     const std::string left = tag + std::string(500 - tag.size(), '\0');
     const std::string value = format(scheme, clear);
-    sweepAllocations(1, 0, [&] {
-      std::string out(500, '!');
-      const int length = format_password(scheme, std::string("ab").data(), keys(), clear.data(), 300, out.data(), 500);
-      return length != 0 || out != left;
-    });
+    for (const std::string& text : {clear, letters(100) + '\0' + letters(199)}) {
+      sweepAllocations(1, 0, [&] {
+        std::string out(500, '!');
+        const int length = format_password(scheme, std::string("ab").data(), keys(), text.data(), 300, out.data(), 500);
+        return length != 0 || out != left;
+      });
+    }
     sweepAllocations(1, 0, [&] { return verify(clear, value) == 0; });
     sweepAllocations(1, 1, [&] { return verify("!" + clear, value) != 0; });
     sweepAllocations(0, scheme >= 128 ? 80 : 90, [&] {
