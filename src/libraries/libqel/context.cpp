@@ -2,7 +2,6 @@
 // Provider contexts, their values and failures, and their random bytes.
 #include <openssl/crypto.h>
 #include <openssl/err.h>
-#include <openssl/evp.h>
 #include <sched.h>
 #include <unistd.h>
 
@@ -73,8 +72,11 @@ int drawRandom(const Call& call, unsigned char* buffer, int count) noexcept {
   int cancellation = PTHREAD_CANCEL_ENABLE;
   pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &cancellation);
   const auto bytes = static_cast<std::size_t>(count);
-  const bool isThere = OPENSSL_init_crypto(0, nullptr) == 1;
-  const bool works = isThere && EVP_RAND_generate(seedSource, buffer, bytes, 0, 0, nullptr, 0) == 1;
+  bool works = OPENSSL_init_crypto(0, nullptr) == 1;
+  for (std::size_t at = 0; works && at < bytes; at += SeedSource::kMostBytes) {
+    const std::size_t part = std::min(bytes - at, SeedSource::kMostBytes);
+    works = seedSource.generate(seedSource.state, buffer + at, part, 0, 0, nullptr, 0) == 1;
+  }
   pthread_setcancelstate(cancellation, nullptr);
   if (works) return 1;
   return call.failOpenssl(QEL_REASON_RANDOM_FAILURE, "the random generator failed");

@@ -73,8 +73,15 @@ struct Algorithm {
 // Read once, before there is a provider context, and there until the process ends.
 inline Algorithm algorithms[2][255];  // by type; twice as many as there are
 inline std::size_t algorithmCounts[2];
-inline void* providerContext;     // for the making of states
-inline EVP_RAND_CTX* seedSource;  // of random bytes
+inline void* providerContext;  // for the making of states
+
+// OpenSSL's source of seeds, as its provider serves it. Fills so many bytes at the most.
+struct SeedSource {
+  static constexpr std::size_t kMostBytes = 128;
+  void* state;
+  OSSL_FUNC_rand_generate_fn* generate;
+};
+inline SeedSource seedSource;
 
 // Starts OpenSSL and reads the algorithms, unless that is done. One thread at a time; may be tried again.
 bool startOpenssl() noexcept;

@@ -30,15 +30,19 @@ bool isAmong(const char* names, const char* name) noexcept {
   }
 }
 
+void readFunctions(const OSSL_DISPATCH* dispatch, Algorithm& algorithm) noexcept {
+  for (; dispatch->function_id != 0; ++dispatch) {
+    if (dispatch->function_id < kFunctions) algorithm.functions[dispatch->function_id] = dispatch->function;
+  }
+}
+
 // False for one that is not served. A cipher is when it gives back what it took, through a start, updates of any size
 // and an end: authenticated ones do not, nor those that wrap keys or take their data at once.
 bool read(const OSSL_ALGORITHM& source, Type type, Algorithm& algorithm) noexcept {
   algorithm = {};
   algorithm.type = type;
   algorithm.names = source.algorithm_names;
-  for (const OSSL_DISPATCH* each = source.implementation; each->function_id != 0; ++each) {
-    if (each->function_id < kFunctions) algorithm.functions[each->function_id] = each->function;
-  }
+  readFunctions(source.implementation, algorithm);
   unsigned mode = EVP_CIPH_STREAM_CIPHER;
   int isAuthenticated = 0, takesAllAtOnce = 0;
   OSSL_PARAM wanted[] = {OSSL_PARAM_construct_size_t(OSSL_DIGEST_PARAM_SIZE, &algorithm.size),
@@ -70,12 +74,29 @@ void readAll(OSSL_PROVIDER* provider, Type type, int operation) noexcept {
   algorithmCounts[type] = static_cast<std::size_t>(next - algorithms[type]);
 }
 
-EVP_RAND_CTX* newSeedSource(OSSL_LIB_CTX* library) noexcept {
-  EVP_RAND* method = EVP_RAND_fetch(library, "SEED-SRC", nullptr);
-  EVP_RAND_CTX* source = method == nullptr ? nullptr : EVP_RAND_CTX_new(method, nullptr);
-  EVP_RAND_free(method);
-  if (source != nullptr && EVP_RAND_instantiate(source, 0, 0, nullptr, 0, nullptr) == 1) return source;
-  return EVP_RAND_CTX_free(source), nullptr;
+template <typename Function>
+Function* function(const Algorithm& algorithm, int id) noexcept {
+  return reinterpret_cast<Function*>(algorithm.functions[id]);
+}
+
+// Asking the provider spares the fetch by name, for which OpenSSL lists all names that it knows: half of its start.
+bool startSeedSource(OSSL_PROVIDER* provider) noexcept {
+  int mustNotBeKept = 0;
+  Algorithm source{};
+  const OSSL_ALGORITHM* all = OSSL_PROVIDER_query_operation(provider, OSSL_OP_RAND, &mustNotBeKept);
+  for (const OSSL_ALGORITHM* each = all; each != nullptr && each->algorithm_names != nullptr; ++each) {
+    if (isAmong(each->algorithm_names, "SEED-SRC")) readFunctions(each->implementation, source);
+  }
+  OSSL_PROVIDER_unquery_operation(provider, OSSL_OP_RAND, all);
+  auto* make = function<OSSL_FUNC_rand_newctx_fn>(source, OSSL_FUNC_RAND_NEWCTX);
+  auto* start = function<OSSL_FUNC_rand_instantiate_fn>(source, OSSL_FUNC_RAND_INSTANTIATE);
+  seedSource.generate = function<OSSL_FUNC_rand_generate_fn>(source, OSSL_FUNC_RAND_GENERATE);
+  if (make == nullptr || start == nullptr || seedSource.generate == nullptr) return false;
+  seedSource.state = make(OSSL_PROVIDER_get0_provider_ctx(provider), nullptr, nullptr);
+  if (seedSource.state == nullptr) return false;
+  if (start(seedSource.state, 0, 0, nullptr, 0, nullptr) == 1) return true;
+  function<OSSL_FUNC_rand_freectx_fn>(source, OSSL_FUNC_RAND_FREECTX)(seedSource.state);
+  return false;
 }
 
 }  // namespace
@@ -87,8 +108,7 @@ bool startOpenssl() noexcept {
   if (OPENSSL_init_crypto(OPENSSL_INIT_NO_ATEXIT, nullptr) != 1) return false;
   OSSL_LIB_CTX* library = OSSL_LIB_CTX_new();
   OSSL_PROVIDER* provider = library == nullptr ? nullptr : OSSL_PROVIDER_load(library, "default");
-  seedSource = provider == nullptr ? nullptr : newSeedSource(library);
-  if (seedSource == nullptr) return OSSL_LIB_CTX_free(library), false;
+  if (provider == nullptr || !startSeedSource(provider)) return OSSL_LIB_CTX_free(library), false;
   readAll(provider, kDigest, OSSL_OP_DIGEST);
   readAll(provider, kCipher, OSSL_OP_CIPHER);
   for (Usual& each : usual) each.algorithm = findAlgorithm(each.type, each.spelling);
