@@ -99,7 +99,7 @@ no such scheme|2||audit --accept ssha,{NONE} fine
 an empty item|2||audit --accept ssha, fine
 no export|2||audit --json
 standard input twice|2||audit - --known-bad -
-two results on standard output|2|.*standard output.*|audit fine --json --html -
+two results on standard output|2|.*"code":2\}|audit fine --json --html -
 a page that exists|2||audit fine --html page
 missing list|5||audit fine --known-bad none
 empty list|3||audit fine --known-bad /dev/null

@@ -173,7 +173,7 @@ void setUpAudit(CLI::App& verb, ExitCode& exitCode) {
   const CLI::Option* exports = addValues(verb, "EXPORT", "exports to read; - is standard input")->required();
   const CLI::Option* failOn = addValues(verb, "--fail-on", "findings that the policy forbids, separated by commas");
   const CLI::Option* accept = addValues(verb, "--accept", "schemes that the policy allows, separated by commas");
-  addPath(verb, "--keys", options->keys, "key stash file that opens the AES values");
+  addKeys(verb, "--keys", options->keys, "key stash file that opens the AES values");
   addPath(verb, "--known-bad", options->knownBad, "file of known bad passwords, one a line");
   verb.add_flag("--check-hashes", options->checkHashes,
                 "try known bad passwords, uid and cn on one-way values: as many checks, at the cost of each scheme");

@@ -94,7 +94,7 @@ std::vector<std::string> auditedNames() {
 }
 
 void AuditRules::loadKnownBad(const std::string& path) {
-  LineReader lines{path == "-" ? Input() : Input(path)};
+  LineReader lines{Input(path)};
   Sha256 sha256;
   Secret line;
   while (lines.next(line)) {
@@ -170,15 +170,18 @@ void Collector::judge(const Secret& value, bool current, Subtree& subtree) {
   const char* problem = stored.problem();
   const Condition condition = conditionOf(stored, problem);
   const Scheme& scheme = stored.scheme();
-  const auto strength = static_cast<std::size_t>(scheme.strength);
+  const bool locked = condition == Condition::kLocked;
+  const bool altered = condition == Condition::kPadded || condition == Condition::kEncoded;
+  const Strength worth = locked ? Strength::kLocked : altered ? Strength::kUnknown : scheme.strength;
+  const auto strength = static_cast<std::size_t>(worth);
   ++facts_->schemes[rowOf(scheme)];
   ++facts_->strengths[strength];
   ++subtree.values;
   ++subtree.strengths[strength];
-  if (isFinding(scheme.strength)) found(findingOf(scheme.strength));
-  if (condition == Condition::kMalformed || condition == Condition::kForeign) found(Finding::kMalformed);
+  if (isFinding(worth) && !altered) found(findingOf(worth));
+  if (altered || condition == Condition::kMalformed || condition == Condition::kForeign) found(Finding::kMalformed);
   if (!rules_.accepted.empty() && !rules_.accepted[rowOf(scheme)]) found(Finding::kNotAccepted);
-  if (current && problem == nullptr) judgeValue(stored);
+  if (current && problem == nullptr && !locked && !altered) judgeValue(stored);
 }
 
 void Collector::judgeValue(const StoredValue& value) {
