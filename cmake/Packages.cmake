@@ -52,8 +52,10 @@ files of CMake and pkg-config.")
 
 set(CPACK_DEBIAN_TOOL_PACKAGE_NAME ldappw)
 set(CPACK_DEBIAN_TOOL_PACKAGE_SECTION admin)
-# The package of the library that the command opens at run time, named by the rules for libraries.
-string(REGEX REPLACE "([0-9])[.]so[.]" "\\1-" opened "${LDAPPW_LDAP_SONAME}")
+# The packages of the libraries that the command opens at run time, named by the rules for libraries; OpenSSL comes with
+# the provider.
+string(JOIN ", " opened ${LDAPPW_LDAP_SONAME} ${LDAPPW_ARGON2_SONAME} ${LDAPPW_CRYPT_SONAME})
+string(REGEX REPLACE "([0-9])[.]so[.]" "\\1-" opened "${opened}")
 string(REPLACE ".so." "" CPACK_DEBIAN_TOOL_PACKAGE_DEPENDS "${opened}")
 set(CPACK_COMPONENT_TOOL_DESCRIPTION "stored passwords and key files of an LDAP directory server
 The ldappw command makes, identifies, checks and reveals stored passwords,

@@ -301,6 +301,77 @@ said 'a cut in a check' 'warning: with clear only the first 46 bytes'
 check 'reveal from standard input' 3 'secret..secret' reveal <mixed
 said 'the number of the value' '^ldappw: line 4: the tag is of no known scheme'
 
+# Values that pwdhash, doveadm, slappasswd, mkpasswd and passlib have made of "secret".
+while IFS= read -r value; do
+  check "foreign $value" 0 match verify -- "$value" <<<secret
+  check "foreign $value, another password" 1 'no match' verify -- "$value" <<<Secret
+done <<'ROWS'
+{SMD5}wMhWRf3bkgrQqmBHRrz4CR5dBtQ=
+{SSHA256}U2qQedkN417sU2soQ0uZbSyD9h5ToM8wqpdjSAhZy1yRVotdybtl3w==
+{SSHA384}n2YhMlZojiw0bI67bx8iEimz5ZnDzMW1o/Pgh6rwckKeCwoualVeNyhJ4hjRh+QW4aq1tpP1ttc=
+{SSHA512}vybE/u0RBlpviq4W8icCHBJairbw0Alx4S3wPN997sfHok9Y8mAAssdhhwX00TkoJ05jl2rnsnnDaB/i4zt2kvVy+bw0TAfF
+{SHA256}K7gNU3sdo+OL0wNhqoVWhr3g6s1xYv72ol/pe/Unols=
+{SHA384}WKd1ukESvjAFrkQHznV9iP2nHUBJe7gCbsrFTU4//HIyzo3jq1rLMK45dg/ufFPt
+{SHA512}vSsar3708Jvp9Szi2NWZZ02Bqp1qRCFpbcTZPdBhnWgs5WtNZKnvCXdhztmeD2cmW192CF5bDufKRpayrW/isg==
+{PBKDF2-SHA1}10000$ObLy2y3LfhOIsfz9ZPdMzldj6kiRI0mJ$qNLwXTgDL3nQmWc5MiXvJ6LjfUc=
+{PBKDF2-SHA256}10000$9AP9JR1E2KSk5mR81pFdIkO+tKSKiSdA$nRDALKQCycDqlXuf+FEIa7N7qpiYDVC+Vhr2AoNeDX4=
+{PBKDF2-SHA512}10000$pBCcQy44vMJv+BivTaNIeS3eXK7Mmaes$JlO72F6tole47cHQVEZad12OlJL5Nm/LLLbbjxVTtgmAKQwpM6LCCADfqt1aZfiBqn/+CZ38MBBME8iGqtn2NQ==
+{crypt}$5$Xm$w77Cj56HBNw1ZA2ahS8zfpVmmHNjAAY4HLrBuOoUKg3
+{GOST_YESCRYPT}$gy$j9T$DMRWzktHK5Hk0QTr1qXaS/$H0qKLj9QLrHS9pmiuCjeVhkKQN62/tK8H5KYVTlPRgC
+{PBKDF2}$1$ObEjipkF12afBkeh$5000$2c970ddf0da66ef7b5eaebbcd62913b65ada8802
+{SCRAM-SHA-256}4096,a0LTKmpH4OztsuQlk+AUAQ==,7+UnLWhhT7C79XuNLJ5nVjfJDeqpv3sZVx+ard7zjtM=,gD/Qi6HCL9/Zl8SISdpqwZosHM85QjwpnDrb8ERXP6A=
+{ARGON2I}$argon2i$v=19$m=32768,t=4,p=1$4RqXNKYtEKuUoDZmhV6HQA$XPbAHWG1BamI0vAykgyplHX5jJkljDgywKyssFx7NMc
+{ARGON2ID}$argon2id$v=19$m=65536,t=3,p=1$6Efk+9RhbuSm/YHEuw4geg$+XZDRbou0GHK+JKPcU534PvrDKGViFkIITkiZaQrlBM
+{BLF-CRYPT}$2y$05$9ieJVqK60QbqbZegWvh4s.oDzGABP7ViI0f4TibZB06lDPgz11os6
+{SHA512-CRYPT}$6$iF4huNgJyyqbym9h$E/UnBFtn4u.M/e6Qk.TXd1tpIHMJmGTHQ9durtTBgD1BUOvZyg0d6LYFaY8E1qvBKT97gWFkhJEDClXJS2Y.m0
+{PLAIN-MD5}5ebe2294ecd0e0f08eab7690d2a6ee69
+{LDAP-MD5}Xr4ilOzQ4PCOq3aQ0qbuaQ==
+{SHA1}5en6G6MezRroT3XKqkdPOmY/BfQ=
+{MD5}$1$OSgPS168$JDi7QivvA8C321fWDgA2h0
+{PBKDF2}10000$t7VrCGPe9b/yKN5LNfDQUg$5AhHB0a6paVMQo0xWnrUmG8JlzE
+{PBKDF2-SHA256}10000$oKJIQhKH.88q/6frwYKb5A$rsdV6jHXcbAwY5Ztgh2yg2M77ZscGqaiWged0ao8ZOc
+{PBKDF2-SHA512}10000$sAI.GWVb85FcTB5EH8vZsQ$eW3IijyvAsuDPVzidcJ7c0kN1.hM1aCHjGBAqX0MzEGlElih9ZZhiyJbapJws0YXRBj6ESOtc8NEw1KrIQ8fIw
+{ARGON2}$argon2i$v=19$m=4096,t=3,p=1$+oytGx5z2WsiVom9sFqLQQ$FsL2ufdRT2d8ol4A/r4sgKPb3E4SAYy0V7gkLK2iR2k
+{CRYPT}$y$j7T$c/w8QFw0KT8cS5PZ$/UpbKK9iiZobKGwPWG.76N7C5BiO.E3hsn0pAkfS/Z6
+{CRYPT}$7$BU..../....PDiPjRFiivVA5.LtzmhI.1$jFit661uAyBw52Flzwj8wHwzUQYtLMVgqNq4pSAB5x7
+{CRYPT}$md5,rounds=85327$s2DqDYT9$$n3ggj2LKCxePKKqmsVfbN.
+{CRYPT}_J9..DkV7tNLdkKkc49I
+{CRYPT}$3$$878d8014606cda29677a44efa1353fc7
+{NT}878d8014606cda29677a44efa1353fc7
+{CRYPT}$sha1$480000$lshbi.AY$x2X2CwPkOr4PTAEUhACrBHHxGE8s
+{PBKDF2_SHA256}AAAgAL5J37mInzNTOIwxN9P0AskER+Ar7euAm4Wt78CsTngcPIVq63peOmvySss8mjqTyvmN/cgzGWDCbwQzZdRzgiNFyQ0rbPxtFa/jtfC08lyi7XEbqEg41ltSCjb5JIjb1NAQ0/dc9HGt+RgzLftJTH21GF+xeu3Xkb+DIm+2F/3PKJZ5fnEG8Ux58PZo90Ye7tfBiTkyD05hFsS/QgPrg+eCFnvSij5W5lDT5gMiaq6srPLyRGpW++a1QzGqSH90RXvf8EzdKIAfsSqLTfpS+anodHZe2/MoNac4yJsTjxSfpCftOLxusVIikv+HlybLOeCro+Byq2HWtQPB25Ke7LVSDzMSkYY3ZAKXqALttPX9ZVhOCkXxnDgFo7AV9y+Z/E4Ce9GwJF2WplIk96kurBZcgWh4fjQpV7TbIZyRhsBE
+{CRYPT}ba7BQloW.9hYU
+{CLEARTEXT}secret
+{base64}c2VjcmV0
+ROWS
+for scheme in argon2id pbkdf2-sha512 yescrypt sha512-crypt ssha512 {ARGON2} {PBKDF2-SHA512} 'ssha --salt-bytes 4' \
+  'argon2id --rounds 1 --memory 64 --parallelism 2 --salt-bytes 64' 'pbkdf2-sha512 --rounds 1000 --salt-bytes 8'; do
+  run "format $scheme" 0 format --scheme $scheme <<<"$euro"
+  value=$(<out) && check "verify $scheme" 0 match verify "$value" <<<"$euro"
+  check "refuse $scheme" 1 'no match' verify "$value" <<<"${euro}x"
+done
+A=$(printf 'a%.0s' {1..86}); printf 'x%.0s' {1..512} >long
+rows <<ROWS
+argon2id's costs|0|\\{ARGON2\\}.argon2id.v=19.m=7168,t=5,p=1.[^ ]{22}.[^ ]{43}|format --scheme argon2id
+costs that are chosen|0|\\{ARGON2\\}.argon2id.v=19.m=64,t=2,p=4.[^ ]{11}.[^ ]{43}|format --scheme argon2id --rounds 2 --memory 64 --parallelism 4 --salt-bytes 8
+salt that is chosen|0|\\{SSHA\\}.{32}|format --scheme ssha --salt-bytes 4
+rounds of crypt|0|\\{CRYPT\\}.6.rounds=1234.*|format --scheme sha512-crypt --rounds 1234
+too little memory|2||format --scheme argon2id --memory 7
+too little memory a lane|3||format --scheme argon2id --memory 8 --parallelism 2
+no rounds|2||format --scheme argon2id --rounds 0
+a cost that the scheme has not|2||format --scheme sha --rounds 2
+too long for crypt|3||format --scheme yescrypt --password-file long
+elsewhere|3||verify '{SASL}user@realm'
+too much memory|3||verify '{ARGON2}\$argon2id\$v=19\$m=4194304,t=3,p=1\$c2FsdHNhbHQ\$dGFnZ3RhZ2c'
+too many passes|3||verify '{ARGON2}\$argon2i\$v=19\$m=64,t=4294967295,p=1\$c2FsdHNhbHQ\$dGFnZ3RhZ2c'
+too many iterations|3||verify '{PBKDF2}2147483647\$c2FsdA\$c2VjcmV0c2VjcmV0c2VjcmV0'
+too many rounds|3||verify '{CRYPT}\$6\$rounds=999999999\$saltsalt\$$A'
+too high a cost|3||verify '{CRYPT}\$2b\$31\$${A:0:53}'
+too many blocks|3||verify '{CRYPT}\$y\$jzT\$abc\$${A:0:43}'
+too many blocks of scrypt|3||verify '{CRYPT}\$7\$zU..../....abc\$${A:0:43}'
+reveal of a tagged clear password|0|secret|reveal '{CLEARTEXT}secret'
+ROWS
+
 # ---- identify: value, columns ----
 rows=()
 while IFS='|' read -r columns value; do

@@ -2,6 +2,8 @@
 // The parts of the command line that verbs have in common.
 #include "command_line.h"
 
+#include <cstdint>
+
 #include "input.h"
 #include "key_record.h"
 
@@ -22,6 +24,12 @@ CLI::Option* addKeys(CLI::App& verb, const std::string& name, std::string& path,
                                         "group that may read stash files; without it that of their owner")
       ->type_name("GROUP");
   return addPath(verb, name, path, help);
+}
+
+void addCosts(CLI::App& verb, Costs& costs) {
+  for (const CostName& cost : kCostNames) {
+    verb.add_option(cost.option, costs.*cost.member, cost.help)->check(CLI::Range(1U, UINT32_MAX));
+  }
 }
 
 // A value list of the parser's own would split a value that is wrapped in brackets and drop "{}".

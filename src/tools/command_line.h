@@ -10,6 +10,7 @@
 
 #include "failure.h"
 #include "results.h"
+#include "scheme.h"
 #include "secret.h"
 
 namespace tool {
@@ -38,6 +39,9 @@ CLI::Option* addPath(CLI::App& verb, const std::string& name, std::string& path,
 
 // --keys, or an argument in its place; and --keys-group.
 CLI::Option* addKeys(CLI::App& verb, const std::string& name, std::string& path, const std::string& help);
+
+// The options for what new values cost.
+void addCosts(CLI::App& verb, Costs& costs);
 
 // Any number of positional values.
 CLI::Option* addValues(CLI::App& verb, const std::string& name, const std::string& help);

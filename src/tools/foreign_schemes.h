@@ -17,7 +17,7 @@ extern const std::initializer_list<Scheme> kForeignSchemes;
 // The row of a tag in braces and the payload behind it, or null.
 const Scheme* foreignSchemeOf(std::string_view tag, std::string_view payload) noexcept;
 
-// By name or by tag, in any case; null when there is none.
+// By name or by tag, in any case; of several rows of a tag one that can be made. Null when there is none.
 const Scheme* findForeignScheme(std::string_view name) noexcept;
 
 // The place of a row among those of kSchemes, followed by those of kForeignSchemes.

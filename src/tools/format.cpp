@@ -13,6 +13,7 @@ struct Options {
   std::string scheme;
   std::string keys;
   std::string passwordFile;
+  Costs costs;
   CLI::Option* secrets = nullptr;
   char end = '\n';
   std::size_t generate = 0;  // characters
@@ -41,7 +42,7 @@ class Maker {
 
   void make(const Secret& password, std::size_t index, const std::string& place) {
     const Status status =
-        password.empty() && !options_.allowEmpty ? kEmpty : makeValue(scheme_, key_, password, value_);
+        password.empty() && !options_.allowEmpty ? kEmpty : makeValue(scheme_, key_, password, value_, options_.costs);
     keepFirst(exitCode_, status.code);
     if (!status.ok()) {
       problems_.add(place + ": " + status.text, status.text);
@@ -89,6 +90,7 @@ class Maker {
 ExitCode format(const Options& options) {
   refuseSecrets(options.secrets, "password");
   const Scheme& scheme = chosenScheme(options);
+  completeCosts(scheme, options.costs);  // refuses what the scheme does not have before a password is asked for
   if (scheme.needsProvider) requireProvider();
   const KeyRecord key = KeyRecord::load(scheme.needsKey() ? options.keys : "");
   Maker maker(options, scheme, key);
@@ -113,7 +115,11 @@ ExitCode format(const Options& options) {
 
 void setUpFormat(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  verb.add_option("--scheme", options->scheme, "sha, ssha, md5, crypt, qveil, aes128, aes192 or aes256")->required();
+  verb.add_option("--scheme", options->scheme,
+                  "sha, ssha, md5, crypt, qveil, aes128, aes192, aes256; of other servers argon2id, pbkdf2-sha512, "
+                  "yescrypt, sha512-crypt, ssha512")
+      ->required();
+  addCosts(verb, options->costs);
   addKeys(verb, "--keys", options->keys, "key stash file, for the AES schemes");
   CLI::Option* file =
       addPath(verb, "--password-file", options->passwordFile, "read the passwords, one a line, from this file");

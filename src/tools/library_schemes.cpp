@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <cstring>
 
+#include "foreign_values.h"
 #include "key_record.h"
 #include "password_schemes.h"
 #include "text.h"
@@ -20,14 +21,10 @@ constexpr char kCryptCharacters[] = "./0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZabcde
 constexpr Status kNoMatchStatus{kNoMatch, "the password does not match"};
 
 bool drawCryptSalt(char (&salt)[3]) noexcept {
-  unsigned char random[2];
-  ssize_t count = 0;
-  do {
-    count = getrandom(random, sizeof random, 0);
-  } while (count < 0 && errno == EINTR);
-  if (count != static_cast<ssize_t>(sizeof random)) return false;
-  salt[0] = kCryptCharacters[random[0] & 63U];
-  salt[1] = kCryptCharacters[random[1] & 63U];
+  char random[2];
+  if (!drawRandom(random, sizeof random)) return false;
+  salt[0] = kCryptCharacters[static_cast<unsigned char>(random[0]) & 63U];
+  salt[1] = kCryptCharacters[static_cast<unsigned char>(random[1]) & 63U];
   salt[2] = '\0';
   return true;
 }
@@ -80,17 +77,34 @@ const char* clearPasswordProblem(std::string_view password) {
   return "as clear text the password would be taken for a value of another scheme";
 }
 
-Status makeClear(const Scheme&, const KeyRecord&, const Secret& password, Secret& out) {
+Status makeClear(const Scheme&, const KeyRecord&, const Costs&, const Secret& password, Secret& out) {
   out.clear();
   out.append(password.view());
   return {};
 }
 
-Status makeByLibrary(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out) {
+Status makeByLibrary(const Scheme& scheme, const KeyRecord& key, const Costs&, const Secret& password, Secret& out) {
   return makeWithSalt(scheme, nullptr, key, password, out);
 }
 
-Status makeCrypt(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out) {
+Status makeSsha(const Scheme& scheme, const KeyRecord& key, const Costs& costs, const Secret& password, Secret& out) {
+  constexpr std::uint32_t kLibrarySaltBytes = 20;
+  const bool usual = costs.saltBytes == kLibrarySaltBytes;
+  return (usual ? makeByLibrary : makeSalted)(scheme, key, costs, password, out);
+}
+
+bool drawRandom(char* out, std::size_t bytes) noexcept {
+  while (bytes > 0) {
+    const ssize_t count = getrandom(out, bytes, 0);
+    if (count < 0 && errno == EINTR) continue;
+    if (count <= 0) return false;
+    out += count;
+    bytes -= static_cast<std::size_t>(count);
+  }
+  return true;
+}
+
+Status makeCrypt(const Scheme& scheme, const KeyRecord& key, const Costs&, const Secret& password, Secret& out) {
   char salt[3];
   if (!drawCryptSalt(salt)) return {kInternal, "no random bytes for a salt"};
   return makeWithSalt(scheme, salt, key, password, out);

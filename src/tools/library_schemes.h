@@ -18,9 +18,17 @@ const char* maskedProblem(const PayloadRule& rule, std::string_view payload);
 const char* shaPasswordProblem(std::string_view password);
 const char* clearPasswordProblem(std::string_view password);
 
-Status makeClear(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out);
-Status makeByLibrary(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out);
-Status makeCrypt(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out);  // draws a salt
+Status makeClear(const Scheme& scheme, const KeyRecord& key, const Costs& costs, const Secret& password, Secret& out);
+Status makeByLibrary(const Scheme& scheme, const KeyRecord& key, const Costs& costs, const Secret& password,
+                     Secret& out);
+Status makeCrypt(const Scheme& scheme, const KeyRecord& key, const Costs& costs, const Secret& password,
+                 Secret& out);  // draws a salt
+
+// Of 20 bytes of salt unless the costs ask for others.
+Status makeSsha(const Scheme& scheme, const KeyRecord& key, const Costs& costs, const Secret& password, Secret& out);
+
+// Bytes of the system's generator; false when it has none.
+bool drawRandom(char* out, std::size_t bytes) noexcept;
 
 Status openClear(const StoredValue& value, const KeyRecord& key, Secret& out);
 Status openByLibrary(const StoredValue& value, const KeyRecord& key, Secret& out);

@@ -4,6 +4,7 @@
 #ifndef LDAPPW_TOOLS_SCHEME_H
 #define LDAPPW_TOOLS_SCHEME_H
 
+#include <cstdint>
 #include <initializer_list>
 #include <string_view>
 
@@ -36,6 +37,30 @@ struct PayloadRule {
   const char* text;
 };
 
+// What a value is to cost whoever checks it, where its scheme leaves that open; 0 for the scheme's own choice.
+struct Costs {
+  std::uint32_t rounds = 0;
+  std::uint32_t memoryKib = 0;
+  std::uint32_t parallelism = 0;
+  std::uint32_t saltBytes = 0;
+};
+struct CostName {
+  std::uint32_t Costs::*member;
+  const char* option;
+  const char* help;
+};
+constexpr CostName kCostNames[] = {
+    {&Costs::rounds, "--rounds", "iterations of PBKDF2, rounds of crypt, passes of Argon2"},
+    {&Costs::memoryKib, "--memory", "memory of Argon2 in KiB"},
+    {&Costs::parallelism, "--parallelism", "lanes of Argon2"},
+    {&Costs::saltBytes, "--salt-bytes", "bytes of salt"},
+};
+struct CostRules {
+  Costs least;
+  Costs usual;
+  Costs most;  // 0: the scheme has no such cost
+};
+
 struct Scheme {
   const char* name;      // "ssha"; "clear" for clear text
   std::string_view tag;  // "{SSHA}", in any case; empty for clear text. Other programs' rows: all tags, one by one
@@ -51,13 +76,15 @@ struct Scheme {
   // Null: every password is accepted; values cannot be made, checked or opened. The functions are called when the
   // password, the payload and the key have been found to be in order.
   const char* (*passwordProblem)(std::string_view password);
-  Status (*make)(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out);
+  Status (*make)(const Scheme& scheme, const KeyRecord& key, const Costs& costs, const Secret& password, Secret& out);
   Status (*check)(const StoredValue& value, const KeyRecord& key, const Secret& password);
   Status (*open)(const StoredValue& value, const KeyRecord& key, Secret& out);
 
   Strength strength;
-  const char* writers;        // programs that write such values
-  std::string_view prefix{};  // of the payload, where several algorithms share a tag
+  const char* writers;  // programs that write such values
+  const CostRules* costs = nullptr;
+  const char* algorithm = "";  // for the functions of the row
+  std::string_view prefix{};   // of the payload, where several algorithms share a tag
 
   bool needsKey() const noexcept { return keyIndex >= 0; }
   bool reversible() const noexcept { return kind == Kind::kReversible; }

@@ -16,6 +16,7 @@ namespace {
 
 constexpr int kNoKey = -1;
 constexpr PayloadRule kAny{nullptr, 0, 0, 0, nullptr};
+constexpr CostRules kSalt{{0, 0, 0, 4}, {0, 0, 0, 20}, {0, 0, 0, 64}};
 constexpr PayloadRule kBlocks{base64Problem, 16, LONG_MAX, 16, "the payload is not a whole number of 16-byte blocks"};
 
 // clang-format off
@@ -37,8 +38,8 @@ const std::initializer_list<Scheme> kSchemes = {
          Strength::kUnsalted, "ldappw, slapd, 389-ds, Dovecot, passlib"},
     {"ssha", "{SSHA}", FORMAT_SSHA, Kind::kOneWay, 0, 0, kNoKey, true,
          {base64Problem, 20, LONG_MAX, 1, "the payload holds less than a digest of 20 bytes"}, "",
-         nullptr, makeByLibrary, checkByLibrary, nullptr,
-         Strength::kSaltedFast, "ldappw, slapd, 389-ds, Dovecot, passlib"},
+         nullptr, makeSsha, checkByLibrary, nullptr,
+         Strength::kSaltedFast, "ldappw, slapd, 389-ds, Dovecot, passlib", &kSalt, "SHA1"},
     {"md5", "{MD5}", FORMAT_MD5, Kind::kOneWay, 0, 0, kNoKey, true,
          {base64Problem, 16, 16, 1, "the payload does not hold 16 bytes"}, "$",
          nullptr, makeByLibrary, checkByLibrary, nullptr,

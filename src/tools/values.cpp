@@ -35,11 +35,30 @@ Status passwordProblem(const Scheme& scheme, std::string_view password) {
   return problem != nullptr ? Status{kBadValue, problem} : Status{};
 }
 
-Status makeValue(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out) {
+Status makeValue(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out, const Costs& costs) {
   const Status problem = passwordProblem(scheme, password.view());
   if (!problem.ok()) return problem;
   if (scheme.needsKey() && !key) return kNoKey;
-  return scheme.make(scheme, key, password, out);
+  return scheme.make(scheme, key, completeCosts(scheme, costs), password, out);
+}
+
+Costs completeCosts(const Scheme& scheme, const Costs& chosen) {
+  constexpr CostRules kNone{};
+  const CostRules& rules = scheme.costs != nullptr ? *scheme.costs : kNone;
+  Costs costs = rules.usual;
+  for (const CostName& cost : kCostNames) {
+    const std::uint32_t number = chosen.*cost.member;
+    const std::uint32_t least = rules.least.*cost.member;
+    const std::uint32_t most = rules.most.*cost.member;
+    if (number == 0) continue;
+    if (most == 0) throw Failure(kUsage, std::string(scheme.name) + " has no " + cost.option);
+    if (number < least || number > most) {
+      throw Failure(kUsage, std::string(cost.option) + " of " + scheme.name + " is " + std::to_string(least) + " to " +
+                                std::to_string(most));
+    }
+    costs.*cost.member = number;
+  }
+  return costs;
 }
 
 Status openValue(const StoredValue& value, const KeyRecord& key, Secret& out) {

@@ -17,8 +17,13 @@ namespace tool {
 Status passwordProblem(const Scheme& scheme, std::string_view password);
 
 // Makes the stored value of a password; for clear text that is the password. The AES schemes need key (kBadKey
-// otherwise). Each call draws a salt of its own.
-Status makeValue(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out);
+// otherwise). Each call draws a salt of its own. Costs are those of completeCosts, or none.
+Status makeValue(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out,
+                 const Costs& costs = {});
+
+// What is chosen, and the scheme's own choice for the rest. Throws Failure with kUsage for a cost that the scheme does
+// not have or that it has within other bounds.
+Costs completeCosts(const Scheme& scheme, const Costs& chosen);
 
 // Turns a stored value into clear text; clear text comes back as it is. kBadValue for an unknown tag, a malformed
 // payload or a one-way scheme; kBadKey for an AES value when there is no key, or when the key does not open it.
