@@ -107,8 +107,45 @@ said 'control characters' 'line 2: cn=.x1B\[31m.x0A: unknown tag'
 run 'control characters in an audit' 3 ldif --audit --verbose --in in
 LC_ALL=C grep -q $'[\e\r]' out && fail 'an audit shows control characters'
 printf 'dn:: %s\npin: secret\nuserPassword: secret\nCODE: secret\n' "$(printf 'cn=\303\251' | b64)" >in
-run --attribute 0 ldif --to sha --attribute PIN --attribute code <in
+run --attribute 0 ldif --to sha --attribute PIN --attribute code in
 printf 'pin: %s\nuserPassword: secret\nCODE: %s\n' "$S" "$S" >expected; sed -i 1d out; sameFile --attribute expected out
+
+# Change records: one a value, whatever the dn and the value are made of; what comes to a value that the entry has goes.
+H=20200101000000Z#1.3.6.1.4.1.1466.115.121.1.40#
+printf 'dn: a\nuserPassword: secret\nuserPassword;x-t: %s\nsn: b\n\ndn:: Y8O8\nuserPassword:: c8O8\npwdHistory: %s6#secret\n\n' \
+  "{CLEAR}x" "$H" >in
+printf 'dn: c\nuserPassword: secret\nuserPassword: {CLEAR}secret\nuserPassword: %s\n\ndn: d\nuserPassword: {SHA}x\n' "$S" >>in
+change() { printf '%s\nchangetype: modify\ndelete: %s\n%s\n-\nadd: %s\n%s\n-\n\n' "$1" "${2%%:*}" "$2" "${3%%:*}" "$3"; }
+{ change 'dn: a' 'userPassword: secret' "userPassword: $S"
+  change 'dn: a' 'userPassword;x-t: {CLEAR}x' "userPassword;x-t: $(sha x)"
+  change 'dn:: Y8O8' 'userPassword:: c8O8' "userPassword: $(sha 's\303\274')"
+  change 'dn:: Y8O8' "pwdHistory: ${H}6#secret" "pwdHistory: ${H}33#$S"
+  printf 'dn: c\nchangetype: modify\ndelete: userPassword\nuserPassword: secret\nuserPassword: {CLEAR}secret\n-\n\n'; } >expected
+run changes 3 ldif --to sha --changes in
+sameFile changes expected out
+said changes '^ldappw: now sha: clear 4, plain 2'
+run 'changes of changes' 3 ldif --to sha --changes expected
+same 'changes of changes' '' "$(<out)"
+
+# To another server's scheme: what can be done now and what cannot, with and without the work; a second run has nothing to
+# do, and what an earlier run has made is not made again, but for the record that it had not finished.
+cost='--to argon2id --memory 8 --rounds 1'
+run 'dry run' 3 ldif $cost --dry-run --out none --json in
+json 'dry run' "(d[0]['values'], d[0]['made'], d[0]['oneWay'], d[0]['malformed']) == (8, 6, 1, 1) and
+  d[0]['now'] == {'clear': 4, 'plain': 2} and d[0]['atNextLogin'] == {'sha': 1}"
+[ ! -e none ] || fail 'a dry run has written a file'
+head -n -3 in >good
+run 'to argon2id' 0 ldif $cost --changes --out made good
+same 'to argon2id' '5 6' "$(grep -c '^userP.*{ARGON2}.argon2id.v=19.m=8,t=1,p=1' made) $(grep -c '{ARGON2}' made)"
+head -c -1 made >cut
+run resumed 0 ldif $cost --changes --resume cut --out again --json good
+json resumed "(d[0]['made'], d[0]['resumed']) == (6, 5)"
+sameFile resumed <(head -c 900 made) <(head -c 900 again)
+run 'resumed export' 0 ldif $cost --resume made good
+same 'resumed export' "$(grep -c '{ARGON2}' made)" "$(grep '{ARGON2}' out | grep -cFf <(grep -o '{ARGON2}.*' made))"
+cp out once; run 'a second run' 0 ldif $cost --json --out twice once
+json 'a second run' "(d[0]['made'], d[0]['done'], d[0]['oneWay']) == (0, 6, 1)"
+sameFile 'a second run' once twice
 
 # Keys: rotation and back gives the sample again; other keys open nothing, not even the one value in 250 whose padding
 # comes out right by chance.
@@ -131,17 +168,24 @@ run 'a value that does not verify' 3 ldif --to aes256 --new-keys A --in in
 sameFile 'a value that does not verify' in out
 run 'trial of it' 3 trial in --keys A
 said 'trial of it' '^ldappw: line 2: a: aes192: the value does not verify'
+printf 'dn: %s\nuserPassword: secret%s\n\n' {1..400}{,} >in
+{ "$tool" ldif --to aes256 --new-keys A in | head -300; "$tool" ldif --to aes256 --new-keys B in | tail -900; } >both 2>err
+run 'a rotation that had stopped' 0 ldif --to aes256 --keys C --keys A --new-keys B --json --out all both
+json 'a rotation that had stopped' "(d[0]['made'], d[0]['done'], d[0]['failed']) == (100, 300, 0)"
+run 'the rotation once more' 0 ldif --to aes256 --keys C --new-keys B --in all
+sameFile 'the rotation once more' all out
+run 'audit with all its keys' 0 ldif --audit --keys C --keys A --keys B both
 run 'longer than qveil holds' 3 ldif --to qveil --keys B --allow-binary --in b
 kept=$(unfold out | grep -ci '^userpassword: {AES256}') long=$(grep -c 'more bytes than' err)
 [[ $kept == "$long" && $kept -gt 100 ]] || fail "qveil: $kept kept, $long listed"
 printf 'dn: a\nuserPassword: 123456789\n\ndn: b\nuserPassword:< file:///x\n' >in
 run 'longer than crypt takes' 0 ldif --to crypt --in in --out crypted --json
-json 'the counts' "d == [{'entries': 2, 'values': 2, 'made': 1, 'cut': 1, 'asTheyAre': 0, 'oneWay': 0, 'urls': 1,
+json 'the counts' "d == [{'entries': 2, 'values': 2, 'made': 1, 'cut': 1, 'resumed': 0, 'done': 0, 'asTheyAre': 0, 'oneWay': 0, 'urls': 1,
   'deleted': 0, 'authPasswords': 0, 'fixed': 0, 'dropped': 0, 'locked': 0, 'wrapped': 0, 'unknownTags': 0, 'malformed': 0,
-  'failed': 0}]"
+  'failed': 0, 'now': {'clear': 1}, 'atNextLogin': {}}]"
 said 'longer than crypt takes' 'warning: 1 passwords are longer than the 8 bytes'
 run 'the counts as text' 0 ldif --to sha --in in
-same 'the counts as text' 'entries: 2,password values: 2,converted: 1,behind a URL, kept: 1' \
+same 'the counts as text' 'entries: 2,password values: 2,converted: 1,behind a URL, kept: 1,now sha: clear 1' \
   "$(sed 's/^ldappw: //' err | paste -sd,)"
 
 # Threads change nothing but the time, and a line may have any length.
@@ -200,6 +244,8 @@ not made|2||ldif --to vldl --in sample
 clear without leave|2||ldif --to clear --in sample
 no new keys|2||ldif --to aes128 --keys A --in sample
 audit with output|2||ldif --audit --out x --in sample
+audit with changes|2||ldif --audit --changes --in sample
+a cost that sha has not|2||ldif --to sha --rounds 3 --in sample
 audit with new keys|2||ldif --audit --new-keys A --in sample
 JSON among the export|2|.*"code":2\}|ldif --to sha --json --in sample
 the same keys|2||ldif --to aes256 --keys A --new-keys A --in sample
@@ -237,6 +283,12 @@ for signal in ${LDAPPW_SIGNALS:-TERM KILL}; do
 done
 exec 9>&-
 sameFile 'the old output after runs that failed' kept old
+printf 'dn: a\nuserPassword: secret\n\n' >in; python3 "$root/scripts/make_sample.py" --entries 9 --out small
+mkfifo changes; (exec "$tool" ldif --to argon2id --changes --threads 1 --out stopped changes 2>err) &
+command=$!; exec 9>changes; cat small >&9
+for _ in {1..600}; do compgen -G '.stopped.*' >/dev/null && break || sleep 0.1; done
+kill -TERM $command; cat small >&9; exec 9>&-; wait $command; rc=$?
+same 'a stop in order' "143 $(grep -c '^dn' stopped) 1" "$rc $(grep -c '^add: ' stopped) $(grep -c 'stopped before the end' err)"
 run 'the input as output' 0 ldif --to sha --in old --out old --force
 sameFile 'the input as output' one old
 same 'mode of a file that is replaced' 640 "$(mode old)"

@@ -19,11 +19,26 @@ CLI::Option* addPath(CLI::App& verb, const std::string& name, std::string& path,
   return verb.add_option(name, path, help)->type_name(name.front() == '-' ? "FILE" : "");
 }
 
-CLI::Option* addKeys(CLI::App& verb, const std::string& name, std::string& path, const std::string& help) {
+namespace {
+
+void addKeysGroup(CLI::App& verb) {
   verb.add_option_function<std::string>("--keys-group", allowKeysGroup,
                                         "group that may read stash files; without it that of their owner")
       ->type_name("GROUP");
+}
+
+}  // namespace
+
+CLI::Option* addKeys(CLI::App& verb, const std::string& name, std::string& path, const std::string& help) {
+  addKeysGroup(verb);
   return addPath(verb, name, path, help);
+}
+
+CLI::Option* addKeys(CLI::App& verb, const std::string& name, std::vector<std::string>& paths,
+                     const std::string& help) {
+  addKeysGroup(verb);
+  CLI::Option* option = verb.add_option(name, paths, help)->type_name("FILE");
+  return option->expected(1)->allow_extra_args(false)->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
 }
 
 void addCosts(CLI::App& verb, Costs& costs) {

@@ -39,6 +39,7 @@ CLI::Option* addPath(CLI::App& verb, const std::string& name, std::string& path,
 
 // --keys, or an argument in its place; and --keys-group.
 CLI::Option* addKeys(CLI::App& verb, const std::string& name, std::string& path, const std::string& help);
+CLI::Option* addKeys(CLI::App& verb, const std::string& name, std::vector<std::string>& paths, const std::string& help);
 
 // The options for what new values cost.
 void addCosts(CLI::App& verb, Costs& costs);

@@ -16,22 +16,26 @@
 
 #include "ldif_library.h"
 #include "messages.h"
+#include "signals.h"
 
 namespace tool {
 namespace {
 
 constexpr std::chrono::milliseconds kStep{200};
+constexpr std::chrono::milliseconds kLogStep{5000};  // where lines stay
+constexpr std::size_t kCostlyBatchBytes = std::size_t{4} << 10;
 constexpr char kClearLine[] = "\r\033[K";
 
 std::string whole(double number) {
   return std::to_string(static_cast<std::uint64_t>(number));
 }
 
-// A line on standard error with entries, rate and time left, when that is a terminal. Used by one thread at a time.
+// A line on standard error with entries, rate and time left, when that is a terminal; lines from time to time when they
+// are asked for and it is none. Used by one thread at a time.
 class Progress {
  public:
   // inputFd says how much there is to come, when it is a file. Results that go to a terminal are not disturbed.
-  Progress(int inputFd, bool resultsOnStdout);
+  Progress(int inputFd, bool resultsOnStdout, bool asked);
   ~Progress() { hide(); }
   Progress(const Progress&) = delete;
   Progress& operator=(const Progress&) = delete;
@@ -45,6 +49,7 @@ class Progress {
   using Clock = std::chrono::steady_clock;
 
   bool shown_;
+  bool logged_;
   bool visible_ = false;
   std::uint64_t total_ = 0;
   std::uint64_t entries_ = 0;
@@ -53,8 +58,9 @@ class Progress {
   Clock::time_point next_ = start_;
 };
 
-Progress::Progress(int inputFd, bool resultsOnStdout)
-    : shown_(isatty(STDERR_FILENO) == 1 && !(resultsOnStdout && isatty(STDOUT_FILENO) == 1)) {
+Progress::Progress(int inputFd, bool resultsOnStdout, bool asked)
+    : shown_(isatty(STDERR_FILENO) == 1 && !(resultsOnStdout && isatty(STDOUT_FILENO) == 1)),
+      logged_(asked && !shown_) {
   struct stat status {};
   if (fstat(inputFd, &status) == 0 && S_ISREG(status.st_mode)) total_ = static_cast<std::uint64_t>(status.st_size);
 }
@@ -63,15 +69,16 @@ void Progress::advance(std::uint64_t entries, std::uint64_t bytes) {
   entries_ += entries;
   bytes_ = bytes;
   const Clock::time_point now = Clock::now();
-  if (!shown_ || now < next_) return;
-  next_ = now + kStep;
+  if ((!shown_ && !logged_) || now < next_) return;
+  next_ = now + (logged_ ? kLogStep : kStep);
   const double seconds = std::chrono::duration<double>(now - start_).count();
   const double rate = seconds > 0 ? static_cast<double>(entries_) / seconds : 0;
-  std::string line = kClearLine + std::to_string(entries_) + " entries, " + whole(rate) + " a second";
+  std::string line = std::to_string(entries_) + " entries, " + whole(rate) + " a second";
   if (total_ > bytes_ && bytes_ > 0) {
     line += ", " + whole(seconds * static_cast<double>(total_ - bytes_) / static_cast<double>(bytes_)) + " s left";
   }
-  tryWrite(STDERR_FILENO, line);
+  if (logged_) return message(line);
+  tryWrite(STDERR_FILENO, kClearLine + line);
   visible_ = true;
 }
 
@@ -85,9 +92,9 @@ class Run {
   Run(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
       const std::function<void(const Part&)>& deliver)
       : input_(input),
-        reader_(input),
+        reader_(input, options.costly ? kCostlyBatchBytes : RecordReader::kBatchBytes),
         attributes_(options.attributes, options.others),
-        progress_(input.fd(), options.resultsOnStdout),
+        progress_(input.fd(), options.resultsOnStdout, options.progress),
         work_(work),
         deliver_(deliver) {}
 
@@ -130,7 +137,7 @@ class Run {
 
   bool take(Batch& batch) {
     const std::lock_guard<std::mutex> lock(reading_);
-    if (stopped() || !reader_.next(batch)) return false;
+    if (stopped() || stopIsAsked() || !reader_.next(batch)) return false;
     batch.inputBytes = input_.bytesRead();
     return true;
   }
@@ -156,6 +163,7 @@ class Run {
   }
 
   void reportWhole() const {
+    if (stopIsAsked()) return;
     if (sum_.tally.entries == 0) {
       throw Failure(kBadValue, input_.name() + " has no entry, no line that begins with \"dn:\"; it seems to be " +
                                    input_.seems());

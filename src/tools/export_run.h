@@ -46,6 +46,8 @@ struct ExportOptions {
   std::vector<std::string> others;      // attributes that hold no passwords and are stopped at all the same
   unsigned threads = 0;                 // 0: one a processor
   bool resultsOnStdout = false;         // the progress line stays away from them
+  bool progress = false;                // progress also where standard error is no terminal
+  bool costly = false;                  // values take so long that few at a time are worked on
 };
 
 // Opens the export, compressed or not, and the library that its lines need. Throws Failure.

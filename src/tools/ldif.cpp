@@ -22,10 +22,11 @@ object; with --verbose a line (with --json an object) for each value comes befor
 
 ExitCode run(const LdifOptions& options) {
   if (options.audit == !options.to.empty()) throw Failure(kUsage, "give either --to or --audit");
-  if (options.audit && (!options.newKeys.empty() || options.fix || options.out != "-")) {
-    throw Failure(kUsage, "--new-keys, --fix and --out go with --to");
+  if (options.audit && (!options.newKeys.empty() || options.changes || options.dryRun || !options.resume.empty() ||
+                        options.fix || options.out != "-")) {
+    throw Failure(kUsage, "--new-keys, --fix, --changes, --dry-run, --resume and --out go with --to");
   }
-  if (!options.audit && options.json && options.out == "-") {
+  if (!options.audit && options.json && options.out == "-" && !options.dryRun) {
     throw Failure(kUsage, "--json needs --out: the export goes to standard output");
   }
   return options.audit ? auditExport(options) : convertExport(options);
@@ -37,18 +38,24 @@ void setUpLdif(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<LdifOptions>();
   verb.add_option("--to", options->to, "scheme to convert the values to");
   verb.add_flag("--audit", options->audit, "count schemes and findings instead");
-  addKeys(verb, "--keys", options->keys, "key stash file that opens the AES values of the export");
+  addKeys(verb, "--keys", options->keys, "key stash file that opens the AES values of the export; may be repeated");
   addPath(verb, "--new-keys", options->newKeys, "key stash file for the new values");
   verb.add_option("--attribute", options->source.attributes,
                   "attribute that holds passwords, as often as there are such; without it userPassword, pwdHistory, "
                   "olcRootPW, nsslapd-rootpw and authPassword")
       ->expected(1)
+      ->allow_extra_args(false)
       ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll)
       ->type_name("NAME");
   CLI::Option* in = addPath(verb, "--in", options->source.in, "export to read, \"-\" (default) for standard input");
   addPath(verb, "FILE", options->source.in, "the same")->excludes(in);
   addPath(verb, "--out", options->out, "file to write (default: standard output); may be the one that is read");
   verb.add_flag("--force", options->force, "replace the file of --out");
+  verb.add_flag("--changes", options->changes, "write change records for ldapmodify in place of the export");
+  verb.add_flag("--dry-run", options->dryRun, "write nothing but the summary");
+  addPath(verb, "--resume", options->resume, "change records of a stopped run; what they hold is not made again");
+  verb.add_flag("--progress", options->source.progress, "show progress where standard error is no terminal too");
+  addCosts(verb, options->costs);
   verb.add_flag("--fix", options->fix, "unwrap values with blanks around them or encoded in base64 once more");
   verb.add_flag("--allow-clear", options->allowClear, "allow --to clear");
   verb.add_flag("--allow-binary", options->allowBinary,

@@ -11,10 +11,14 @@
 #include <unordered_map>
 #include <utility>
 
+#include "change_records.h"
 #include "condition.h"
+#include "key_ring.h"
+#include "library_schemes.h"
 #include "messages.h"
 #include "output_file.h"
 #include "password_schemes.h"
+#include "signals.h"
 #include "text.h"
 #include "values.h"
 
@@ -26,6 +30,8 @@ enum Total : std::size_t {
   kValues,
   kMade,
   kCut,
+  kResumed,
+  kDone,
   kAsTheyAre,
   kOneWay,
   kUrls,
@@ -44,6 +50,8 @@ constexpr CountName kNames[] = {
     {"values", "password values"},
     {"made", "converted"},
     {"cut", "of these cut by the scheme"},
+    {"resumed", "of these taken from the earlier run"},
+    {"done", "done already, kept"},
     {"asTheyAre", "clear already, kept"},
     {"oneWay", "one-way, kept"},
     {"urls", "behind a URL, kept"},
@@ -60,12 +68,15 @@ constexpr CountName kNames[] = {
 
 constexpr mode_t kNewFileMode = 0600;
 
+// Columns by scheme: what becomes of its values.
+enum Column : std::size_t { kNow, kLater };
+
 struct Conversion {
   const Scheme& target;
-  KeyRecord oldKeys;
+  const LdifOptions& options;
   KeyRecord newKeys;
-  bool allowBinary;
-  bool fix;
+  KeyRing keys;  // the new ones first
+  EarlierChanges earlier;
 };
 
 // What became of one value, and the problem if there is one.
@@ -74,22 +85,37 @@ struct Outcome {
   Status status;
 };
 
-Status openSource(const StoredValue& value, const Conversion& conversion, Secret& clear) {
-  const Status status = openValue(value, conversion.oldKeys, clear);
-  if (!status.ok() || value.scheme().isClear() || conversion.allowBinary || looksLikeText(clear.view())) return status;
-  return {kBadKey, "opens into bytes that are not text: a wrong key, or a binary password (--allow-binary)"};
-}
-
 // The new value takes the place of the only copy, so the server's own check has to accept it first, where it knows the
-// scheme.
+// scheme. A dry run spares the work that is long on purpose; such values have a salt, for which some random bytes stand.
 Status makeTarget(const Secret& clear, const Conversion& conversion, Secret& made) {
   const Scheme& target = conversion.target;
   if (target.reversible() && target.cuts(clear.size())) {
     return {kBadValue, "the password has more bytes than the scheme holds"};
   }
-  const Status status = makeValue(target, conversion.newKeys, clear, made);
+  if (conversion.options.dryRun && isCostly(target)) {
+    constexpr std::size_t kStandInBytes = 16;
+    made.resize(kStandInBytes);
+    drawRandom(made.data(), made.size());
+    return passwordProblem(target, clear.view());
+  }
+  const Status status = makeValue(target, conversion.newKeys, clear, made, conversion.options.costs);
   if (!status.ok() || target.code == FORMAT_NONE || serverAccepts(made, conversion.newKeys, clear)) return status;
   return {kBadValue, "the new value does not verify"};
+}
+
+// Of a scheme that the server's check does not know one value is checked before all others are made: twice the work for
+// each would be too much.
+void proveTarget(const Conversion& conversion) {
+  const Scheme& target = conversion.target;
+  if (target.code != FORMAT_NONE || target.isClear() || conversion.options.dryRun) return;
+  const KeyRecord none;
+  Secret made;
+  const Status status = makeTarget(Secret("probe"), conversion, made);
+  if (!status.ok()) throw Failure(status.code, status.text);
+  if (!checkValue(StoredValue(made), none, Secret("probe")).ok() ||
+      checkValue(StoredValue(made), none, Secret("Probe")).code != kNoMatch) {
+    throw Failure(kInternal, std::string("values of ") + target.name + " do not verify");
+  }
 }
 
 Outcome convertValue(const Secret& whole, const Conversion& conversion, Secret& made) {
@@ -102,11 +128,17 @@ Outcome convertValue(const Secret& whole, const Conversion& conversion, Secret& 
     return {wrapping == Wrapping::kLocked ? kLocked : kWrapped, {condition.code, condition.text}};
   }
   if (source.kind == Kind::kOneWay) {
+    if (&source == &conversion.target && condition.code == kSuccess) return {kDone, {}};
     return {condition.code == kSuccess ? kOneWay : kMalformed, {condition.code, condition.text}};
   }
   if (source.isClear() && conversion.target.isClear()) return {kAsTheyAre, {}};
   Secret clear;
-  Status status = openSource(value, conversion, clear);
+  std::size_t used = KeyRing::kNoKey;
+  // The new keys are for values that this run or an earlier one has made: those of another scheme are none of them.
+  const std::size_t first = conversion.newKeys && &source != &conversion.target ? 1 : 0;
+  Status status = conversion.keys.open(value, first, conversion.options.allowBinary, clear, used);
+  const bool underNew = !source.needsKey() || (conversion.newKeys && used == 0);
+  if (status.ok() && &source == &conversion.target && underNew && !value.tag().empty()) return {kDone, {}};
   if (status.ok()) status = makeTarget(clear, conversion, made);
   if (!status.ok()) return {kFailed, status};
   return {conversion.target.cuts(clear.size()) ? kCut : kMade, {}};
@@ -115,21 +147,31 @@ Outcome convertValue(const Secret& whole, const Conversion& conversion, Secret& 
 // What is within a padded or encoded value takes its place, converted where it can be.
 Outcome fixValue(const Secret& whole, const Conversion& conversion, Secret& made) {
   const Wrapping wrapping = wrappingOf(StoredValue(whole));
-  if (!conversion.fix || wrapping == Wrapping::kNone || wrapping == Wrapping::kLocked) {
+  if (!conversion.options.fix || wrapping == Wrapping::kNone || wrapping == Wrapping::kLocked) {
     return convertValue(whole, conversion, made);
   }
   Secret inner = unwrapped(whole, wrapping);
   const Outcome outcome = convertValue(inner, conversion, made);
-  if (outcome.total != kOneWay && outcome.total != kAsTheyAre) return outcome;
+  if (outcome.total != kOneWay && outcome.total != kAsTheyAre && outcome.total != kDone) return outcome;
   made = std::move(inner);
   return {kFixed, {}};
 }
 
-Outcome outcomeOf(const PasswordLine& password, const Conversion& conversion, Secret& made) {
+Outcome outcomeOf(const RecordWalker& walker, const Conversion& conversion, Secret& made) {
   constexpr Total kKept[] = {kMade, kUrls, kDeleted, kAuthPasswords};
-  if (password.form == ValueForm::kBytes) return fixValue(password.value, conversion, made);
+  const PasswordLine& password = walker.password();
   if (password.form == ValueForm::kBroken) return {kFailed, {kBadValue, password.problem}};
-  return {kKept[static_cast<std::size_t>(password.form)], {}};
+  if (password.form != ValueForm::kBytes) return {kKept[static_cast<std::size_t>(password.form)], {}};
+  if (conversion.options.changes && (walker.inChange() || walker.dn().empty() || walker.dn().front() == ':')) {
+    return {kFailed, {kBadValue, "no change can be written for a change record, or without a well-formed dn"}};
+  }
+  if (const Secret* earlier = conversion.earlier.find(walker, password.whole(password.value))) {
+    made = Secret(earlier->view().substr(password.history.size()));
+    if (!password.history.empty()) made = Secret(made.view().substr(made.view().find('#') + 1));
+    const StoredValue value(made);
+    if (&value.scheme() == &conversion.target && value.problem() == nullptr) return {kResumed, {}};
+  }
+  return fixValue(password.value, conversion, made);
 }
 
 // The values that the lines of one entry have come to. Servers refuse an entry with two equal ones.
@@ -160,29 +202,70 @@ class EntryValues {
   std::uint64_t group_ = 0;
 };
 
-void convertLine(const RecordWalker& walker, const Conversion& conversion, EntryValues& values, Part& part) {
-  Secret made;
-  const PasswordLine& password = walker.password();
-  const Outcome outcome = outcomeOf(password, conversion, made);
-  const bool changed = outcome.total == kMade || outcome.total == kCut || outcome.total == kFixed;
-  ++part.tally.totals[kValues];
-  if (!outcome.status.ok()) part.report(walker.lineNumber(), walker.dn(), outcome.status.code, outcome.status.text);
-  const Secret whole = password.whole(changed ? made : password.value);
-  if (password.form == ValueForm::kBytes && values.repeats(walker, whole, changed)) {
-    ++part.tally.totals[kDropped];
-    return;
-  }
-  ++part.tally.totals[outcome.total];
-  if (outcome.total == kCut) ++part.tally.totals[kMade];
-  changed ? writeChanged(walker.line(), password.description, whole, part.out) : part.out.append(walker.line().raw);
+constexpr bool isChanged(Total total) {
+  return total == kMade || total == kCut || total == kResumed || total == kFixed;
 }
 
-void convertBatch(RecordWalker& walker, const Conversion& conversion, Part& part) {
-  EntryValues values;
-  while (walker.next()) {
-    walker.atPassword() ? convertLine(walker, conversion, values, part) : part.out.append(walker.line().raw);
-  }
+// What the scheme's values come to, for the plan. A one-way value that is weaker than the new ones has to wait until its
+// owner presents the password.
+void countForPlan(const PasswordLine& password, Total total, const Conversion& conversion, Tally& tally) {
+  if (password.form != ValueForm::kBytes) return;
+  const Scheme& source = StoredValue(password.value).scheme();
+  if (source.kind == Kind::kUnknown) return;
+  const bool later = total == kOneWay && source.strength < conversion.target.strength;
+  if (isChanged(total)) ++tally.of(source)[kNow];
+  if (later && conversion.target.kind == Kind::kOneWay) ++tally.of(source)[kLater];
 }
+
+// One after the other the lines of a batch.
+class Converter {
+ public:
+  Converter(const Conversion& conversion, Part& part) : conversion_(conversion), part_(part) {}
+
+  void all(RecordWalker& walker) {
+    while (walker.next()) walker.atPassword() ? convert(walker) : keep(walker);
+    changes_.flush(part_.out);
+  }
+
+ private:
+  bool writesExport() const noexcept { return !conversion_.options.changes && !conversion_.options.dryRun; }
+  void keep(const RecordWalker& walker) {
+    if (writesExport()) part_.out.append(walker.line().raw);
+  }
+
+  void convert(const RecordWalker& walker) {
+    Secret made;
+    const PasswordLine& password = walker.password();
+    const Outcome outcome = outcomeOf(walker, conversion_, made);
+    const bool changed = isChanged(outcome.total);
+    auto& totals = part_.tally.totals;
+    ++totals[kValues];
+    if (!outcome.status.ok()) part_.report(walker.lineNumber(), walker.dn(), outcome.status.code, outcome.status.text);
+    const Secret whole = password.whole(changed ? made : password.value);
+    const bool repeated = password.form == ValueForm::kBytes && values_.repeats(walker, whole, changed);
+    ++totals[repeated ? kDropped : outcome.total];
+    if (!repeated && (outcome.total == kCut || outcome.total == kResumed)) ++totals[kMade];
+    countForPlan(password, outcome.total, conversion_, part_.tally);
+    write(walker, whole, changed, repeated);
+  }
+
+  void write(const RecordWalker& walker, const Secret& whole, bool changed, bool repeated) {
+    const PasswordLine& password = walker.password();
+    if (conversion_.options.dryRun) return;
+    if (!conversion_.options.changes) {
+      if (repeated) return;
+      return changed ? writeChanged(walker.line(), password.description, whole, part_.out) : keep(walker);
+    }
+    if (!changed && !repeated) return;
+    const Secret old = password.whole(password.value);
+    repeated ? changes_.drop(walker, old, whole, changed, part_.out) : changes_.replace(walker, old, whole, part_.out);
+  }
+
+  const Conversion& conversion_;
+  Part& part_;
+  EntryValues values_;
+  ChangeWriter changes_;
+};
 
 const Scheme& targetOf(const LdifOptions& options) {
   const Scheme* scheme = findScheme(options.to);
@@ -196,16 +279,34 @@ const Scheme& targetOf(const LdifOptions& options) {
   return *scheme;
 }
 
-void showSummary(const Tally& tally, const Scheme& target, bool json) {
+// The number of a column by scheme, "clear 3, aes256 2".
+std::string listed(const Tally& tally, Column column) {
+  std::string list;
+  forEachScheme(tally, column, [&](const Scheme& scheme, std::uint64_t count) {
+    list += (list.empty() ? "" : ", ") + std::string(scheme.name) + " " + std::to_string(count);
+  });
+  return list;
+}
+
+void addListed(Json& json, const char* name, const Tally& tally, Column column) {
+  json.open(name);
+  forEachScheme(tally, column, [&](const Scheme& scheme, std::uint64_t count) { json.number(scheme.name, count); });
+  json.close();
+}
+
+void showSummary(const Tally& tally, const Conversion& conversion) {
+  const Scheme& target = conversion.target;
   if (tally.totals[kCut] > 0) {
     warning(std::to_string(tally.totals[kCut]) + " passwords are longer than the " + std::to_string(target.cutBytes) +
             " bytes that " + target.name + " uses: only their beginnings will be checked");
   }
-  if (json) {
+  if (conversion.options.json) {
     Results results;
     Json object;
     object.number("entries", tally.entries);
     addCounts(object, kNames, tally.totals.data());
+    addListed(object, "now", tally, kNow);
+    addListed(object, "atNextLogin", tally, kLater);
     results.line(object.end());
     return results.flush();
   }
@@ -214,33 +315,52 @@ void showSummary(const Tally& tally, const Scheme& target, bool json) {
     const std::uint64_t count = tally.totals[total];
     if (total <= kMade || count > 0) message(std::string(kNames[total].text) + ": " + std::to_string(count));
   }
+  const std::string now = listed(tally, kNow);
+  const std::string later = listed(tally, kLater);
+  if (!now.empty()) message((conversion.options.dryRun ? "would now be " : "now ") + (target.name + (": " + now)));
+  if (!later.empty()) message(std::string(target.name) + " only at the next login: " + later);
+}
+
+Conversion conversionOf(const LdifOptions& options) {
+  const Scheme& target = targetOf(options);
+  completeCosts(target, options.costs);  // refuses what the scheme does not have
+  requireProvider();
+  std::vector<std::string> paths = options.keys;
+  paths.insert(paths.begin(), options.newKeys);
+  Conversion conversion{target, options, KeyRecord::load(options.newKeys), KeyRing(paths), {}};
+  const std::vector<KeyRecord>& keys = conversion.keys.keys();
+  for (std::size_t i = 1; conversion.newKeys && i < keys.size(); ++i) {
+    if (sameRecord(keys[i], conversion.newKeys)) throw Failure(kUsage, "--keys and --new-keys hold the same keys");
+  }
+  proveTarget(conversion);
+  return conversion;
 }
 
 }  // namespace
 
 ExitCode convertExport(const LdifOptions& options) {
-  const Scheme& target = targetOf(options);
-  requireProvider();
-  const Conversion conversion{target, KeyRecord::load(options.keys), KeyRecord::load(options.newKeys),
-                              options.allowBinary, options.fix};
-  if (conversion.oldKeys && conversion.newKeys && sameRecord(conversion.oldKeys, conversion.newKeys)) {
-    throw Failure(kUsage, "--keys and --new-keys hold the same keys");
-  }
+  Conversion conversion = conversionOf(options);
   Input input = openExport(options.source);
+  if (!options.resume.empty()) conversion.earlier.load(options.resume, AttributeSet(options.source.attributes));
   std::optional<OutputFile> file;
-  if (options.out != "-") {
+  if (options.out != "-" && !options.dryRun) {
     file.emplace(options.out, kNewFileMode, options.force);
     file->keepAccess();
   }
+  std::optional<GracefulStop> stop;  // what has been written of changes is whole, what of an export is not
+  if (options.changes) stop.emplace();
   const auto deliver = [&](const Part& part) {
     file ? file->write(part.out.view()) : writeAll(STDOUT_FILENO, part.out.view(), "standard output");
   };
   ExportOptions source = options.source;
   source.resultsOnStdout = !file;
+  source.costly = isCostly(conversion.target);
   const Part sum = runExport(
-      input, source, [&](RecordWalker& walker, Part& part) { convertBatch(walker, conversion, part); }, deliver);
+      input, source, [&](RecordWalker& walker, Part& part) { Converter(conversion, part).all(walker); }, deliver);
   if (file) file->commit();
-  if (!options.quiet) showSummary(sum.tally, target, options.json);
+  if (!options.quiet) showSummary(sum.tally, conversion);
+  if (stop && stopIsAsked()) message("stopped before the end of the export; --resume goes on with what was written");
+  if (stop) stop->finish();
   return sum.exitCode;
 }
 

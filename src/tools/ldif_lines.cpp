@@ -100,8 +100,8 @@ bool RecordReader::next(Batch& batch) {
       throw Failure(kBadValue, input_.name() + ": the record in line " + std::to_string(lines_ + 1) +
                                    " is larger than 256 MiB: no blank line ends it");
     }
-    ended_ = !input_.more(batch.text, kBatchBytes);
-    if (batch.text.size() < kBatchBytes) continue;
+    ended_ = !input_.more(batch.text, batchBytes_);
+    if (batch.text.size() < batchBytes_) continue;
     border = lastBorder(batch.text.view(), searched);
     searched = batch.text.size();
   }

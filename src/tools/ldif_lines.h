@@ -50,14 +50,16 @@ class RecordReader {
   // A record larger than this is refused: memory must not follow a file that has no records in it.
   static constexpr std::size_t kMaxRecordBytes = std::size_t{256} << 20;
 
-  explicit RecordReader(Input& input) noexcept : input_(input) {}
+  explicit RecordReader(Input& input, std::size_t batchBytes = kBatchBytes) noexcept
+      : input_(input), batchBytes_(batchBytes) {}
 
   // False at the end of the input. Throws Failure: kIoError, or kBadValue for a record that is too large.
   bool next(Batch& batch);
 
  private:
   Input& input_;
-  Secret ahead_;  // read already, but of the next batch
+  const std::size_t batchBytes_;  // at least, but for the last
+  Secret ahead_;                  // read already, but of the next batch
   std::uint64_t batches_ = 0;
   std::uint64_t lines_ = 0;
   bool ended_ = false;

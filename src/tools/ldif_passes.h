@@ -4,6 +4,7 @@
 #define LDAPPW_TOOLS_LDIF_PASSES_H
 
 #include <string>
+#include <vector>
 
 #include "export_run.h"
 
@@ -12,9 +13,13 @@ namespace tool {
 struct LdifOptions {
   ExportOptions source;
   std::string to;
-  std::string keys;
+  std::vector<std::string> keys;
   std::string newKeys;
   std::string out = "-";
+  std::string resume;  // change records of an earlier run, of which the new values are taken
+  Costs costs;
+  bool changes = false;  // write change records in place of the export
+  bool dryRun = false;
   bool audit = false;
   bool fix = false;  // values that are padded or encoded once more are unwrapped
   bool force = false;

@@ -123,7 +123,7 @@ Secret PasswordLine::whole(const Secret& changed) const {
 void RecordWalker::startRecord() noexcept {
   dn_.clear();
   ++group_;
-  inEntry_ = strayed_ = modify_ = inBlock_ = deleting_ = false;
+  inEntry_ = strayed_ = change_ = modify_ = inBlock_ = deleting_ = false;
 }
 
 // Outside an entry its dn is awaited, and the lines that frame an export or the answer to a search are let through.
@@ -155,6 +155,7 @@ void RecordWalker::readName(std::string_view text) {
 void RecordWalker::readControl(std::string_view name, std::string_view text) {
   if (sameName(name, "dn")) return readName(text);
   if (sameName(name, "changetype")) {
+    change_ = true;
     modify_ = sameName(trimSpaces(text), "modify");
     return;
   }
@@ -197,9 +198,10 @@ ValueForm RecordWalker::readFields(std::string_view type) {
 
 ValueForm RecordWalker::readValue(std::string_view text) {
   if (!text.empty() && text.front() == '<') return ValueForm::kUrl;
-  if (inBlock_ && deleting_) return ValueForm::kDeleted;
   const char* problem = valueProblem(text);
-  if (problem == nullptr && parseValue(text_, password_.value)) return ValueForm::kBytes;
+  const bool parsed = problem == nullptr && parseValue(text_, password_.value);
+  if (inBlock_ && deleting_) return ValueForm::kDeleted;
+  if (parsed) return ValueForm::kBytes;
   password_.problem = problem != nullptr ? problem : "the line cannot be parsed";
   return ValueForm::kBroken;
 }
@@ -241,16 +243,21 @@ bool RecordWalker::next() {
   return true;
 }
 
-void writeChanged(const LogicalLine& line, const std::string& description, const Secret& value, Secret& out) {
+void appendAttribute(const std::string& description, const Secret& value, Secret& out) {
   const LdifLibrary& library = ldifLibrary();
   const bool asText = value.empty() || library.isNotPrintable(value.c_str(), value.size()) == 0;
   Secret text;
   text.resize(LDIF_SIZE_NEEDED_WRAP(description.size(), value.size(), LDIF_LINE_WIDTH_MAX) + 1);
   char* end = text.data();
-  // Folding is done below: the library would end every line in a bare newline.
   library.putLine(&end, asText ? LDIF_PUT_TEXT : LDIF_PUT_BINARY, description.c_str(), value.c_str(), value.size(),
                   LDIF_LINE_WIDTH_MAX);
-  text.resize(static_cast<std::size_t>(end - text.data()));
+  out.append(text.view().substr(0, static_cast<std::size_t>(end - text.data())));
+}
+
+// Folding is done here: the library would end every line in a bare newline.
+void writeChanged(const LogicalLine& line, const std::string& description, const Secret& value, Secret& out) {
+  Secret text;
+  appendAttribute(description, value, text);
   std::string_view written = text.view();
   if (!written.empty() && written.back() == '\n') written.remove_suffix(1);
   line.folded() ? foldInto(written, line.firstEnd, out) : out.append(written);

@@ -49,7 +49,7 @@ struct PasswordLine {
   const char* problem = "";
   std::string description;  // the attribute and its options as spelt
   std::string history;      // of a pwdHistory value: its first two fields, "time#syntax#"
-  Secret value;             // of kBytes; of a pwdHistory value the last field
+  Secret value;             // of kBytes, where of a pwdHistory value it is the last field; of kDeleted
 
   // What stands in the entry when value becomes this one.
   Secret whole(const Secret& changed) const;
@@ -66,6 +66,7 @@ class RecordWalker {
 
   bool atPassword() const noexcept { return atPassword_; }
   const PasswordLine& password() const noexcept { return password_; }
+  bool inChange() const noexcept { return change_; }  // the record is not an entry but a change of one
   const LogicalLine& line() const noexcept { return line_; }
   std::uint64_t lineNumber() const noexcept { return lineNumber_; }
   const std::string& dn() const noexcept { return dn_; }  // decoded; empty when the record has none
@@ -103,10 +104,14 @@ class RecordWalker {
   bool atPassword_ = false;
   bool inEntry_ = false;   // the record has begun with its dn
   bool strayed_ = false;   // it has begun with something else, which has been noted
+  bool change_ = false;    // a record with a changetype
   bool modify_ = false;    // a record with "changetype: modify"
   bool inBlock_ = false;   // between "add: ..." and "-"
   bool deleting_ = false;  // the block is a "delete: ..." one
 };
+
+// Appends a line of an attribute, unfolded, as text or base64 as the value needs.
+void appendAttribute(const std::string& description, const Secret& value, Secret& out);
 
 // Appends the line that stands for value in place of line: with the attribute as spelt, as text or base64 as the value
 // needs, folded only when line was, with the line ends of line.

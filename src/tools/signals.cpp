@@ -34,6 +34,8 @@ struct TerminalState {
 };
 
 FileSlot fileSlots[kFileSlots];
+volatile sig_atomic_t stopsGracefully;
+volatile sig_atomic_t stopSignal;  // 0 until it has come
 TerminalState terminal;
 
 sigset_t endingSet() noexcept {
@@ -67,6 +69,10 @@ void handle(int number, void (*handler)(int)) noexcept {
 
 // The signal is blocked while its handler runs: raised again, it takes its default effect on the return.
 extern "C" void onEnd(int number) {
+  if (stopsGracefully != 0 && stopSignal == 0 && number != SIGPIPE) {
+    stopSignal = number;
+    return;
+  }
   undoAll();
   signal(number, SIG_DFL);
   raise(number);
@@ -154,6 +160,26 @@ QuietTerminal::~QuietTerminal() {
   terminal.quiet = 0;
   struct sigaction before;
   if (sigaction(SIGTSTP, nullptr, &before) == 0 && before.sa_handler == onSuspend) signal(SIGTSTP, SIG_DFL);
+}
+
+GracefulStop::GracefulStop() {
+  const SignalBlock block;
+  stopsGracefully = 1;
+  handleEndings();
+}
+
+GracefulStop::~GracefulStop() {
+  stopsGracefully = 0;
+}
+
+void GracefulStop::finish() const noexcept {
+  if (stopSignal == 0) return;
+  signal(stopSignal, SIG_DFL);
+  raise(stopSignal);
+}
+
+bool stopIsAsked() noexcept {
+  return stopSignal != 0;
 }
 
 }  // namespace tool

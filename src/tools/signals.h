@@ -52,6 +52,20 @@ class QuietTerminal {
   ~QuietTerminal();
 };
 
+// While it exists, the first ending signal only asks for a stop, so that work can be finished in order; the second ends
+// the process. One at a time.
+class GracefulStop {
+ public:
+  GracefulStop();
+  ~GracefulStop();
+  GracefulStop(const GracefulStop&) = delete;
+  GracefulStop& operator=(const GracefulStop&) = delete;
+
+  // Ends the process as the signal would have done, if there was one.
+  void finish() const noexcept;
+};
+bool stopIsAsked() noexcept;
+
 }  // namespace tool
 
 #endif

@@ -42,6 +42,16 @@ struct Tally {
   }
 };
 
+// The schemes of which a column counts any.
+template <class Work>
+void forEachScheme(const Tally& tally, std::size_t column, const Work& work) {
+  for (const auto* list : {&kSchemes, &kForeignSchemes}) {
+    for (const Scheme& scheme : *list) {
+      if (tally.of(scheme)[column] > 0) work(scheme, tally.of(scheme)[column]);
+    }
+  }
+}
+
 // The name of a total or column as a JSON field, and as text.
 struct CountName {
   const char* name;

@@ -42,6 +42,10 @@ Status makeValue(const Scheme& scheme, const KeyRecord& key, const Secret& passw
   return scheme.make(scheme, key, completeCosts(scheme, costs), password, out);
 }
 
+bool isCostly(const Scheme& scheme) noexcept {
+  return scheme.costs != nullptr && scheme.costs->most.rounds > 0;
+}
+
 Costs completeCosts(const Scheme& scheme, const Costs& chosen) {
   constexpr CostRules kNone{};
   const CostRules& rules = scheme.costs != nullptr ? *scheme.costs : kNone;

@@ -21,6 +21,9 @@ Status passwordProblem(const Scheme& scheme, std::string_view password);
 Status makeValue(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out,
                  const Costs& costs = {});
 
+// True for schemes whose values take long on purpose.
+bool isCostly(const Scheme& scheme) noexcept;
+
 // What is chosen, and the scheme's own choice for the rest. Throws Failure with kUsage for a cost that the scheme does
 // not have or that it has within other bounds.
 Costs completeCosts(const Scheme& scheme, const Costs& chosen);

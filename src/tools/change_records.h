@@ -1,0 +1,55 @@
+// SPDX-License-Identifier: Apache-2.0
+// LDIF change records that put new values in the place of old ones, a record a value, so that one that has changed in
+// the directory meanwhile makes its own change fail and no other; and reading them back.
+#ifndef LDAPPW_TOOLS_CHANGE_RECORDS_H
+#define LDAPPW_TOOLS_CHANGE_RECORDS_H
+
+#include <cstdint>
+#include <string>
+#include <unordered_map>
+#include <vector>
+
+#include "ldif_record.h"
+
+namespace tool {
+
+// The changes of one entry after the other.
+class ChangeWriter {
+ public:
+  // old becomes made. Records of the entry before are written to out.
+  void replace(const RecordWalker& walker, const Secret& old, const Secret& made, Secret& out);
+  // old comes to made, which the entry has already: old goes. Not isNew: old is made itself, which need not be added.
+  void drop(const RecordWalker& walker, const Secret& old, const Secret& made, bool isNew, Secret& out);
+  void flush(Secret& out);
+
+ private:
+  struct Change {
+    std::string description;
+    std::vector<Secret> olds;
+    Secret made;
+    bool adds;
+  };
+  void startEntry(const RecordWalker& walker, Secret& out);
+  Change* find(const RecordWalker& walker, const Secret& made) noexcept;
+
+  std::uint64_t entry_ = 0;
+  std::string dn_;
+  std::vector<Change> changes_;
+};
+
+// New values by what they are for, of change records that an earlier run has written.
+class EarlierChanges {
+ public:
+  // Records of which the end is missing do not count. Throws Failure.
+  void load(const std::string& path, const AttributeSet& attributes);
+  bool empty() const noexcept { return values_.empty(); }
+  // The new value for old in the entry and attribute of the walker, or null.
+  const Secret* find(const RecordWalker& walker, const Secret& old) const;
+
+ private:
+  std::unordered_map<std::string, Secret> values_;
+};
+
+}  // namespace tool
+
+#endif

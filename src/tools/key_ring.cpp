@@ -1,0 +1,48 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "key_ring.h"
+
+#include <utility>
+
+#include "text.h"
+
+namespace tool {
+namespace {
+
+constexpr Status kNotText{kBadKey,
+                          "opens into bytes that are not text: a wrong key, or a binary password (--allow-binary)"};
+constexpr Status kAmbiguous{kBadKey, "opens into bytes that are not text with more than one of the keys"};
+
+}  // namespace
+
+KeyRing::KeyRing(const std::vector<std::string>& paths) {
+  for (const std::string& path : paths) {
+    if (!path.empty()) keys_.push_back(KeyRecord::load(path));
+  }
+}
+
+Status KeyRing::open(const StoredValue& value, std::size_t first, bool allowBinary, Secret& clear,
+                     std::size_t& used) const {
+  used = kNoKey;
+  Status refused;
+  Secret bytes;
+  std::size_t binaries = 0;
+  const bool keyless = !value.scheme().needsKey() || first >= keys_.size();
+  const KeyRecord none;
+  for (std::size_t i = keyless ? 0 : first; i < (keyless ? 1 : keys_.size()); ++i) {
+    const Status status = openValue(value, keyless ? none : keys_[i], clear);
+    if (!status.ok()) {
+      refused = status;
+      continue;
+    }
+    if (!keyless) used = i;
+    if (looksLikeText(clear.view()) || value.scheme().strength == Strength::kClear) return {};
+    ++binaries;
+    bytes = Secret(clear.view());
+  }
+  if (binaries == 0) return refused;
+  if (!allowBinary) return kNotText;
+  clear = std::move(bytes);
+  return binaries == 1 ? Status{} : kAmbiguous;
+}
+
+}  // namespace tool

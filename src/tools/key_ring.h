@@ -1,0 +1,33 @@
+// SPDX-License-Identifier: Apache-2.0
+// Several key records, tried one after the other: an export in which a rotation has stopped holds values of two.
+#ifndef LDAPPW_TOOLS_KEY_RING_H
+#define LDAPPW_TOOLS_KEY_RING_H
+
+#include <string>
+#include <vector>
+
+#include "values.h"
+
+namespace tool {
+
+class KeyRing {
+ public:
+  static constexpr std::size_t kNoKey = static_cast<std::size_t>(-1);
+
+  // The stash files in the order in which they are tried; empty paths are left out. Throws Failure.
+  explicit KeyRing(const std::vector<std::string>& paths);
+
+  bool empty() const noexcept { return keys_.empty(); }
+  const std::vector<KeyRecord>& keys() const noexcept { return keys_; }
+
+  // Opens a reversible value. A key that opens it into text is the right one; bytes count with allowBinary, when no key
+  // gives text and one alone gives bytes. Those before first are left out; used is the place of the key, or kNoKey.
+  Status open(const StoredValue& value, std::size_t first, bool allowBinary, Secret& clear, std::size_t& used) const;
+
+ private:
+  std::vector<KeyRecord> keys_;
+};
+
+}  // namespace tool
+
+#endif
