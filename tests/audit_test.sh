@@ -20,7 +20,7 @@ aes=$("$tool" format --scheme aes256 --keys dir <<<teatime99)
   entry guy 'OPS' "$aes"
   entry hal Ops teatime99 teatime99
   entry kim Ops "$("$tool" format --scheme qveil <<<teatime99)"
-  entry leo Ops "$("$tool" format --scheme md5 <<<leo)"
+  entry leo Ops "$("$tool" format --scheme md5 <<<leo)" '!{SSHA}teatime99' "$(digest SHA sharedone sha1 | b64)"
   printf 'dn: uid=eve,ou=Ops,dc=example,dc=org\nobjectClass: account\n\n'
   printf 'dn: uid=ida,ou=Ops,dc=example,dc=org\nuserPassword:\n\n'
   printf 'dn: uid=eve,ou=Ops,dc=example,dc=org\nchangetype: modify\nreplace: uid\nuid: eve\n-\n\n'
@@ -31,7 +31,7 @@ printf 'letmein77\r\nhunter2xyz\n\n' >bad
 secrets="hunter2xyz sharedone DORA letmein77 teatime99 ${aes:8:20} $(digest SHA sharedone sha1 | cut -c 6-20) X-teatime hunter2"
 unshown() { for text in $secrets; do ! grep -qaF -- "$text" out err page* 2>/dev/null || fail "$1: '$text' was shown"; done; }
 named() { json "$1" "{f['name'].replace('-', '_'): f['entries'] for f in d[0]['findings']} == dict($always, $2)"; unshown "$1"; }
-always='clear=4, empty=1, reversible=3, unsalted=4, malformed=1, salted_fast=1, no_password=1, unknown=1, broken=1, reused=6'
+always='clear=4, empty=1, reversible=3, unsalted=4, malformed=1, wrapped=1, salted_fast=1, no_password=1, unknown=1, broken=1, reused=6'
 
 # What is read alone is compared alone: equal AES values without keys, their passwords with them, hashes on request.
 run 'without keys' 3 audit export --json --known-bad bad
@@ -39,12 +39,13 @@ named 'without keys' 'name_as_password=1, known_bad=1'
 json 'groups' "[f for f in d[0]['findings'] if f['name'] == 'reused'][0]['largestGroups'] == [{'entries': 2, 'dns':
   ['uid=%s,ou=%s,dc=example,dc=org' % name for name in pair]} for pair in ((('ben', 'People'), ('cem', 'People')),
   (('gus', 'Ops'), ('guy', 'OPS')), (('hal', 'Ops'), ('kim', 'Ops')))]"
-json 'counts' "(d[0]['entries'], d[0]['accounts'], d[0]['values'], d[0]['urls'], d[0]['policyMet']) == (15, 13, 17, 1, None) and
-  {s['name']: s['values'] for s in d[0]['strengths']} == {'clear': 5, 'reversible': 3, 'unsalted': 4, 'salted-fast': 1,
-  'strong': 1, 'unknown': 1} and {'name': 'sha512-crypt', 'strength': 'strong', 'values': 1} in d[0]['schemes']"
+json 'counts' "(d[0]['entries'], d[0]['accounts'], d[0]['values'], d[0]['urls'], d[0]['policyMet']) == (15, 13, 19, 1, None) and
+  {s['name']: s['values'] for s in d[0]['strengths']} == {'clear': 5, 'reversible': 3, 'unsalted': 5, 'salted-fast': 1,
+  'strong': 1, 'locked': 1, 'unknown': 1} and {'name': 'sha512-crypt', 'strength': 'strong', 'values': 1} in d[0]['schemes']"
 json 'subtrees' "[(s['dn'], s['accounts'], s['values']) for s in d[0]['subtrees']] == [
-  ('ou=ops,dc=example,dc=org', 8, 8), ('ou=people,dc=example,dc=org', 4, 5), ('ou=</td>,dc=example,dc=org', 1, 2)]"
-run 'with keys' 3 audit --json --keys dir - <export
+  ('ou=ops,dc=example,dc=org', 8, 10), ('ou=people,dc=example,dc=org', 4, 5), ('ou=</td>,dc=example,dc=org', 1, 2)]"
+gzip -c export >export.gz
+run 'with keys' 3 audit --json --keys dir - <export.gz
 named 'with keys' 'name_as_password=1'
 json 'one group of four' "d[0]['findings'][3]['largestGroups'][0]['entries'] == 4"
 run 'other keys' 3 audit --json --keys dir2 export
@@ -59,7 +60,7 @@ entry max People "$("$tool" format --scheme ssha <<<letmein77)" >fine
 
 # The text, and that nothing of the export acts on a terminal or a page.
 run text 1 audit export --fail-on clear,des-crypt --fail-on REUSED --list 1 --html page
-for line in 'scheme +strength +values' 'sha +unsalted +3' 'entries: 15' 'strength reversible: 3' '  uid=anna,ou=People,dc=example,dc=org' \
+for line in 'scheme +strength +values' 'sha +unsalted +4' 'entries: 15' 'strength reversible: 3' '  uid=anna,ou=People,dc=example,dc=org' \
   'subtree ou=people,dc=example,dc=org: 4 accounts, 5 values, 2 clear, 2 unsalted, 1 strong' '  and 3 more' 'finding: reversible: 3' \
   'finding: reused: 6 \(against the policy\)' '  one password in 2 entries:' '  uid=<script>.x1B\[1m.xFF@style@.*' 'policy: not met'; do
   grep -qxE -- "$line" out || fail "text: no '$line' in $(cat out)"

@@ -17,8 +17,8 @@ namespace {
 
 constexpr char kFooter[] =
     R"(Findings, as --fail-on takes them: clear, known-bad, name-as-password, empty, reused, reversible, unsalted,
-des-crypt, malformed, salted-fast, no-password, unopened, unknown, broken. The number of a finding is one of entries, that of a
-scheme or strength one of values. No password is shown, nor any part of a value.
+des-crypt, malformed, wrapped, salted-fast, no-password, unopened, unknown, broken. The number of a finding is one of
+entries, that of a scheme or strength one of values. No password is shown, nor any part of a value.
 Passwords are compared where they can be read: clear ones, masked ones, and AES values that --keys opens. Equal values
 of unsalted schemes, and of AES without keys, count as reused as well. One-way values are tried only with --check-hashes.
 The exit code is 0 when the policy of --fail-on and --accept is met or none is given, 1 when it is not met, and else 3
@@ -117,26 +117,29 @@ void setRules(const Options& options, AuditRules& rules) {
   if (!options.knownBad.empty()) rules.loadKnownBad(options.knownBad);
 }
 
-// Adds an export to the facts; the sightings go to reuse.
-void readExport(const std::string& path, const Options& options, const AuditRules& rules, Facts& facts, Reuse& reuse) {
+// Adds an export to the facts; the sightings go to reuse. Returns the code of what was reported on the way.
+ExitCode readExport(const std::string& path, const Options& options, const AuditRules& rules, Facts& facts,
+                    Reuse& reuse) {
   ExportOptions source = options.source;
   source.in = path;
   source.others = auditedNames();
   Input input = openExport(source);
   const auto work = [&](RecordWalker& walker, Part& part) { part.gathered = Collector(rules).collect(walker); };
-  runExport(input, source, work, [&](const Part& part) {
+  const auto deliver = [&](const Part& part) {
     auto& batch = static_cast<Facts&>(*part.gathered);
     reuse.add(batch);
     facts.add(std::move(batch), options.listed);
-  });
+  };
+  return runExport(input, source, work, deliver).exitCode;
 }
 
-ExitCode exitCodeOf(const AuditReport& report, bool keysGiven) {
+ExitCode exitCodeOf(const AuditReport& report, ExitCode reading, bool keysGiven) {
   for (std::size_t i = 0; i < kFindingCount; ++i) {
     const std::uint64_t count = report.facts.findings[i].count;
     if (report.fails(i)) message("policy: " + std::string(kFindings[i].name) + ": " + std::to_string(count));
   }
   if (!report.met()) return kNoMatch;
+  if (reading != kSuccess) return reading;
   if (report.facts.of(Finding::kBroken).count > 0) return kBadValue;
   return keysGiven && report.facts.of(Finding::kUnopened).count > 0 ? kBadKey : kSuccess;
 }
@@ -154,7 +157,10 @@ ExitCode run(const Options& options) {
   std::optional<OutputFile> page;
   if (!options.html.empty() && options.html != "-") page.emplace(options.html, kPageMode, options.force);
   Reuse reuse;
-  for (const std::string& path : options.exports) readExport(path, options, rules, report.facts, reuse);
+  ExitCode reading = kSuccess;
+  for (const std::string& path : options.exports) {
+    keepFirst(reading, readExport(path, options, rules, report.facts, reuse));
+  }
   report.reused = reuse.finish(report.facts, options.listed, report.reuseGroups);
   Results results;
   if (page) {
@@ -163,7 +169,7 @@ ExitCode run(const Options& options) {
   }
   options.html == "-" ? results.write(pageOf(report)) : (options.json ? writeObject : writeText)(report, results);
   results.flush();
-  return exitCodeOf(report, !options.keys.empty());
+  return exitCodeOf(report, reading, !options.keys.empty());
 }
 
 }  // namespace

@@ -7,6 +7,7 @@
 #include "input.h"
 #include "text.h"
 #include "values.h"
+#include "wrapping.h"
 
 namespace tool {
 namespace {
@@ -137,6 +138,7 @@ void Collector::takePassword(const PasswordLine& line, std::string_view type) {
   ++facts_->values;
   facts_->urls += line.form == ValueForm::kUrl ? 1 : 0;
   facts_->deleted += line.form == ValueForm::kDeleted ? 1 : 0;
+  facts_->authPasswords += line.form == ValueForm::kAuthPassword ? 1 : 0;
   if (line.form == ValueForm::kBroken) found(Finding::kBroken);
   if (line.form == ValueForm::kBytes)
     (isHistory(type) ? entry_.history : entry_.passwords).emplace_back(line.value.view());
@@ -167,21 +169,24 @@ void Collector::finishEntry() {
 // current: a value to log in with.
 void Collector::judge(const Secret& value, bool current, Subtree& subtree) {
   const StoredValue stored(value);
+  const Wrapping wrapping = wrappingOf(stored);
+  if (wrapping == Wrapping::kPadded || wrapping == Wrapping::kEncoded) {
+    found(Finding::kWrapped);
+    return judge(unwrapped(value, wrapping), false, subtree);
+  }
   const char* problem = stored.problem();
   const Condition condition = conditionOf(stored, problem);
-  const Scheme& scheme = stored.scheme();
-  const bool locked = condition == Condition::kLocked;
-  const bool altered = condition == Condition::kPadded || condition == Condition::kEncoded;
-  const Strength worth = locked ? Strength::kLocked : altered ? Strength::kUnknown : scheme.strength;
-  const auto strength = static_cast<std::size_t>(worth);
+  const Scheme& scheme = wrapping == Wrapping::kLocked ? *findScheme("locked") : stored.scheme();
+  const bool locked = scheme.strength == Strength::kLocked;
+  const auto strength = static_cast<std::size_t>(scheme.strength);
   ++facts_->schemes[rowOf(scheme)];
   ++facts_->strengths[strength];
   ++subtree.values;
   ++subtree.strengths[strength];
-  if (isFinding(worth) && !altered) found(findingOf(worth));
-  if (altered || condition == Condition::kMalformed || condition == Condition::kForeign) found(Finding::kMalformed);
-  if (!rules_.accepted.empty() && !rules_.accepted[rowOf(scheme)]) found(Finding::kNotAccepted);
-  if (current && problem == nullptr && !locked && !altered) judgeValue(stored);
+  if (isFinding(scheme.strength)) found(findingOf(scheme.strength));
+  if (condition == Condition::kMalformed || condition == Condition::kForeign) found(Finding::kMalformed);
+  if (!locked && !rules_.accepted.empty() && !rules_.accepted[rowOf(scheme)]) found(Finding::kNotAccepted);
+  if (current && !locked && problem == nullptr) judgeValue(stored);
 }
 
 void Collector::judgeValue(const StoredValue& value) {

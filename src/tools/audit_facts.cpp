@@ -33,6 +33,8 @@ const FindingText kFindings[] = {
      "these cannot be converted: have the passwords changed, and stored as a strong hash.", ""},
     {"malformed", "middle", "The value is damaged: no password matches it.",
      "set the password again.", "ldappw identify"},
+    {"wrapped", "middle", "Blanks or base64 around a value have the server take it for a clear password.",
+     "take the value out of it.", "ldappw ldif --to SCHEME --fix --in EXPORT --out NEW"},
     {"salted-fast", "low", "The salted digest is fast, so guesses are cheap.",
      "these cannot be converted: have the server store a strong hash at the next login or change of password.", ""},
     {"no-password", "low", "The account has no password.",
@@ -71,6 +73,7 @@ void Facts::add(Facts&& later, std::size_t most) {
   values += later.values;
   urls += later.urls;
   deleted += later.deleted;
+  authPasswords += later.authPasswords;
   addNumbers(schemes, later.schemes);
   addNumbers(strengths, later.strengths);
   for (const auto& [name, counts] : later.subtrees) {

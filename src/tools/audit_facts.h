@@ -25,6 +25,7 @@ enum class Finding {
   kUnsalted,
   kDesCrypt,
   kMalformed,
+  kWrapped,
   kSaltedFast,
   kNoPassword,
   kUnopened,
@@ -74,6 +75,7 @@ struct Facts : Gathered {
   std::uint64_t values = 0;
   std::uint64_t urls = 0;
   std::uint64_t deleted = 0;
+  std::uint64_t authPasswords = 0;
   std::vector<std::uint64_t> schemes =  // by indexOf; the last one counts tags of no known scheme
       std::vector<std::uint64_t>(kSchemes.size() + kForeignSchemes.size() + 1);
   Strengths strengths{};

@@ -113,6 +113,7 @@ void writeText(const AuditReport& report, Results& results) {
   results.line("accounts: " + std::to_string(facts.accounts));
   results.line("values: " + std::to_string(facts.values));
   if (facts.urls > 0) results.line("behind a URL: " + std::to_string(facts.urls));
+  if (facts.authPasswords > 0) results.line("values of authPassword: " + std::to_string(facts.authPasswords));
   if (facts.deleted > 0) results.line("to be deleted: " + std::to_string(facts.deleted));
   for (std::size_t i = 0; i < kStrengthCount; ++i) {
     if (facts.strengths[i] > 0) {
@@ -130,7 +131,8 @@ void writeObject(const AuditReport& report, Results& results) {
   json.text("time", report.time).openList("exports");
   for (const std::string& name : report.exports) json.text("", name);
   json.closeList().number("entries", facts.entries).number("accounts", facts.accounts).number("values", facts.values);
-  json.number("urls", facts.urls).number("deleted", facts.deleted).openList("schemes");
+  json.number("urls", facts.urls).number("deleted", facts.deleted);
+  json.number("authPasswords", facts.authPasswords).openList("schemes");
   for (const AuditReport::SchemeRow& row : report.schemes()) {
     json.open("").text("name", row.name).text("strength", nameOf(row.strength)).number("values", row.values).close();
   }
