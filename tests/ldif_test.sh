@@ -201,6 +201,20 @@ for packing in 'gzip -c' 'zstd -qc'; do  # in two pieces, as log rotation append
   sameFile "$packing" <(sed "s|^userPassword: secret$|userPassword: $S|" in | head -4; printf '\n'; cat one) out
 done
 
+# Whether a stash file is the one of an export.
+opens=$(grep -ci '^userpassword[^:]*: {AES' b)
+printf 'dn: a\nuserPassword: %s\n' "$("$tool" format --scheme aes256 --keys B <<<x)" >one.b
+{ cat one.b; printf '\ndn: z\nuserPassword: {AES128}AAAAAAAAAAAAAAAAAAAAAA==\n'; } >two.b
+rows <<ROWS
+its stash|0|yes: these keys open [0-9]+ of $opens AES values, [0-9]+ more into bytes that are not text|keys check B b
+its stash, no bytes|0|yes: these keys open 1 of 1 AES values|keys check B one.b
+half of it|4|in part: these keys open 1 of 2 AES values|keys check B two.b
+another stash|4|no: these keys open none of $opens AES values|keys check C b
+nothing to open|1|in doubt: the export has no AES value|keys check B sample
+stash and sync|2||keys check B b --sync x
+as JSON|4|\{"values":2,"opened":1,"notText":0,"unopened":1\}|keys check B two.b --json
+ROWS
+
 # Checks of the entries of an export; an entry may have several values.
 printf 'dn: uid=a, dc=x\nuserPassword: %s\nuserPassword: {X}y\npwdHistory: t#s#3#old\n\ndn:: %s\nuserPassword: b\n\ndn: c\n' \
   "$S" "$(printf 'uid=b,dc=x' | b64)" >in

@@ -9,7 +9,9 @@ printf '%s\n' "$seed" >seed; printf '%s\n' "$salt" >salt
 
 # ---- keys ----
 umask 000  # modes must not depend on it
-check create 0 '[A-Za-z0-9+/]+=*' keys create --config cfg --directory dir --salt-file salt <seed
+check create 0 "configuration sync: [A-Za-z0-9+/]+=*.directory sync: [A-Za-z0-9+/]+=*.directory salt: $salt" \
+  keys create --config cfg --directory dir --salt-file salt <seed
+said create '^ldappw: write this down'
 umask 022
 same 'stash modes' '600 600' "$(mode cfg dir)"
 cp dir dir.good; cp cfg cfg.good; ln -s dir link; ln -s nowhere loose
@@ -34,6 +36,7 @@ create seed with a NUL|3|correct-horse\0battery\n|create --config new1 --directo
 create without a seed|2||create --config new1 --directory new2
 create short salt|3|$seed\n|create --config new1 --directory new2 --salt-file seed
 create seed argument|2||create --config new1 --directory new2 $seed
+create a directory's file over one|2|$seed\n|create --directory dir
 create without --directory|2|$seed\n|create --config new1
 restore over a file|2|$seed\n$salt\n|restore dir
 restore without a salt|2|$seed\n|restore new
@@ -115,6 +118,29 @@ KILL --default-signal=HUP 137
 HUP --ignore-signal=HUP 0
 ROWS
 cp dir.good dir
+# One run at a time, which names what another has left; a file that is replaced is kept, and both or none.
+(preload stop exec "$tool" keys create --config pair.cfg --directory pair --seed-file seed >first 2>&1) &
+pid=$!
+stopped $pid
+"$tool" keys create --config pair.cfg --directory pair --force --json >second 2>waits <<<another-seed-entirely &
+other=$!
+for _ in {1..600}; do ! grep -q 'waiting for another run' waits || break; sleep 0.1; done
+same 'the second run waits' 0 "$(wc -c <second)"
+grep -q 'warning: a run.*/.pair.cfg.*stash file' waits && fail 'what a run needs is named as left'
+kill -CONT $pid; wait $pid $other
+same 'the files of one run' "$(python3 -c 'import json; d = json.load(open("second")); print(d["sync"], d["directorySync"])')" \
+  "$(for file in pair.cfg pair; do "$tool" keys show $file | sed -n 's/^sync: \(.*\) (.*/\1/p'; done | xargs)"
+same 'the files of the first run' "$(sed -n 's/.* sync: //p' first | xargs)" \
+  "$(for file in pair.cfg.bak pair.bak; do "$tool" keys show $file | sed -n 's/^sync: \(.*\) (.*/\1/p'; done | xargs)"
+cp pair .pair.AbCd12; echo >.pair.AbCd13; cp pair pair.now
+run 'a third run' 0 keys create --directory pair --force --seed-file seed
+said 'a third run' 'warning: a run.* has left .*/.pair.AbCd12, a whole stash file with the sync text '
+said 'a third run' 'AbCd13, no whole stash file'
+said 'a third run' 'kept as .*/pair.bak2$'; sameFile 'a third run' pair.now pair.bak2
+run 'the same again' 0 keys restore pair --force --seed-file seed --salt-file <(tail -c 84 pair | head -c 12)
+same 'the same again' '' "$(grep kept err)$(compgen -G 'pair.bak3')"
+(preload file exec "$tool" keys create --config pair.cfg --directory pair --force --seed-file seed) >out 2>err
+same 'neither is kept when the run fails' 'pair pair.bak pair.bak2 pair.cfg pair.cfg.bak' "$(compgen -G 'pair*' | grep -v now | sort | xargs)"
 for what in file folder; do
   preload $what "$tool" keys restore dir --force --seed-file seed --salt-file salt >/dev/null 2>err
   same "a $what that does not reach the disk" 5 $?
@@ -165,7 +191,13 @@ for column in 8 9; do
 done
 
 # Fixed salts: one wrong key in some 250 opens a value to other bytes.
-"$tool" keys create --config c2 --directory d2 --salt-file salt <<<another-seed-entirely >/dev/null
+"$tool" keys create --config c2 --directory d2 --salt-file salt <<<another-seed-entirely >/dev/null 2>&1
+rows <<'ROWS'
+compare|0|match|keys compare dir dir.good
+compare others|1|no match: other salts|keys compare dir pair
+compare other seeds|1|\{"match":false,"sameSync":false,"sameSalt":true\}|keys compare dir d2 --json
+compare, quiet|1||keys compare dir pair --quiet
+ROWS
 aesValue=$("$tool" format --scheme aes256 --keys dir <<<secret)
 lengthy=$("$tool" format --scheme aes128 --keys dir <seed); echo "${seed}Y" | sed 's/.Y$/Y/' >seed.other
 masked=$("$tool" format --scheme qveil <<<secret)

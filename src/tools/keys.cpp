@@ -7,16 +7,19 @@
 #include <cstdint>
 
 #include "input.h"
+#include "messages.h"
+#include "stash_folder.h"
 
 namespace tool {
 namespace {
 
 constexpr Verb kKeyVerbs[] = {
-    {"create", "Make the two stash files, the directory's from a seed; prints the configuration's sync text",
+    {"create", "Make the two stash files, the directory's from a seed, or this one alone; prints what to write down",
      setUpKeysCreate},
     {"restore", "Make a directory stash file again from its seed and salt; prints its sync text", setUpKeysRestore},
     {"show", "Show sync text, salt and key fingerprints of a stash file, never a key", setUpKeysShow},
-    {"check", "Report by exit code whether a stash file has this sync text and salt", setUpKeysCheck},
+    {"check", "Report whether a stash file has this sync text and salt, or opens this export", setUpKeysCheck},
+    {"compare", "Report by exit code whether two stash files hold the same", setUpKeysCompare},
 };
 
 // The size that the stash file format gives to a record.
@@ -86,6 +89,22 @@ KeyRecord readBack(const OutputFile& file) {
                      fstat(file.fd(), &made) == 0 && written.st_dev == made.st_dev && written.st_ino == made.st_ino &&
                      (made.st_mode & 07777) == kStashMode && made.st_size == stashBytes(record);
   if (!whole) throw Failure(kIoError, file.target() + " could not be written whole; nothing was replaced");
+  return record;
+}
+
+KeyRecord makeDirectoryStash(const std::string& path, bool force, const Secret& seed, const Secret& salt) {
+  const StashFolders locked({path});
+  OutputFile file(path, kStashMode, force);
+  file.requireRoom(kStashRoom);
+  requireWritten(restoreKeyStashFile(file.temporaryPath().c_str(), seed.c_str(), salt.c_str()), path);
+  KeyRecord record = readBack(file);
+  if (!sameRecord(record, deriveRecord(seed, salt.view()))) {
+    throw Failure(kIoError, path + " could not be written whole; nothing was replaced");
+  }
+  file.sync();
+  const std::string kept = file.keepOld();
+  file.commit();
+  if (!kept.empty()) message("the old file is kept as " + kept);
   return record;
 }
 

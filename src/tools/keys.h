@@ -19,6 +19,10 @@ void setUpKeysCreate(CLI::App& verb, ExitCode& exitCode);
 void setUpKeysRestore(CLI::App& verb, ExitCode& exitCode);
 void setUpKeysShow(CLI::App& verb, ExitCode& exitCode);
 void setUpKeysCheck(CLI::App& verb, ExitCode& exitCode);
+void setUpKeysCompare(CLI::App& verb, ExitCode& exitCode);
+
+// Says in a line how many AES values of the export the keys open; the code is 0 when all.
+ExitCode checkExport(const KeyRecord& keys, const std::string& path, bool json, bool quiet);
 
 // The options of the verbs that make keys from a seed.
 struct SeedOptions {
@@ -44,6 +48,9 @@ KeyRecord deriveRecord(const Secret& seed, std::string_view salt);
 // before.
 void requireDone(int code, const std::string& what);
 void requireWritten(int code, const std::string& what);
+
+// Makes a directory's stash file; the one that it replaces is kept under another name.
+KeyRecord makeDirectoryStash(const std::string& path, bool force, const Secret& seed, const Secret& salt);
 
 // Reads what the library has written to the temporary file. Throws Failure unless that is still the file that was made
 // for it, closed to others and of the size of its record.

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// ldappw keys check: compares a stash file with a sync text and a salt.
+// ldappw keys check: compares a stash file with a sync text and a salt, or tries it on an export.
 #include "keys.h"
 
 namespace tool {
@@ -7,6 +7,7 @@ namespace {
 
 struct Options {
   std::string file;
+  std::string exported;
   std::string sync;
   std::string saltFile;
   bool json = false;
@@ -14,7 +15,13 @@ struct Options {
 };
 
 ExitCode check(const Options& options) {
+  if (options.exported.empty() == options.sync.empty()) throw Failure(kUsage, "give either an EXPORT or --sync");
   const KeyRecord record = KeyRecord::load(options.file);
+#ifdef LDAPPW_WITH_LDIF
+  if (!options.exported.empty()) return checkExport(record, options.exported, options.json, options.quiet);
+#else
+  if (!options.exported.empty()) throw Failure(kUsage, "this command is built without LDIF");
+#endif
   Secret salt;
   const bool withSalt = !options.saltFile.empty();
   if (withSalt) salt = readSaltFile(options.saltFile);
@@ -33,8 +40,10 @@ ExitCode check(const Options& options) {
 void setUpKeysCheck(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
   addKeys(verb, "FILE", options->file, "key stash file")->required();
-  verb.add_option("--sync", options->sync, "sync text")->required();
-  addPath(verb, "--salt-file", options->saltFile, "compare the salt too, with the first line of this file");
+  addPath(verb, "EXPORT", options->exported, "export (LDIF): how many of its AES values do these keys open?");
+  CLI::Option* sync = verb.add_option("--sync", options->sync, "sync text to compare");
+  addPath(verb, "--salt-file", options->saltFile, "compare the salt too, with the first line of this file")
+      ->needs(sync);
   verb.add_flag("--quiet", options->quiet, "show no result: the exit code has it");
   verb.add_flag("--json", options->json, "the result as a JSON object");
   verb.callback([options, &exitCode] { exitCode = check(*options); });

@@ -2,8 +2,16 @@
 // ldappw keys create: makes the two stash files.
 #include "keys.h"
 
-#include <filesystem>
+#include <stdio.h>
+#include <unistd.h>
 
+#include <filesystem>
+#include <vector>
+
+#include "crypto_provider.h"
+#include "messages.h"
+#include "signals.h"
+#include "stash_folder.h"
 #include "terminal.h"
 
 namespace tool {
@@ -14,50 +22,109 @@ struct Options : SeedOptions {
   std::string directory;
 };
 
+constexpr char kSeedAdvice[] =
+    "the seed is the key of all AES values: 20 random characters or more that nobody uses elsewhere, such as "
+    "\"ldappw format --generate\" makes; whoever has it and the salt can make the directory's stash file again";
+constexpr char kWriteDown[] =
+    "write this down and keep it away from the stash files, with the seed: from seed and salt \"keys restore\" makes "
+    "the directory's stash file again";
+
 bool sameFile(const std::string& a, const std::string& b) {
   std::error_code missing;
   return a == b || std::filesystem::equivalent(a, b, missing);
 }
 
 Secret askSeed(const std::string& seedFile) {
-  Secret seed = SecretSource(seedFile).requireTwice("Seed: ", "Seed again: ", "seed");
+  SecretSource source(seedFile);
+  if (source.interactive()) message(kSeedAdvice);
+  Secret seed = source.requireTwice("Seed: ", "Seed again: ", "seed");
   requireSeed(seed);
   return seed;
 }
 
-void showCreated(const Options& options, const KeyRecord& config, const KeyRecord& directory) {
+Secret drawSalt() {
+  constexpr unsigned kSaltBytes = 12;
+  void* provider = nullptr;
+  unsigned char salt[kSaltBytes + 1];
+  if (initQelCrypto(&provider) != LDAPPW_SUCCESS) throw Failure(kInternal, "the crypto provider cannot be loaded");
+  requireDone(morva_rand_ascii(provider, salt, sizeof salt), "no salt could be drawn");
+  return Secret({reinterpret_cast<const char*>(salt), kSaltBytes});
+}
+
+void showCreated(const Options& options, const KeyRecord* config, const KeyRecord& directory) {
   Results results;
   if (options.json) {
     Json json;
-    json.text("config", options.config).text("directory", options.directory).text("sync", config.sync());
+    if (config != nullptr) json.text("config", options.config);
+    json.text("directory", options.directory);
+    if (config != nullptr) json.text("sync", config->sync());
     json.text("directorySync", directory.sync()).text("directorySalt", directory.salt());
     results.line(json.end());
   } else {
-    results.line(config.sync());
+    if (config != nullptr) results.line("configuration sync: " + std::string(config->sync()));
+    results.line("directory sync: " + std::string(directory.sync()));
+    results.line("directory salt: " + std::string(directory.salt()));
   }
   results.flush();
+  message(kWriteDown);
 }
 
-// The directory's file first: its keys can be made again from seed and salt, the configuration's never.
+// Names old files that are kept under a second name, unless the run fails.
+class KeptFiles {
+ public:
+  void add(OutputFile& file) {
+    names_.push_back(file.keepOld());
+  }
+  // Takes the new file of the directory back, where it has its name already.
+  void undo(const std::string& target) {
+    if (!target.empty()) names_[0].empty() ? unlink(target.c_str()) : rename(names_[0].c_str(), target.c_str());
+    for (const std::string& name : names_) {
+      if (!name.empty()) unlink(name.c_str());
+    }
+  }
+  void show() const {
+    for (const std::string& name : names_) {
+      if (!name.empty()) message("the old file is kept as " + name);
+    }
+  }
+
+ private:
+  std::vector<std::string> names_;
+};
+
+// Both or none: no signal comes in between.
 void commitBoth(OutputFile& config, OutputFile& directory) {
   config.sync();
   directory.sync();
-  directory.commit();
-  try {
-    config.commit();
-  } catch (const Failure& failure) {
-    throw Failure(failure.code(), std::string(failure.what()) + "; " + directory.target() + " has been replaced");
+  KeptFiles kept;
+  {
+    const SignalBlock block;
+    kept.add(directory);
+    kept.add(config);
+    std::string named;
+    try {
+      directory.giveName();
+      named = directory.target();
+      config.giveName();
+    } catch (const Failure&) {
+      kept.undo(named);
+      throw;
+    }
   }
+  directory.syncFolder();
+  config.syncFolder();
+  kept.show();
 }
 
-ExitCode create(const Options& options) {
-  refuseSecrets(options.secrets, "seed");
+ExitCode createDirectory(const Options& options, const Secret& seed, const Secret& salt) {
+  const KeyRecord made = makeDirectoryStash(options.directory, options.force, seed, salt);
+  showCreated(options, nullptr, made);
+  return kSuccess;
+}
+
+ExitCode createBoth(const Options& options, const Secret& seed, const Secret& salt) {
   const Failure sameTarget(kUsage, "--config and --directory are the same file");
-  if (sameFile(options.config, options.directory)) throw sameTarget;
-  requireProvider();
-  Secret salt;
-  if (!options.saltFile.empty()) salt = readSaltFile(options.saltFile);
-  const Secret seed = askSeed(options.seedFile);
+  const StashFolders locked({options.config, options.directory});
   OutputFile config(options.config, kStashMode, options.force);
   OutputFile directory(options.directory, kStashMode, options.force);
   if (config.target() == directory.target()) throw sameTarget;
@@ -75,15 +142,29 @@ ExitCode create(const Options& options) {
     throw Failure(kIoError, "the stash files do not hold what was to be written; nothing was replaced");
   }
   commitBoth(config, directory);
-  showCreated(options, configRecord, directoryRecord);
+  showCreated(options, &configRecord, directoryRecord);
   return kSuccess;
+}
+
+ExitCode create(const Options& options) {
+  refuseSecrets(options.secrets, "seed");
+  const bool alone = options.config.empty();
+  if (!alone && sameFile(options.config, options.directory)) {
+    throw Failure(kUsage, "--config and --directory are the same file");
+  }
+  requireProvider();
+  Secret salt;
+  if (!options.saltFile.empty()) salt = readSaltFile(options.saltFile);
+  const Secret seed = askSeed(options.seedFile);
+  if (alone && salt.empty()) salt = drawSalt();
+  return (alone ? createDirectory : createBoth)(options, seed, salt);
 }
 
 }  // namespace
 
 void setUpKeysCreate(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  addPath(verb, "--config", options->config, "configuration stash file to make")->required();
+  addPath(verb, "--config", options->config, "configuration stash file to make; none without it");
   addPath(verb, "--directory", options->directory, "directory stash file to make")->required();
   addSeedOptions(verb, *options, "read the directory's salt from this file instead of drawing one");
   verb.callback([options, &exitCode] { exitCode = create(*options); });

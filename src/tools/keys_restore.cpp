@@ -39,13 +39,7 @@ ExitCode restore(const Options& options) {
     message("seed and salt do not give the expected sync text; nothing was written");
     return kNoMatch;
   }
-  OutputFile file(options.file, kStashMode, options.force);
-  file.requireRoom(kStashRoom);
-  requireWritten(restoreKeyStashFile(file.temporaryPath().c_str(), seed.c_str(), salt.c_str()), options.file);
-  if (!sameRecord(readBack(file), expected)) {
-    throw Failure(kIoError, options.file + " could not be written whole; nothing was replaced");
-  }
-  file.commit();
+  makeDirectoryStash(options.file, options.force, seed, salt);
   Results results;
   results.line(options.json ? Json().text("sync", expected.sync()).end() : expected.sync());
   results.flush();

@@ -13,6 +13,7 @@
 #include <filesystem>
 
 #include "failure.h"
+#include "input.h"
 #include "messages.h"
 #include "signals.h"
 
@@ -29,6 +30,20 @@ std::string resolved(const std::string& path) {
   const std::filesystem::path whole = std::filesystem::weakly_canonical(std::filesystem::absolute(path), error);
   if (error) throw ioFailure(path, error.value());
   return whole;
+}
+
+// Of two files that are not too large to be stash files.
+bool sameContent(const std::string& a, const std::string& b) {
+  constexpr std::size_t kMostBytes = std::size_t{1} << 16;
+  Input first(a);
+  Input second(b);
+  Secret one;
+  Secret other;
+  while (one.size() < kMostBytes && first.more(one, kMostBytes)) {
+  }
+  while (other.size() < kMostBytes && second.more(other, kMostBytes)) {
+  }
+  return one.size() < kMostBytes && equalBytes(one.view(), other.view());
 }
 
 Failure existsFailure(const std::string& path) {
@@ -101,13 +116,29 @@ void OutputFile::sync() {
 
 void OutputFile::commit() {
   if (!synced_) sync();
+  giveName();
+  syncFolder();
+}
+
+std::string OutputFile::keepOld() {
+  constexpr int kMostCopies = 1000;
+  struct stat old {};
+  if (!overwrite_ || stat(target_.c_str(), &old) != 0 || sameContent(target_, temporary_.path())) return "";
+  for (int i = 1; i <= kMostCopies; ++i) {
+    const std::string kept = target_ + ".bak" + (i > 1 ? std::to_string(i) : "");
+    if (link(target_.c_str(), kept.c_str()) == 0 || renameToNew(target_, kept)) return kept;
+    if (errno != EEXIST) throw ioFailure(kept);
+  }
+  throw ioFailure(target_ + ".bak", EEXIST);
+}
+
+void OutputFile::giveName() {
   const std::string& from = temporary_.path();
   if (overwrite_ ? rename(from.c_str(), target_.c_str()) != 0 : !renameToNew(from, target_)) {
     throw errno == EEXIST ? existsFailure(target_) : ioFailure(target_);
   }
   temporary_.forget();
   fd_ = Descriptor();
-  syncFolder();
 }
 
 // The name has changed already: that a folder cannot be synced is reported, not undone. Some file systems refuse.

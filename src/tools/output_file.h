@@ -36,10 +36,15 @@ class OutputFile {
   void sync();
   // Does that where it has not been done, then gives the file its name and brings the folder to the disk.
   void commit();
+  // The two steps of that, for several files.
+  void giveName();
+  void syncFolder();
+  // Gives the file that will be replaced a second name, ".bak" behind its own, and a number where that is taken. Returns
+  // it, or nothing where no file will be replaced, or one with the same content.
+  std::string keepOld();
 
  private:
   void resolveTarget(const std::string& target, bool overwrite);
-  void syncFolder();
 
   std::string target_;
   TemporaryFile temporary_;
