@@ -102,13 +102,13 @@ AttributeSet::AttributeSet(const std::vector<std::string>& names, const std::vec
   }
   names_.insert(names_.end(), others.begin(), others.end());
   if (names_.size() > kMost) throw Failure(kUsage, "more than " + std::to_string(kMost) + " attributes are given");
+  for (const std::string& name : names_) types_.emplace_back(typeOf(name));
 }
 
 std::size_t AttributeSet::find(std::string_view description) const noexcept {
   const std::string_view type = typeOf(description);
-  for (std::size_t i = 0; i < names_.size(); ++i) {
-    const std::string_view name = names_[i];
-    if (sameName(type, typeOf(name)) && hasOptions(description, name)) return i;
+  for (std::size_t i = 0; i < types_.size(); ++i) {
+    if (sameName(type, types_[i]) && hasOptions(description, names_[i])) return i;
   }
   return kNone;
 }

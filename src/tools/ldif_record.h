@@ -32,6 +32,7 @@ class AttributeSet {
 
  private:
   std::vector<std::string> names_;
+  std::vector<std::string> types_;  // the names without options, as each line of an export is compared with all
   std::size_t given_;
 };
 
