@@ -146,12 +146,10 @@ void isCancelled() {
 void tracesIntoItself() {
   static int nested = 0, forks = 0;
   const auto sink = [](const ldtr_record*, void*) {
-    if (nested++ == 0) {
-      useEachScheme();
-      const pid_t child = forks++ < 30 ? fork() : -1;
-      if (child == 0) _exit(0);
-      if (child > 0) CHECK(waitpid(child, nullptr, 0) == child);
-    }
+    const pid_t child = forks++ < 60 ? fork() : -1;
+    if (child == 0) _exit(0);
+    if (child > 0) CHECK(waitpid(child, nullptr, 0) == child);
+    if (nested++ == 0) useEachScheme();
     --nested;
   };
   ldtr_set_sink(sink, nullptr);
