@@ -23,12 +23,10 @@ TEST(UnixCrypt, AgreesWithTheSystemsForRandomKeysAndSalts) {
     const std::string expected = systemCrypt(key, salt);
     SCOPED_TRACE(toHex(key.data(), key.size()) + " " + salt);
     std::memset(&state, 0x5a, sizeof state);  // what was there before does not matter
-    const AllocationWatch watch;
     EXPECT_EQ(_crypt_r(key.c_str(), salt.c_str(), &state), state.iobuf);
     EXPECT_EQ(state.iobuf, expected);
     EXPECT_EQ(__crypt_std(key.c_str(), salt.c_str()), expected);
     EXPECT_EQ(_crypt(key.c_str(), salt.c_str()), expected);
-    EXPECT_EQ(watch.count(), 0);
     if (round % 20 != 0) continue;
     char block[66] = {};  // the state holds what makes the hash
     for (int i = 0; i < 25; ++i) ASSERT_EQ(_encrypt_r(block, 0, &state), 0);

@@ -7,7 +7,7 @@
 //
 // Then what it gives, and the line that it traces, when memory or the provider fails at any point: each allocation
 // refused, alone and with all later ones; no provider; each of the provider's entries giving 0, 2, -1 or null. What a row
-// does not name there has to go well.
+// does not name there has to go well, and one without such memory allocates nothing.
 #include <climits>
 #include <regex>
 #include <tuple>

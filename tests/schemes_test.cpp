@@ -106,18 +106,6 @@ TEST(Sha, AgreesWithOpensslAtEveryLengthInBothWays) {
   }
 }
 
-TEST(HotPaths, AllocateNothing) {  // nor does _crypt_r, as its suite shows
-  std::string text = letters(300);
-  uint32_t schedule[32];
-  sha_digest digest;
-  const AllocationWatch watch;
-  deskey(schedule, bytesOf(text), 0);
-  des(schedule, bytesOf(text));
-  SHA(text.data(), 300, &digest);
-  EXPECT_EQ(check_format("{aes256}AAAA", 12), 133);
-  EXPECT_EQ(watch.count(), 0);
-}
-
 TEST(UnknownSchemes, AreRefusedWithALine) {
   for (const int scheme : {0, 5, 8, 132, 136, -1}) {
     const TraceCapture trace;
