@@ -23,4 +23,8 @@ cc $CFLAGS -D_GNU_SOURCE -fPIE -pie "$here/consumer.c" -o "$work/outside" $(pkg-
   -Wl,-rpath,"$libdir"
 "$work/outside"
 
+for file in bash-completion/completions/ldappw zsh/vendor-completions/_ldappw fish/vendor_completions.d/ldappw.fish \
+  doc/ldappw/{values,interoperability,moving}.md; do
+  [ -s "$work/moved/share/$file" ] || { echo "install_test: $file is missing" >&2; exit 1; }
+done
 echo abc | "$work/moved/bin/ldappw" format --scheme md5 | grep -qx '{MD5}kAFQmDzST7DWlj99KOF/cg=='

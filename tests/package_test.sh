@@ -28,6 +28,10 @@ for package in slapd-ldappw:slapd 389-ds-ldappw:389-ds-base; do
 done
 grep -qw libldappw1 <<<"$(field ldappw Depends)" || fail "the command does not ask for its library"
 grep -qw 'libldap[-.0-9]*' <<<"$(field ldappw Depends)" || fail "the command does not ask for what it opens"
+for package in zlib1g libzstd1; do
+  grep -qw $package <<<"$(field ldappw Depends)" || fail "the command does not ask for $package"
+done
+[ -e "$root/usr/share/bash-completion/completions/ldappw" ] || fail "the completion is missing"
 grep -qw libssl3 <<<"$(field libldappw1 Depends)" || fail "the library does not ask for what its provider links"
 for library in "$root"/usr/lib/*/*.so.*; do
   name=$(objdump -p "$library" | awk '$1 == "SONAME" { print $2 }')

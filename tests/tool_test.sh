@@ -475,6 +475,23 @@ for verb in identify format verify reveal 'keys create' 'keys restore' 'keys sho
   run "$verb --help" 0 $verb --help
   grep -q -- --json out || fail "$verb --help: $(cat out)"
 done
+# The manual has every option, its examples run, and shells complete by what --help says.
+for verb in identify format verify reveal 'keys create' 'keys restore' 'keys show' 'keys check' 'keys compare' ldif audit trial; do
+  "$tool" $verb --help >out 2>err || continue  # built without libldap
+  for option in $(grep -oE '^  --[a-z-]+' out); do
+    grep -qE "Fl -${option#--}( |$)" "$root/docs/man/ldappw.1" || fail "$verb: $option is not in the manual"
+  done
+done
+mkdir examples; cp seed examples; cp "$root/samples/directory.ldif" examples/export.ldif; echo secret >examples/given
+(cd examples; gzip -c export.ldif >export.ldif.gz; cp given bad.txt; PATH=$(dirname "$tool"):$PATH
+ sed -n '/^.Sh EXAMPLES/,/^.Sh/p' "$root/docs/man/ldappw.1" | sed -n '/^.Bd/,/^.Ed/{/^[.]/d; s/\\e$/\\/; p}' >all
+ bash -e all) >out 2>err
+same 'the examples of the manual' 0 $?
+grep -qx welcome out && grep -qE '^ +1 aes256$' out && grep -qE '^yes: these keys open' out && [ -s examples/report.html ] || fail "the examples: $(<out)"
+complete() { "${BASH}" -c '. "$0"; COMP_WORDS=("$@"); COMP_CWORD=$(($# - 1)); _ldappw; echo "${COMPREPLY[@]}"' \
+  "$root/src/tools/completions/ldappw.bash" "$tool" "$@"; }
+same 'completion' 'format,create restore show check compare,--seed-file --salt-file,' \
+  "$(complete fo),$(complete keys ''),$(complete keys create --s),$(complete verify x)"
 ! LD_DEBUG=files "$tool" --version 2>&1 | grep -E 'libldap-|tresk' || fail 'a library is loaded that is not needed'
 "$tool" identify x >/dev/full 2>err; same 'full output' 5 $?
 "$tool" identify x >&- 2>err; same 'closed output' 5 $?

@@ -48,7 +48,7 @@ void setUpLdif(CLI::App& verb, ExitCode& exitCode) {
       ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll)
       ->type_name("NAME");
   CLI::Option* in = addPath(verb, "--in", options->source.in, "export to read, \"-\" (default) for standard input");
-  addPath(verb, "FILE", options->source.in, "the same")->excludes(in);
+  addPath(verb, "FILE", options->source.in, "export to read, in place of --in")->excludes(in);
   addPath(verb, "--out", options->out, "file to write (default: standard output); may be the one that is read");
   verb.add_flag("--force", options->force, "replace the file of --out");
   verb.add_flag("--changes", options->changes, "write change records for ldapmodify in place of the export");
