@@ -72,9 +72,7 @@ void showCreated(const Options& options, const KeyRecord* config, const KeyRecor
 // Names old files that are kept under a second name, unless the run fails.
 class KeptFiles {
  public:
-  void add(OutputFile& file) {
-    names_.push_back(file.keepOld());
-  }
+  void add(OutputFile& file) { names_.push_back(file.keepOld()); }
   // Takes the new file of the directory back, where it has its name already.
   void undo(const std::string& target) {
     if (!target.empty()) names_[0].empty() ? unlink(target.c_str()) : rename(names_[0].c_str(), target.c_str());
