@@ -49,9 +49,29 @@ struct Opened {
   unsigned char* data() { return reinterpret_cast<unsigned char*>(area.data()); }
   const unsigned char* data() const { return reinterpret_cast<const unsigned char*>(area.data()); }
   void set(size_t at, unsigned value, unsigned char mask) {
-    packet[at] = expandOnBitPattern(value, packet[at], mask, 0);
+    packet[at] = expandOnBitPattern(value, packet[at], mask);
   }
 };
+
+// The masks of a width, taken one after another, round and round.
+unsigned nextMask(unsigned width, Cursor& cursor) {
+  const unsigned char* masks = width == 1 ? scatterArray1 : (width == 2 ? scatterArray2 : scatterArray4);
+  const unsigned mask = masks[cursor++];
+  if (masks[cursor] == 0) cursor = 0;
+  return mask;
+}
+
+unsigned gather(const unsigned char* in, Cursor& cursor, unsigned width) {
+  unsigned byte = 0;
+  for (unsigned at = 0; at < 8; at += width) byte |= collapseOnBitPattern(*in++, nextMask(width, cursor)) << at;
+  return byte;
+}
+
+void scatter(size_t byte, unsigned char* out, Cursor& cursor, unsigned width) {
+  for (unsigned at = 0; at < 8; at += width, ++out) {
+    *out = expandOnBitPattern(static_cast<unsigned>(byte) >> at, *out, nextMask(width, cursor));
+  }
+}
 
 bool isSelector(unsigned selector) {
   return selector == 1 || selector == 7 || selector == 11;
@@ -118,14 +138,14 @@ std::optional<std::string> gathered(const Opened& opened) {
     return {};
   }
   Cursor cursor = 4;
-  size_t length = bitGather(opened.packet, cursor, 4);
-  length |= size_t{bitGather(opened.packet + 2, cursor, 2)} << 8U;
-  length |= size_t{bitGather(opened.packet + 6, cursor, 2)} << 16U;
+  size_t length = gather(opened.packet, cursor, 4);
+  length |= size_t{gather(opened.packet + 2, cursor, 2)} << 8U;
+  length |= size_t{gather(opened.packet + 6, cursor, 2)} << 16U;
   if (length * 8 / width > opened.area.size()) return {};
   std::string bytes;
   cursor = 0;
   for (size_t i = 0; i < length; ++i) {
-    bytes += static_cast<char>(bitGather(opened.data() + i * 8 / width, cursor, width));
+    bytes += static_cast<char>(gather(opened.data() + i * 8 / width, cursor, width));
   }
   return bytes;
 }
@@ -135,9 +155,9 @@ void changeLength(Opened& opened, unsigned seed) {
   const size_t most = opened.area.size() * (isWidth(opened.width()) ? opened.width() : 4) / 8;
   const size_t length = seed % 4 == 0 ? seed : most + seed / 4 % 4 - 2;
   Cursor cursor = 4;
-  bitScatter(static_cast<unsigned char>(length), opened.packet, cursor, 4);
-  bitScatter(static_cast<unsigned char>(length >> 8U), opened.packet + 2, cursor, 2);
-  bitScatter(static_cast<unsigned char>(length >> 16U), opened.packet + 6, cursor, 2);
+  scatter(length, opened.packet, cursor, 4);
+  scatter(length >> 8U, opened.packet + 2, cursor, 2);
+  scatter(length >> 16U, opened.packet + 6, cursor, 2);
 }
 
 void change(Opened& opened, unsigned seed, size_t maxArea) {
