@@ -34,7 +34,7 @@ char* binaryBlobToString(const unsigned char* data, int length, const char* alph
   const size_t room = encodedRoom(bytes);
   char* text = static_cast<char*>(std::malloc(room));
   if (text == nullptr) return nullptr;
-  std::memset(text + room - encodedRoom(0), 0, encodedRoom(0));  // the NUL, and what is behind it
+  for (size_t i = 1; i <= encodedRoom(0); ++i) text[room - i] = '\0';  // the NUL, and what is behind it
   encodeBytes(data, bytes, alphabet, text);
   return text;
 }

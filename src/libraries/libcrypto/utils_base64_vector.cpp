@@ -97,7 +97,8 @@ template <class Symbols>
   const __m128i shifted = _mm_add_epi8(later, _mm_set1_epi8(static_cast<char>(pads)));
   const __m128i last = _mm_or_si128(shifted, _mm_cmpgt_epi8(shifted, _mm_set1_epi8(kReadBytes - 1)));  // zeros behind
   store(end - kStepCharacters, symbols.of(valuesAt(data + bytes - kReadBytes, last)));
-  for (int i = 1; i <= pads; ++i) end[-i] = kPad;
+  if (pads >= 1) end[-1] = kPad;
+  if (pads == 2) end[-2] = kPad;
 }
 
 // ---- Decoding ----
