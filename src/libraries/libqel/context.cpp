@@ -52,7 +52,7 @@ int setValue(const Call& call, Context& context, int id, const char* value) noex
   if (id == QEL_VALUE_STRICT && !isOn && std::strcmp(value, "off") != 0) {
     return call.fail(QEL_REASON_BAD_VALUE, "the value is neither on nor off");
   }
-  if (id == QEL_VALUE_STRICT) context.isStrict.store(isOn, std::memory_order_relaxed);
+  if (id == QEL_VALUE_STRICT) context.isLenient.store(!isOn, std::memory_order_relaxed);
   std::memcpy(context.values[id], value, bytes);
   return call.succeed();
 }

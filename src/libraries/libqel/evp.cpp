@@ -5,6 +5,7 @@
 
 #include <climits>
 #include <type_traits>
+#include <utility>
 
 #include "call.h"
 
@@ -76,7 +77,7 @@ Work* running(const Call& call, Type type, const void* handle, bool encrypts = f
   if (work == nullptr || (work->phase == Phase::kRunning && work->encrypts == encrypts)) return work;
   const bool isEnded = type == kCipher && work->phase == Phase::kEnded && work->encrypts == encrypts;
   const Context* context = isEnded ? call.context() : nullptr;
-  if (context != nullptr && !context->isStrict.load(std::memory_order_relaxed)) return work;
+  if (context != nullptr && context->isLenient.load(std::memory_order_relaxed)) return work;
   return call.fail(QEL_REASON_WRONG_STATE, "the context needs an init for this step");
 }
 
@@ -170,7 +171,10 @@ int QEL_EVP_DigestInit(QEL_CTX* ctx, QEL_MD_CTX* digestCtx, const QEL_DIGEST* di
   Work* work = prepare(call, kDigest, digestCtx, digest);
   if (work == nullptr) return 0;
   auto* init = work->function<OSSL_FUNC_digest_init_fn>(OSSL_FUNC_DIGEST_INIT);
-  if (init(work->state, nullptr) != 1) return call.failOpenssl(QEL_REASON_DIGEST_FAILURE, "it cannot be started");
+  const bool isStarted = std::exchange(work->isStarted, false);
+  if (!isStarted && init(work->state, nullptr) != 1) {
+    return call.failOpenssl(QEL_REASON_DIGEST_FAILURE, "it cannot be started");
+  }
   work->phase = Phase::kRunning;
   return 1;
 }

@@ -28,6 +28,7 @@ void Work::release() noexcept {
   function<OSSL_FUNC_digest_freectx_fn>(id)(state);
   state = nullptr;
   algorithm = nullptr;
+  isStarted = false;
 }
 
 // Of a state, padding is on at first.
@@ -51,7 +52,10 @@ void Work::wipe() noexcept {
 bool Work::overwrite() noexcept {
   static constexpr unsigned char kZeros[EVP_MAX_KEY_LENGTH] = {};
   if (!algorithm->isOverwritten) return false;
-  if (algorithm->type == kDigest) return function<OSSL_FUNC_digest_init_fn>(OSSL_FUNC_DIGEST_INIT)(state, nullptr) == 1;
+  if (algorithm->type == kDigest) {
+    isStarted = function<OSSL_FUNC_digest_init_fn>(OSSL_FUNC_DIGEST_INIT)(state, nullptr) == 1;
+    return isStarted;
+  }
   auto* start = function<OSSL_FUNC_cipher_decrypt_init_fn>(OSSL_FUNC_CIPHER_DECRYPT_INIT);
   auto* update = function<OSSL_FUNC_cipher_update_fn>(OSSL_FUNC_CIPHER_UPDATE);
   unsigned char none[EVP_MAX_BLOCK_LENGTH];

@@ -52,8 +52,8 @@ struct Entry {
 
 // A provider context.
 struct Context : Entry {
-  std::atomic<bool> isStrict{true};
-  char values[2][4096] = {};  // by QelValueId
+  std::atomic<bool> isLenient{false};  // zeros: so the table takes no room in the file
+  char values[2][4096] = {};           // by QelValueId
 };
 
 // An algorithm of OpenSSL's default provider. Its functions are called through the documented interface between
@@ -112,6 +112,7 @@ struct Work : Entry {
   void* state = nullptr;  // of the algorithm; both stay from use to use
   Phase phase = Phase::kFresh;
   bool encrypts = false;
+  bool isStarted = false;  // a digest's state, by the wipe: the next digest has that start, a twentieth of its time
   bool padding = true;
   int keyLength = 0;  // what the caller stated, or 0
 };
