@@ -12,8 +12,8 @@ import subprocess
 import time
 
 import client
-from common import (INSTALLED, LDAPPW, MADE, NOBODY, OWN, SUFFIX, TOP, bad_key_files, make_value, one_person, own,
-                    people, run)
+from common import (INSTALLED, LDAPPW, MADE, NOBODY, OWN, SUFFIX, TOP, bad_key_files, blocks, make_value, one_person,
+                    own, people, run)
 
 ROOT_DN, ROOT_PASSWORD, PORT = f"cn=admin,{SUFFIX}", b"of the trials", 38900
 SCHEMA = "core cosine inetorgperson".split()
@@ -306,6 +306,40 @@ def background(trials, folder, keys):
     trials.check("key file /none: No such file" in (server.folder / "start").read_text(), "nothing on standard error")
 
 
+def leaving(trials, folder, keys):
+    """A directory of 1,000 people leaves reversible storage while it serves: export, change records, ldapmodify, binds."""
+    server = Slapd(folder, f"keys={folder}/server.stash", more="moduleload argon2")
+    trials.step("slapd: 1,000 people go to argon2id by ldapmodify", server.log)
+    passwords = {f"uid=p{at},{SUFFIX}": f"horse {at}" for at in range(1000)}
+    rows = [one_person(f"p{at}", password) for at, password in enumerate(passwords.values())]
+    source = folder / "clear.ldif"
+    source.write_text("\n\n".join(rows) + "\n")
+    made = {scheme: blocks(run(LDAPPW, "ldif", "--to", scheme, "--new-keys", keys, "--allow-clear", source))
+            for scheme in ("clear", "aes256", "qveil", "ssha")}
+    server.load(TOP, *(made[list(made)[at % len(made)]][at] for at in range(len(rows))))
+    export, changes = folder / "export.ldif", folder / "changes.ldif"
+    with server:
+        export.write_text(run(SLAPD, "-T", "cat", *server.options))
+        _, plan, code = run(LDAPPW, "ldif", "--to", "argon2id", "--keys", keys, "--changes", "--out", changes, export,
+                            codes=None)
+        trials.check(code == 0 and "now argon2id: clear 250, qveil 250, aes256 250" in plan and
+                     "at the next login: ssha 250" in plan, f"the plan: {code} {plan}")
+        changed = f"uid=p0,{SUFFIX}"
+        passwords[changed] = "changed meanwhile"
+        trials.equal(administrator().change(changed, "userPassword", b"changed meanwhile")[0], client.OK, "a change")
+        _, error, code = run("ldapmodify", "-c", "-x", "-H", f"ldap://127.0.0.1:{PORT}", "-D", ROOT_DN, "-w",
+                             ROOT_PASSWORD.decode(), "-f", changes, codes=None)
+        trials.equal((code, error.count("No such attribute")), (16, 1), "ldapmodify, of which one change fails")
+        with client.Connection(PORT) as connection:
+            for dn, password in passwords.items():
+                trials.equal(connection.bind(dn, password.encode()), client.OK, dn)
+                refuse(trials, connection, dn, password.encode() + b"x", dn)
+        export.write_text(run(SLAPD, "-T", "cat", *server.options))
+    _, plan, _ = run(LDAPPW, "ldif", "--to", "argon2id", "--dry-run", export, codes=None)
+    trials.check("converted: 1\n" in plan and "done already, kept: 749" in plan, f"a second run: {plan}")
+    print("   " + plan.replace("ldappw: ", "").strip().replace("\n", "; "))
+
+
 # ---- load ----
 
 def bind_until(until, people_of, seed, strict, results):
@@ -432,6 +466,7 @@ def trials_of_slapd(trials, folder, keys, short):
         return
     key_files(trials, folder, keys)
     sasl(trials, folder, keys)
+    leaving(trials, folder, keys)
     background(trials, folder, keys)
     load(trials, folder, units, own_schemes, 10 if short else 60)
     compare_rates(trials, folder, keys, 10 if short else 60)
