@@ -315,6 +315,7 @@ TEST(Reversal, GivesTheClearTextOrNothing) {
     std::string decoded;
   } rows[] = {
       {masked.substr(7), nullptr, 0, "secret"},
+      {masked + "surplus", nullptr, 0, "secret"},
       {"{qVEIL}hello", nullptr, 0, "hello"},
       {"{qVEIL}>0BFoE<", nullptr, 0, "abc"},  // the older form
       {"{qVEIL}>1\x7f====<", nullptr, 0, none},
