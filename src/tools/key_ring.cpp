@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "key_ring.h"
 
+#include <algorithm>
 #include <utility>
 
 #include "text.h"
@@ -28,14 +29,20 @@ Status KeyRing::open(const StoredValue& value, std::size_t first, bool allowBina
   std::size_t binaries = 0;
   const bool keyless = !value.scheme().needsKey() || first >= keys_.size();
   const KeyRecord none;
-  for (std::size_t i = keyless ? 0 : first; i < (keyless ? 1 : keys_.size()); ++i) {
+  const std::size_t count = keyless ? 1 : keys_.size() - first;
+  const std::size_t latest = std::max(latest_.load(std::memory_order_relaxed), first) - first;
+  for (std::size_t n = 0; n < count; ++n) {
+    const std::size_t i = first + (latest + n) % count;
     const Status status = openValue(value, keyless ? none : keys_[i], clear);
     if (!status.ok()) {
       refused = status;
       continue;
     }
     if (!keyless) used = i;
-    if (looksLikeText(clear.view()) || value.scheme().strength == Strength::kClear) return {};
+    if (looksLikeText(clear.view()) || value.scheme().strength == Strength::kClear) {
+      if (!keyless) latest_.store(i, std::memory_order_relaxed);
+      return {};
+    }
     ++binaries;
     bytes = Secret(clear.view());
   }

@@ -3,6 +3,7 @@
 #ifndef LDAPPW_TOOLS_KEY_RING_H
 #define LDAPPW_TOOLS_KEY_RING_H
 
+#include <atomic>
 #include <string>
 #include <vector>
 
@@ -14,18 +15,20 @@ class KeyRing {
  public:
   static constexpr std::size_t kNoKey = static_cast<std::size_t>(-1);
 
-  // The stash files in the order in which they are tried; empty paths are left out. Throws Failure.
+  // The stash files; empty paths are left out. Throws Failure.
   explicit KeyRing(const std::vector<std::string>& paths);
 
   bool empty() const noexcept { return keys_.empty(); }
   const std::vector<KeyRecord>& keys() const noexcept { return keys_; }
 
   // Opens a reversible value. A key that opens it into text is the right one; bytes count with allowBinary, when no key
-  // gives text and one alone gives bytes. Those before first are left out; used is the place of the key, or kNoKey.
+  // gives text and one alone gives bytes. Those before first are left out; used is the place of the key, or kNoKey. The
+  // key that opened the last value is tried first, as it mostly opens the next one, and another takes longer to fail.
   Status open(const StoredValue& value, std::size_t first, bool allowBinary, Secret& clear, std::size_t& used) const;
 
  private:
   std::vector<KeyRecord> keys_;
+  mutable std::atomic<std::size_t> latest_{0};  // that opened a value
 };
 
 }  // namespace tool

@@ -327,19 +327,22 @@ Conversion conversionOf(const LdifOptions& options) {
   requireProvider();
   std::vector<std::string> paths = options.keys;
   paths.insert(paths.begin(), options.newKeys);
-  Conversion conversion{target, options, KeyRecord::load(options.newKeys), KeyRing(paths), {}};
+  return {target, options, KeyRecord::load(options.newKeys), KeyRing(paths), {}};
+}
+
+void requireOtherKeys(const Conversion& conversion) {
   const std::vector<KeyRecord>& keys = conversion.keys.keys();
   for (std::size_t i = 1; conversion.newKeys && i < keys.size(); ++i) {
     if (sameRecord(keys[i], conversion.newKeys)) throw Failure(kUsage, "--keys and --new-keys hold the same keys");
   }
-  proveTarget(conversion);
-  return conversion;
 }
 
 }  // namespace
 
 ExitCode convertExport(const LdifOptions& options) {
   Conversion conversion = conversionOf(options);
+  requireOtherKeys(conversion);
+  proveTarget(conversion);
   Input input = openExport(options.source);
   if (!options.resume.empty()) conversion.earlier.load(options.resume, AttributeSet(options.source.attributes));
   std::optional<OutputFile> file;
