@@ -48,9 +48,7 @@ struct Opened {
   unsigned width() const { return collapseOnBitPattern(packet[kWidthAt], 0x3f); }
   unsigned char* data() { return reinterpret_cast<unsigned char*>(area.data()); }
   const unsigned char* data() const { return reinterpret_cast<const unsigned char*>(area.data()); }
-  void set(size_t at, unsigned value, unsigned char mask) {
-    packet[at] = expandOnBitPattern(value, packet[at], mask);
-  }
+  void set(size_t at, unsigned value, unsigned char mask) { packet[at] = expandOnBitPattern(value, packet[at], mask); }
 };
 
 // The masks of a width, taken one after another, round and round.
