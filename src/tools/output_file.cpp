@@ -125,7 +125,7 @@ std::string OutputFile::keepOld() {
   struct stat old {};
   if (!overwrite_ || stat(target_.c_str(), &old) != 0 || sameContent(target_, temporary_.path())) return "";
   for (int i = 1; i <= kMostCopies; ++i) {
-    const std::string kept = target_ + ".bak" + (i > 1 ? std::to_string(i) : "");
+    std::string kept = target_ + ".bak" + (i > 1 ? std::to_string(i) : "");
     if (link(target_.c_str(), kept.c_str()) == 0 || renameToNew(target_, kept)) return kept;
     if (errno != EEXIST) throw ioFailure(kept);
   }
