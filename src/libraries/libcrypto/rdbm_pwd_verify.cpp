@@ -233,7 +233,7 @@ struct Chosen {
   uint8_t rules[std::size(kSchemes)][std::size(kSchemes)];
 };
 
-constexpr Chosen kChosen = [] {
+constexpr Chosen chosenRules() {
   Chosen chosen{};
   for (size_t s = 0; s < std::size(kSchemes); ++s) {
     for (size_t p = 0; p < std::size(kSchemes); ++p) {
@@ -241,7 +241,9 @@ constexpr Chosen kChosen = [] {
     }
   }
   return chosen;
-}();
+}
+
+constexpr Chosen kChosen = chosenRules();
 
 int compare(const Comparison& c) noexcept {
   return kRules[kChosen.rules[&c.storedScheme - kSchemes][&c.presentedScheme - kSchemes]].compare(c);

@@ -103,9 +103,14 @@ class Patterns {
 
  private:
   static constexpr const auto& all() {
-    if constexpr (kWidth == 1) return kPatterns1;
-    if constexpr (kWidth == 2) return kPatterns2;
-    if constexpr (kWidth == 4) return kPatterns4;
+    static_assert(kWidth == 1 || kWidth == 2 || kWidth == 4);
+    if constexpr (kWidth == 1) {
+      return kPatterns1;
+    } else if constexpr (kWidth == 2) {
+      return kPatterns2;
+    } else {
+      return kPatterns4;
+    }
   }
   const Pattern* next_;
 };
