@@ -30,6 +30,7 @@ failed() { # log, what failed
 # Gives the commands that follow a temporary folder of their own, which goes when the script ends.
 own_temporary_folder() {
   TMPDIR=$(mktemp -d)
+  chmod 711 "$TMPDIR" # servers that are tried run as another user, and pass through it
   export TMPDIR
   trap 'rm -rf "$TMPDIR"' EXIT
 }

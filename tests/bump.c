@@ -61,7 +61,7 @@ EXPORT void free(void* data) {
 EXPORT void* realloc(void* data, size_t size) {
   void* larger = malloc(size);
   if (data == NULL || larger == NULL) return larger;
-  const size_t before = ((struct header*)data - 1)->size;
+  const size_t before = (size_t)((struct header*)data - 1)->size;
   memcpy(larger, data, before < size ? before : size);
   free(data);
   return larger;
