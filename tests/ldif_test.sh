@@ -175,6 +175,11 @@ json 'a rotation that had stopped' "(d[0]['made'], d[0]['done'], d[0]['failed'])
 run 'the rotation once more' 0 ldif --to aes256 --keys C --new-keys B --in all
 sameFile 'the rotation once more' all out
 run 'audit with all its keys' 0 ldif --audit --keys C --keys A --keys B both
+python3 -c 'import base64; [print("dn: %d\nuserPassword:: %s\n" % (i, base64.b64encode(b"\xff%07d" % i).decode())) for i in range(3000)]' >in
+run 'bytes under one key' 0 ldif --to aes256 --new-keys A --in in --out bytes --force
+run 'bytes that another key opens too' 0 ldif --to aes256 --keys C --keys A --new-keys B --allow-binary --in bytes --out moved
+run 'bytes moved' 0 ldif --to clear --allow-clear --keys B --allow-binary --in moved
+sameFile 'the one with more padding is right' in out
 run 'longer than qveil holds' 3 ldif --to qveil --keys B --allow-binary --in b
 kept=$(unfold out | grep -ci '^userpassword: {AES256}') long=$(grep -c 'more bytes than' err)
 [[ $kept == "$long" && $kept -gt 100 ]] || fail "qveil: $kept kept, $long listed"

@@ -26,7 +26,8 @@ Status KeyRing::open(const StoredValue& value, std::size_t first, bool allowBina
   used = kNoKey;
   Status refused;
   Secret bytes;
-  std::size_t binaries = 0;
+  bool opened = false;
+  bool tied = false;
   const bool keyless = !value.scheme().needsKey() || first >= keys_.size();
   const KeyRecord none;
   const std::size_t count = keyless ? 1 : keys_.size() - first;
@@ -38,18 +39,21 @@ Status KeyRing::open(const StoredValue& value, std::size_t first, bool allowBina
       refused = status;
       continue;
     }
-    if (!keyless) used = i;
-    if (looksLikeText(clear.view()) || value.scheme().strength == Strength::kClear) {
+    const bool text = looksLikeText(clear.view()) || value.scheme().strength == Strength::kClear;
+    const bool better = text || !opened || clear.size() < bytes.size();
+    if (better && !keyless) used = i;
+    if (text) {
       if (!keyless) latest_.store(i, std::memory_order_relaxed);
       return {};
     }
-    ++binaries;
-    bytes = Secret(clear.view());
+    tied = opened && clear.size() == bytes.size();
+    if (better) bytes = Secret(clear.view());
+    opened = true;
   }
-  if (binaries == 0) return refused;
+  if (!opened) return refused;
   if (!allowBinary) return kNotText;
   clear = std::move(bytes);
-  return binaries == 1 ? Status{} : kAmbiguous;
+  return tied ? kAmbiguous : Status{};
 }
 
 }  // namespace tool

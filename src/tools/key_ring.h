@@ -21,9 +21,10 @@ class KeyRing {
   bool empty() const noexcept { return keys_.empty(); }
   const std::vector<KeyRecord>& keys() const noexcept { return keys_; }
 
-  // Opens a reversible value. A key that opens it into text is the right one; bytes count with allowBinary, when no key
-  // gives text and one alone gives bytes. Those before first are left out; used is the place of the key, or kNoKey. The
-  // key that opened the last value is tried first, as it mostly opens the next one, and another takes longer to fail.
+  // Opens a reversible value. A key that opens it into text is the right one. Bytes count with allowBinary when no key
+  // gives text: of two keys the one that finds more padding, which a wrong one hardly ever does; with equal padding
+  // neither. Keys before first are left out; used is the place of the key, or kNoKey. The key that opened the last value
+  // is tried first, as it mostly opens the next one, and another takes longer to fail.
   Status open(const StoredValue& value, std::size_t first, bool allowBinary, Secret& clear, std::size_t& used) const;
 
  private:
