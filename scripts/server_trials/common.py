@@ -1,15 +1,19 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What the trials of both servers share: the count of checks, the scratch folder, the people of the sample export under
-every scheme, and key files that are no good."""
+"""What the trials of both servers share: the count of checks, a server's process, the scratch folder, the people of the
+sample export under every scheme, and key files that are no good."""
 import base64
 import contextlib
 import os
 import pathlib
 import re
 import shutil
+import signal
 import subprocess
 import sys
 import tempfile
+import time
+
+import client
 
 ROOT = pathlib.Path(__file__).resolve().parents[2]
 BUILD = ROOT / "build/release"
@@ -45,6 +49,40 @@ class Trials:
 
     def equal(self, got, expected, text):
         self.check(got == expected, f"{text}: {got!r}, not {expected!r}")
+
+
+class Server:
+    """A server's process that answers at a port, from its start to the end of a with block. What it writes goes to the
+    output, a path."""
+
+    name, port, output, process = None, None, None, None
+
+    def launch(self, command):
+        with open(self.output, "ab") as output:
+            self.process = subprocess.Popen([str(part) for part in command], stdout=output, stderr=output, **NOBODY)
+        return self.wait()
+
+    def wait(self):
+        for _ in range(600):
+            if self.process is not None and self.process.poll() is not None:
+                break
+            try:
+                client.bind(self.port, "", b"")
+                return self
+            except OSError:
+                time.sleep(0.05)
+        raise RuntimeError(f"{self.name} does not answer:\n" + self.output.read_text(errors="replace"))
+
+    def stop(self):
+        self.process.send_signal(signal.SIGTERM)
+        return self.process.wait(60)
+
+    def __enter__(self):
+        return self.start()
+
+    def __exit__(self, *_):
+        if self.process.poll() is None:
+            self.stop()
 
 
 def run(*command, text="", codes=(0,), **more):

@@ -4,13 +4,10 @@ import os
 import pathlib
 import re
 import shutil
-import signal
-import subprocess
-import time
 
 import client
-from common import (INSTALLED, LDAPPW, NOBODY, OWN, ROOT, SUFFIX, TOP, bad_key_files, make_value, one_person, own,
-                    people, run)
+from common import (INSTALLED, LDAPPW, NOBODY, OWN, ROOT, SUFFIX, TOP, Server, bad_key_files, make_value, one_person,
+                    own, people, run)
 
 MANAGER, PASSWORD, PORT = "cn=manager", "of the trials", 38990
 DATA = pathlib.Path("/usr/share/dirsrv/data")
@@ -21,12 +18,14 @@ FOREGROUND = ("-d", "266354688")
 TAGS = {"qveil": "qVEIL"} | {scheme: scheme.upper() for scheme in ("aes128", "aes192", "aes256", "vldl")}
 
 
-class Server389:
+class Server389(Server):
     """One instance in a scratch folder, made of the server's own templates."""
+
+    name, port = "389", PORT
 
     def __init__(self, folder, keys, registered=True):
         self.folder = folder / f"389-{len(list(folder.glob('389-*')))}"
-        self.log, self.output, self.process = self.folder / "log/errors", self.folder / "output", None
+        self.log, self.output = self.folder / "log/errors", self.folder / "output"
         for name in FOLDERS:
             (self.folder / name).mkdir(parents=True)
         shutil.copytree("/etc/dirsrv/schema", self.folder / "config/schema")
@@ -65,28 +64,7 @@ class Server389:
 
     def start(self):
         command = ["ns-slapd", "-D", self.folder / "config", "-i", self.folder / "run/pid", *FOREGROUND]
-        with open(self.output, "ab") as output:
-            self.process = subprocess.Popen([str(part) for part in command], stdout=output, stderr=output, **NOBODY)
-        for _ in range(600):
-            if self.process.poll() is not None:
-                break
-            try:
-                client.bind(PORT, "", b"")
-                return self
-            except OSError:
-                time.sleep(0.05)
-        raise RuntimeError("389 does not answer:\n" + self.output.read_text(errors="replace"))
-
-    def stop(self):
-        self.process.send_signal(signal.SIGTERM)
-        return self.process.wait(60)
-
-    def __enter__(self):
-        return self.start()
-
-    def __exit__(self, *_):
-        if self.process.poll() is None:
-            self.stop()
+        return self.launch(command)
 
     def lines(self):
         """What the plug-in has logged."""

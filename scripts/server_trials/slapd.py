@@ -12,8 +12,8 @@ import subprocess
 import time
 
 import client
-from common import (INSTALLED, LDAPPW, MADE, NOBODY, OWN, SUFFIX, TOP, bad_key_files, blocks, make_value, one_person,
-                    own, people, run)
+from common import (INSTALLED, LDAPPW, MADE, NOBODY, OWN, SUFFIX, TOP, Server, bad_key_files, blocks, make_value,
+                    one_person, own, people, run)
 
 ROOT_DN, ROOT_PASSWORD, PORT = f"cn=admin,{SUFFIX}", b"of the trials", 38900
 SCHEMA = "core cosine inetorgperson".split()
@@ -24,12 +24,14 @@ def module_folder(folder):
     return "/usr/lib/ldap" if INSTALLED else f"{folder}/lib/ldap"
 
 
-class Slapd:
+class Slapd(Server):
     """One server over a scratch database, in one of the two styles of configuration."""
+
+    name, port = "slapd", PORT
 
     def __init__(self, folder, arguments, style="slapd.conf", more=""):
         self.folder = folder / f"slapd-{len(list(folder.glob('slapd-*')))}"
-        self.log, self.process = self.folder / "log", None
+        self.log = self.output = self.folder / "log"
         for name in ("db", "slapd.d"):
             (self.folder / name).mkdir(parents=True)
         self.module = f"{module_folder(folder)}/pw-ldappw.so {arguments}".strip()
@@ -105,31 +107,7 @@ olcAccess: to * by users write by * auth
         return [SLAPD, *map(str, self.options), "-h", f"ldap://127.0.0.1:{PORT}"]
 
     def start(self):
-        with open(self.log, "ab") as log:
-            self.process = subprocess.Popen([*self.command(), "-d", "none"], stdout=log, stderr=log, **NOBODY)
-        return self.wait()
-
-    def wait(self):
-        for _ in range(300):
-            if self.process is not None and self.process.poll() is not None:
-                break
-            try:
-                client.bind(PORT, "", b"")
-                return self
-            except OSError:
-                time.sleep(0.05)
-        raise RuntimeError("slapd does not answer:\n" + self.log.read_text(errors="replace"))
-
-    def stop(self):
-        self.process.send_signal(signal.SIGTERM)
-        return self.process.wait(60)
-
-    def __enter__(self):
-        return self.start()
-
-    def __exit__(self, *_):
-        if self.process.poll() is None:
-            self.stop()
+        return self.launch([*self.command(), "-d", "none"])
 
     def resident(self):
         return int(re.search(r"VmRSS:\s+(\d+)", pathlib.Path(f"/proc/{self.process.pid}/status").read_text())[1])
