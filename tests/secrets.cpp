@@ -13,9 +13,11 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <random>
 #include <sstream>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "crypto_provider.h"
@@ -26,11 +28,15 @@ namespace {
 using Words = std::vector<std::string>;
 
 constexpr size_t kSecretBytes = 24;
-constexpr char kConfig[] = "cfg.stash", kDirectory[] = "dir.stash", kLog[] = "log";
+constexpr char kConfig[] = "cfg.stash", kDirectory[] = "dir.stash", kMade[] = "made.stash", kLog[] = "log";
 
 // ---- The cases of this program; the secret lies in the buffer and is wiped by its owner ----
 
 char secret[kSecretBytes + 1];
+
+const unsigned char* bytesOfSecret() {
+  return reinterpret_cast<const unsigned char*>(secret);
+}
 
 void useSchemes() {
   AesKeyData* keys = nullptr;
@@ -55,12 +61,70 @@ void failInSchemes() {
   useSchemes();
 }
 
+void useOperations() {
+  char *made = nullptr, *clear = nullptr;
+  unsigned char* bytes = nullptr;
+  int length = 0;
+  sha_digest digest;
+  SecBuffer key{reinterpret_cast<unsigned char*>(secret), kSecretBytes};
+  SHA(secret, kSecretBytes, &digest);
+  _crypt(secret, "ab");
+  for (const char* name : {"SHA1", "none"}) {
+    saltedHashEncrypt(secret, &made, name);
+    saltedHashVerify(secret, made, name);
+    free(std::exchange(made, nullptr));
+    unsaltedHashEncrypt(name, secret, &made);
+    free(std::exchange(made, nullptr));
+  }
+  for (const char* cipher : {"AES-192-CBC", "none"}) {
+    aesEncryptBuffer(secret, &made, cipher, &key, &key, kSecretBytes);
+    aesDecryptBuffer(made, &clear, cipher, &key, &key, nullptr);
+    _morva_utils_decode_buffer_free(&clear);
+    aesDecryptBuffer("{damaged}", &clear, cipher, &key, &key, nullptr);
+    free(std::exchange(made, nullptr));
+  }
+  _morva_utils_encode_buffer(secret, &made);
+  _morva_utils_decode_buffer(made, &clear);
+  _morva_utils_decode_buffer_free(&clear);
+  made[std::strlen(made) - 1] ^= 1;
+  _morva_utils_decode_buffer(made, &clear);
+  _morva_utils_decode_buffer_free(&clear);
+  _morva_utils_encode_buffer_free(&made);
+  _morva_utils_encode_binary(bytesOfSecret(), kSecretBytes, &made);
+  _morva_utils_decode_binary(made, &bytes, &length);
+  explicit_bzero(bytes, static_cast<size_t>(length));
+  free(bytes);
+  _morva_utils_encode_binary_free(&made);
+}
+
 void makeKeys() {
-  AesKeyData* keys = nullptr;
-  restoreKeyStashFile(kConfig, secret, "saltsaltsalt");
+  AesKeyData *keys = nullptr, *copy = nullptr;
+  char* sync = nullptr;
+  restoreKeyStashFile(kMade, secret, "saltsaltsalt");
   restoreKeyStashFile("/dev/full", secret, "saltsaltsalt");
+  createKeyStashFiles(kMade, kMade, secret, &sync, nullptr);
+  createKeyStashFiles("/dev/full", kMade, secret, &sync, nullptr);
+  validateCryptoString(secret, 0);
   genTmpKeyDataVal(secret, "saltsaltsalt", &keys);
   freeAesKeyData(keys);
+  free(sync);
+  initAesKeyData(&keys);
+  std::memcpy(keys->aesKeys[1].data, secret, kSecretBytes);
+  copyAesKeyData(keys, &copy);
+  freeAesKeyData(copy);
+  freeAesKeyData(keys);
+}
+
+// The key that is looked for comes from the file.
+void loadKeys() {
+  AesKeyData *keys = nullptr, *half = nullptr;
+  std::filesystem::copy_file(kDirectory, "half.stash", std::filesystem::copy_options::overwrite_existing);
+  std::filesystem::resize_file("half.stash", std::filesystem::file_size(kDirectory) - 1);
+  setAESKeyData(kDirectory, &keys);
+  setAESKeyData("half.stash", &half);
+  readKeyStashFile(kDirectory, keys);
+  freeAesKeyData(keys);
+  freeAesKeyData(half);
 }
 
 void leaveACopy() {
@@ -70,10 +134,8 @@ void leaveACopy() {
 const struct {
   const char* name;
   void (*run)();
-} kOwnCases[] = {{"leaves a copy", leaveACopy},
-                 {"uses schemes", useSchemes},
-                 {"fails in schemes", failInSchemes},
-                 {"makes keys", makeKeys}};
+} kOwnCases[] = {{"leaves a copy", leaveACopy},      {"uses schemes", useSchemes}, {"fails in schemes", failInSchemes},
+                 {"uses operations", useOperations}, {"makes keys", makeKeys},     {"loads keys", loadKeys}};
 
 int runOwnCase(const std::string& name) {
   if (read(STDIN_FILENO, secret, kSecretBytes) != static_cast<ssize_t>(kSecretBytes)) return 2;
@@ -108,7 +170,7 @@ std::string placeOf(pid_t process, const std::string& word) {
 }
 
 // Runs a program with that as its standard input; where it has left the words, or how else it failed.
-std::string leftBy(const Words& program, const std::string& input, const Words& words) {
+std::string leftBy(const Words& program, const std::string& input, const Words& words, unsigned long expected = 0) {
   int ends[2];
   if (pipe(ends) != 0) return "no pipe";
   const pid_t child = fork();
@@ -147,7 +209,7 @@ std::string leftBy(const Words& program, const std::string& input, const Words& 
   }
   unsigned long code = 0;
   ptrace(PTRACE_GETEVENTMSG, child, nullptr, &code);
-  if (code >> 8 > 1) found += "\n  exit code " + std::to_string(code >> 8) + "\n" + log.str();
+  if (code >> 8 != expected) found += "\n  exit code " + std::to_string(code >> 8) + "\n" + log.str();
   ptrace(PTRACE_CONT, child, nullptr, 0);
   waitpid(child, &status, 0);
   return found;
@@ -159,39 +221,106 @@ std::string randomText(std::mt19937& random) {
   return text;
 }
 
+std::string contentOf(const char* path) {
+  std::ostringstream content;
+  content << std::ifstream(path, std::ios::binary).rdbuf();
+  return content.str();
+}
+
+// A stored value under the keys of the case.
+std::string valueOf(const std::string& password, int scheme) {
+  AesKeyData* keys = nullptr;
+  setAESKeyData(kDirectory, &keys);
+  char value[256];
+  const int length =
+      format_password(scheme, nullptr, keys, password.data(), static_cast<int>(password.size()), value, sizeof value);
+  freeAesKeyData(keys);
+  return {value, value + length};
+}
+
+std::string exportOf(const std::string& value) {
+  return "dn: cn=a\ncn: a\nuserPassword: " + value + "\n\n";
+}
+
+// A run of the command: its arguments, with blanks between them, its input, what is looked for, its exit code.
+struct Run {
+  std::string arguments, input;
+  Words words;
+  unsigned long code = 0;
+};
+
+std::vector<Run> runsWith(const std::string& password, const std::string& seed) {
+  const std::string keys = " --keys dir.stash", content = contentOf(kDirectory);
+  const Words both = {password, content.substr(content.size() - 32, 16)}, keyAlone = {both[1]};
+  const std::string aes = valueOf(password, FORMAT_AES256), ssha = valueOf(password, FORMAT_SSHA);
+  const std::string mixed = exportOf(aes) + exportOf(password) + exportOf(valueOf(password, FORMAT_QVEIL));
+  std::ofstream("salt") << "saltsaltsalt\n";
+  std::ofstream("bad") << password << '\n';
+  std::ofstream("changes") << "dn: cn=a\nchangetype: modify\ndelete: userPassword\nuserPassword: " + password +
+                                  "\n-\nadd: userPassword\nuserPassword: " + ssha + "\n-\n\n";
+  std::ofstream("value") << aes << '\n';
+  std::vector<Run> runs = {
+      {"keys restore --force --salt-file salt " + std::string(kConfig), seed, {seed}},
+      {"keys restore --salt-file salt none/at/all", seed, {seed}, 5},
+      {"keys create --config none/at --directory none/all", seed, {seed}, 5},
+      {"keys show dir.stash", "", keyAlone},
+      {"keys show --json dir.stash", "", keyAlone},
+      {"keys compare dir.stash dir.stash", "", keyAlone},
+      {"keys check --sync other dir.stash", "", keyAlone, 1},
+      {"keys check dir.stash -", mixed, both},
+      {"identify", password + '\n' + aes + '\n', {password}},
+      {"format --scheme argon2id --memory 64", password, {password}},
+      {"format --scheme ssha512 --json", password, {password}},
+      {"verify " + ssha, password, {password}},
+      {"verify --value-file value" + keys, password, both},
+      {"verify --value-file value" + keys, password + "x", both, 1},
+      {"verify --value-file value --keys cfg.stash", password, {password}, 4},
+      {"verify --batch -" + keys, aes + '\t' + password + '\n' + ssha + '\t' + password + "y\n", both, 1},
+      {"reveal" + keys, aes + '\n', both},
+      {"reveal --json" + keys, aes + '\n' + aes.substr(0, 30) + '\n', both, 3},
+      {"ldif --to aes128 --new-keys cfg.stash" + keys, mixed, both},
+      {"ldif --to argon2id --memory 64 --changes" + keys, mixed, both},
+      {"ldif --to ssha --changes --resume changes" + keys, mixed, both},
+      {"ldif --to clear" + keys + " --allow-clear", mixed, both},
+      {"ldif --to ssha" + keys + " --out none/at/all", mixed, both, 5},
+      {"ldif --audit" + keys, mixed, both},
+      {"audit --known-bad bad --check-hashes -" + keys, mixed + exportOf(ssha), both},
+      {"trial -" + keys, mixed, both},
+  };
+  for (const char* scheme : {"sha", "ssha", "md5", "crypt", "qveil", "aes128", "aes192", "aes256"}) {
+    const std::string text = scheme == std::string("crypt") ? password.substr(0, 8) : password;
+    runs.push_back({"format --scheme " + std::string(scheme) + keys, text, {text, both[1]}});
+  }
+  return runs;
+}
+
 int examine(const std::string& command) {
   const std::string self = "/proc/self/exe";
   std::mt19937 random{std::random_device{}()};
   const std::string password = randomText(random), seed = randomText(random);
-  const std::string left =
-      leftBy({command, "keys", "create", "--config", kConfig, "--directory", kDirectory}, seed, {seed});
-  if (!left.empty()) std::fprintf(stderr, "keys create leaves secrets:%s\n", left.c_str());
-  std::ofstream("salt") << "saltsaltsalt\n";
-  std::ostringstream file;
-  file << std::ifstream(kDirectory, std::ios::binary).rdbuf();
-  const Words keyWords = {password, file.str().substr(file.str().size() - 32, 16)};
-  int failed = left.empty() ? 0 : 1;
-  const auto expectNothing = [&failed](const Words& program, const std::string& input, const Words& words) {
-    const std::string found = leftBy(program, input, words);
-    if (found.empty()) return;
-    for (const std::string& word : program) std::fprintf(stderr, "%s ", word.c_str());
-    std::fprintf(stderr, "leaves secrets:%s\n", found.c_str());
-    failed = 1;
-  };
   if (leftBy({self, "leaves a copy"}, password, {password}).empty()) {
     std::fputs("the search finds nothing\n", stderr);
     return 1;
   }
-  expectNothing({self, "uses schemes"}, password, keyWords);
-  expectNothing({self, "fails in schemes"}, password, keyWords);
-  expectNothing({self, "makes keys"}, seed, {seed});
-  for (const char* scheme : {"sha", "ssha", "md5", "crypt", "qveil", "aes128", "aes192", "aes256"}) {
-    const std::string text = scheme == std::string("crypt") ? password.substr(0, 8) : password;
-    expectNothing({command, "format", "--scheme", scheme, "--keys", kDirectory}, text, {text, keyWords[1]});
+  int failed = 0;
+  const auto expectNothing = [&failed](const Words& program, const Run& run) {
+    const std::string found = leftBy(program, run.input, run.words, run.code);
+    if (found.empty()) return;
+    std::fprintf(stderr, "%s leaves secrets:%s\n", run.arguments.c_str(), found.c_str());
+    failed = 1;
+  };
+  expectNothing({command, "keys", "create", "--config", kConfig, "--directory", kDirectory}, {"create", seed, {seed}});
+  for (const Run& run : runsWith(password, seed)) {
+    std::istringstream arguments(run.arguments);
+    Words program{command};
+    program.insert(program.end(), std::istream_iterator<std::string>(arguments), {});
+    expectNothing(program, run);
   }
-  const char value[] = "{SSHA}3sxkqG4X7uu7lHneEWd5ccxI/x6WqNovnWWVMHm6dusWNK/KinBDCw==";
-  expectNothing({command, "verify", value}, password, {password});
-  expectNothing({command, "keys", "restore", "--force", "--salt-file", "salt", kConfig}, seed, {seed});
+  const std::string key = contentOf(kDirectory).substr(contentOf(kDirectory).size() - 32, 16);
+  for (const auto& each : kOwnCases) {
+    if (each.run == leaveACopy) continue;
+    expectNothing({self, each.name}, {each.name, each.run == makeKeys ? seed : password, {password, seed, key}});
+  }
   return failed;
 }
 

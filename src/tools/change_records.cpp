@@ -12,9 +12,13 @@ namespace {
 
 constexpr std::string_view kRecordEnd = "\n\n";
 
-std::string keyOf(const RecordWalker& walker, const Secret& old) {
-  std::string key = walker.dn() + '\0' + walker.password().description + '\0';
-  return key.append(old.view());
+Secret keyOf(const RecordWalker& walker, const Secret& old) {
+  Secret key(walker.dn());
+  key.append('\0');
+  key.append(walker.password().description);
+  key.append('\0');
+  key.append(old.view());
+  return key;
 }
 
 }  // namespace
@@ -77,7 +81,7 @@ void EarlierChanges::load(const std::string& path, const AttributeSet& attribute
     const std::size_t end = batch.text.view().rfind(kRecordEnd);
     batch.text.resize(end != std::string_view::npos ? end + kRecordEnd.size() : 0);
     RecordWalker walker(batch, attributes);
-    std::vector<std::string> keys;
+    std::vector<Secret> keys;
     std::uint64_t record = 0;
     while (walker.next()) {
       if (!walker.atPassword()) continue;
@@ -86,13 +90,14 @@ void EarlierChanges::load(const std::string& path, const AttributeSet& attribute
       const PasswordLine& password = walker.password();
       if (password.form == ValueForm::kDeleted) keys.push_back(keyOf(walker, password.value));
       if (password.form != ValueForm::kBytes) continue;
-      for (const std::string& key : keys) values_[key] = password.whole(password.value);
+      for (Secret& key : keys) values_[std::move(key)] = password.whole(password.value);
       keys.clear();
     }
   }
 }
 
 const Secret* EarlierChanges::find(const RecordWalker& walker, const Secret& old) const {
+  if (values_.empty()) return nullptr;
   const auto found = values_.find(keyOf(walker, old));
   return found != values_.end() ? &found->second : nullptr;
 }

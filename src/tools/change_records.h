@@ -4,8 +4,11 @@
 #ifndef LDAPPW_TOOLS_CHANGE_RECORDS_H
 #define LDAPPW_TOOLS_CHANGE_RECORDS_H
 
+#include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <string>
+#include <string_view>
 #include <unordered_map>
 #include <vector>
 
@@ -47,7 +50,11 @@ class EarlierChanges {
   const Secret* find(const RecordWalker& walker, const Secret& old) const;
 
  private:
-  std::unordered_map<std::string, Secret> values_;
+  struct SameBytes {
+    std::size_t operator()(const Secret& key) const noexcept { return std::hash<std::string_view>{}(key.view()); }
+    bool operator()(const Secret& a, const Secret& b) const noexcept { return a.view() == b.view(); }
+  };
+  std::unordered_map<Secret, Secret, SameBytes, SameBytes> values_;  // the old values are secrets too
 };
 
 }  // namespace tool
