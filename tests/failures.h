@@ -68,7 +68,8 @@ inline std::string outcomeOf(const std::string& operation, const std::function<s
                     end = " rc = " + result + "\n";
   std::string lineClass;
   for (const Record& r : trace.records()) {
-    if (r.kind == LDTR_LINE && r.text == line) lineClass = r.severity == LDTR_DEBUG ? "debug: " : "";
+    EXPECT_EQ(r.kind, LDTR_LINE);
+    if (r.text == line) lineClass = r.severity == LDTR_DEBUG ? "debug: " : "";
   }
   const bool isUsual = line.rfind(start, 0) == 0 && line.size() >= start.size() + end.size() &&
                        line.compare(line.size() - end.size(), end.size(), end) == 0;

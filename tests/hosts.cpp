@@ -10,6 +10,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <exception>
 #include <iterator>
 #include <string>
 #include <thread>
@@ -158,6 +159,20 @@ void tracesIntoItself() {
   trcEvents = 0;
 }
 
+// A trace sink throws, in a host that does not know that nothing throws here: the process ends in an orderly way.
+void throwsFromItsSink() {
+  int (*const volatile format)(int, char*, AesKeyData*, const char*, int, char*, int) = format_password;
+  char value[64];
+  std::set_terminate([] { _exit(0); });
+  ldtr_set_sink([](const ldtr_record*, void*) { throw 1; }, nullptr);
+  trcEvents = 0x4011000;
+  try {
+    format(FORMAT_SSHA, nullptr, nullptr, "secret", 6, value, sizeof value);
+  } catch (int) {
+  }
+  CHECK(!"reached");
+}
+
 #ifndef __SANITIZE_ADDRESS__  // its own allocator leaves locks taken in the child
 void expectChildrenThatWork(int count) {
   for (int i = 0; i < count; ++i) {
@@ -257,6 +272,7 @@ constexpr Host kHosts[] = {
     {"runs out of memory", runsOutOfMemory},
     {"is cancelled", isCancelled},
     {"traces into itself", tracesIntoItself},
+    {"throws from its sink", throwsFromItsSink},
 #ifndef __SANITIZE_ADDRESS__
     {"forks", forks},
 #endif

@@ -3,6 +3,7 @@
 #include "ldtr.h"
 
 #include <pthread.h>
+#include <unwind.h>
 
 #include <cstdarg>
 #include <cstdio>
@@ -33,6 +34,15 @@ class SinkLock {
 SinkSlot currentSink() {
   const SinkLock lock;
   return installedSink;
+}
+
+// Calls a sink, and is the frame at which the search for a handler of its exception fails: the exception then ends the
+// process where it was thrown (std::terminate), in place of unwinding operations of which nothing would be undone. The
+// compiler would give a noexcept function the same, and the whole C++ library with it.
+[[gnu::noinline]] void callSink(const SinkSlot& slot, const ldtr_record* record) {
+  __asm__ volatile(".cfi_personality 0x1b, ldtr_refuse_to_unwind");
+  slot.sink(record, slot.user);
+  __asm__ volatile("");  // behind the call, so that the frame is there while it runs
 }
 
 // A fork takes the lock, so that the child, which has none of the other threads, finds it free.
@@ -83,6 +93,14 @@ __attribute__((constructor)) void start() {
 
 extern "C" {
 
+// The personality routine of callSink; its place is stated relative to that one (DW_EH_PE_pcrel, DW_EH_PE_sdata4).
+__attribute__((used, visibility("hidden"))) _Unwind_Reason_Code ldtr_refuse_to_unwind(int, _Unwind_Action actions,
+                                                                                      _Unwind_Exception_Class,
+                                                                                      _Unwind_Exception*,
+                                                                                      _Unwind_Context*) {
+  return (actions & _UA_SEARCH_PHASE) != 0 ? _URC_FATAL_PHASE1_ERROR : _URC_FATAL_PHASE2_ERROR;
+}
+
 unsigned int trcEvents = 0;
 
 void ldtr_set_sink(void (*sink)(const struct ldtr_record*, void* user), void* user) {
@@ -94,7 +112,7 @@ void ldtr_write(const struct ldtr_record* record) {
   const dsutil::NoCancellation uncancelled;
   const SinkSlot slot = currentSink();
   if (slot.sink != nullptr) {
-    slot.sink(record, slot.user);
+    callSink(slot, record);
   } else {
     writeToStandardError(*record);
   }

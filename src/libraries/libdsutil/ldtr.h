@@ -48,7 +48,8 @@ struct ldtr_record {
 extern LDTR_API unsigned int trcEvents;
 
 /* Sends records to sink (called with user, possibly from many threads at once) instead of to standard error, one line
- * a record. Null brings the default back. A call under way on another thread may still reach the former sink. */
+ * a record. Null brings the default back. A call under way on another thread may still reach the former sink. A sink may
+ * trace and call what traces; it must return: an exception that leaves it, or an end of its thread, ends the process. */
 LDTR_API void ldtr_set_sink(void (*sink)(const struct ldtr_record*, void* user), void* user);
 
 /* Hands one record to the sink, whatever trcEvents says. */
@@ -75,10 +76,10 @@ class ldtr_function_local {
  public:
   explicit ldtr_function_local(const ldtr_scope& scope) noexcept
       : scope_(scope), events_(ldtr_events() & (scope.mask | static_cast<unsigned>(LDTR_EVENT_DEBUG))) {
-    if (isOn() && recordsScope()) ldtr_write_entry(&scope_);
+    if (recordsScope()) ldtr_write_entry(&scope_);
   }
   ~ldtr_function_local() {
-    if (isOn() && recordsScope()) ldtr_write_exit(&scope_, rc_);
+    if (recordsScope()) ldtr_write_exit(&scope_, rc_);
   }
   ldtr_function_local(const ldtr_function_local&) = delete;
   ldtr_function_local& operator=(const ldtr_function_local&) = delete;
