@@ -223,6 +223,10 @@ TEST_F(Qel, PaddingAndStrictness) {
 
 // ---- Misuse ----
 
+// Hosts know the reasons by their numbers; the other ones stand below.
+static_assert(QEL_REASON_DIGEST_FAILURE == 10 && QEL_REASON_RANDOM_FAILURE == 12);
+static_assert(QEL_REASON_NOT_AVAILABLE == 13 && QEL_REASON_OUT_OF_MEMORY == 15);
+
 // How many entries were called, in the order written, and how many worked.
 struct Results {
   int called = 0, worked = 0;
@@ -273,7 +277,7 @@ TEST_F(Qel, EveryEntryRefusesForeignHandles) {
   values.push_back(reinterpret_cast<void*>(last + step));
   for (const void* each : values) {
     SCOPED_TRACE(each);
-    const int expected = each == nullptr ? 1 : 2;  // hosts know the numbers too
+    const int expected = each == nullptr ? 1 : 2;
     void* value = const_cast<void*>(each);
     Handles bad = h;
     bad.ctx = static_cast<QEL_CTX*>(value);
