@@ -11,6 +11,7 @@ failures=0
 fail() {
   echo "FAIL: $*" >&2
   failures=$((failures + 1))
+  [ -z "${FAIL_FAST:-}" ] || exit 1
 }
 
 # run NAME CODE ARGUMENT...: standard input goes to the command; the files out and err have what comes of it. Every
