@@ -1,6 +1,7 @@
 # SPDX-License-Identifier: Apache-2.0
 # The frame of the command's tests, sourced with the command as $1: a folder of its own, functions that run
-# the command and compare, and the count of what differs. Nothing depends on how fast the machine is.
+# the command and compare, and the count of what differs; FAIL_FAST in the environment ends it at the first of these.
+# Nothing depends on how fast the machine is.
 set -u
 tool=$(readlink -f "$1") held=$(readlink -f "${2:-}")
 root=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
