@@ -54,6 +54,10 @@ run hashes 3 audit --json --known-bad bad --check-hashes export
 named hashes 'name_as_password=2, known_bad=2'
 run 'an entry in two exports is one' 3 audit export export --json --threads 1
 json 'an entry in two exports is one' "d[0]['entries'] == 30 and d[0]['findings'][3]['entries'] == 6"
+for i in {1..52}; do entry "u$i" "O$i" '{crypt}abYH7TYgEKz2Q'; done >many
+run 'many subtrees' 0 audit many --json
+json 'many subtrees' "(len(d[0]['subtrees']), d[0]['subtrees'][50]['dn'], d[0]['subtrees'][50]['accounts']) == (51, '(others)', 2) and
+  [(f['name'], f['entries']) for f in d[0]['findings']] == [('des-crypt', 52)]"
 run 'several batches' 0 audit "$root/samples/directory.ldif" --json --list 2
 json 'several batches' "[(f['entries'], len(f['dns'])) for f in d[0]['findings']] == [(320, 2), (16, 2), (24, 2)]"
 entry max People "$("$tool" format --scheme ssha <<<letmein77)" >fine

@@ -163,6 +163,9 @@ run 'wrong keys' 4 ldif --to aes256 --keys C --new-keys A --in b
 sameFile 'no value is converted with the wrong keys' b out
 same 'the values that do not open are listed by their lines' "$(grep -ni '^userpassword' b | cut -d: -f1 | head -1000)" \
   "$(sed -n 's/^ldappw: line \([0-9]*\): uid=.*/\1/p' err | head -1000)"
+printf 'dn: a\nuserPassword: %s\n' "$("$tool" format --scheme qveil <<<'{SHA}x')" >in
+run 'a password like a value' 3 ldif --to clear --allow-clear in
+sameFile 'a password like a value' in out
 printf 'dn: a\nuserPassword: %0800d\n' 0 >in  # a value of it is too long for the server's check
 run 'a value that does not verify' 3 ldif --to aes256 --new-keys A --in in
 sameFile 'a value that does not verify' in out

@@ -142,6 +142,16 @@ TEST(LibraryPath, HoldsTheSystemFolderAfterwards) {
   }
 }
 
+TEST(TraceLines, ArriveWholeWhateverTheirLength) {
+  for (const size_t length : {size_t{0}, size_t{511}, size_t{512}, size_t{9000}}) {
+    const std::string line(length, 'x');
+    const test::TraceCapture trace;
+    ldtr_formater_global(LDTR_ERROR, "%s", line.c_str());
+    ASSERT_EQ(trace.records().size(), 1U);
+    EXPECT_EQ(trace.records()[0].text, line);
+  }
+}
+
 TEST(CipherSpecs, GetTheStrongerCodeFirst) {
   const std::string long58 = "0102030405060708010203040506070801020304050607080102030405";
   const Repair rows[] = {
