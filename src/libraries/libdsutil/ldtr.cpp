@@ -38,7 +38,7 @@ SinkSlot currentSink() {
 
 // Calls a sink, and is the frame at which the search for a handler of its exception fails: the exception then ends the
 // process where it was thrown (std::terminate), in place of unwinding operations of which nothing would be undone. The
-// compiler would give a noexcept function the same, and the whole C++ library with it.
+// compiler would give a noexcept function the same at the price of the C++ library, which nothing here needs.
 [[gnu::noinline]] void callSink(const SinkSlot& slot, const ldtr_record* record) {
   __asm__ volatile(".cfi_personality 0x1b, ldtr_refuse_to_unwind");
   slot.sink(record, slot.user);
