@@ -307,6 +307,8 @@ const Row kRows[] = {
      noRecord()},
     {"setDirKeyDataGlobal", [](Odd& a) -> std::string { return shown(run(setDirKeyDataGlobal, Arguments{a.pointer(nowhere)})); }, "1!",
      noRecord()},
+    {"getCfgKeyDataGlobal", [](Odd&) -> std::string { return getCfgKeyDataGlobal() == nullptr ? "null" : "some"; }, ""},
+    {"getDirKeyDataGlobal", [](Odd&) -> std::string { return getDirKeyDataGlobal() == nullptr ? "null" : "some"; }, ""},
     {"setCfgCryptoSyncGlobal", [](Odd& a) -> std::string { return shown(run(setCfgCryptoSyncGlobal, Arguments{a.pointer<char>(nullptr)})); }, "1"},
     {"checkKeyStashFile", [](Odd& a) -> std::string { return shown(run(checkKeyStashFile, Arguments{a.number(1), a.pointer(keys), a.pointer(text), a.pointer(text), a.pointer(&number)})); }, "1 1 0 1 | 1! | 1! | 1! | 1!"},
     {"readKeyStashFile", [](Odd& a) -> std::string { return shown(run(readKeyStashFile, Arguments{a.pointer("/dev/zero"), a.pointer(keys)})); }, "1! | 1!",
@@ -350,7 +352,8 @@ std::string outcomesOf(const Row& row) {
       Odd odd(argument, variant);
       std::string outcome = outcomeOf(row.name, [&] { return row.call(odd); });
       const bool isInvalid = outcome.find("Invalid parameter.") != std::string::npos;
-      outcome = outcome.substr(0, outcome.find(' ')) + (isInvalid ? "!" : "");
+      const bool isOdd = outcome[0] == '0' && outcome.find(" debug: ") == std::string::npos && outcome.back() != ' ';
+      outcome = outcome.substr(0, outcome.find(' ')) + (isInvalid ? "!" : isOdd ? "?" : "");
       if (odd.ended()) return outcomes;
       if (odd.tried()) break;
       outcomes += (variant > 0 ? " " : argument > 0 ? " | " : "") + outcome;
@@ -503,6 +506,8 @@ constexpr char kScopes[] = R"(
 50020500 43 10000 checkKeyStashFile: Entering. keyData = #, cryptoSync = #, cryptoSalt = #, isMatch = #
 50020600 33 1000 setCfgKeyDataGlobal: Entering. keyStashFile = #
 50020700 33 1000 setDirKeyDataGlobal: Entering. keyStashFile = #
+50020800 33 1000 getCfgKeyDataGlobal: Entering.
+50020900 33 1000 getDirKeyDataGlobal: Entering.
 50020a00 33 1000 setCfgCryptoSyncGlobal: Entering. cryptoSync = #
 50020b00 33 1000 setCipherNameGlobal: Entering.
 50030100 43 10000 genKeySaltVal: Entering. qelCtx = #, keyData = #
