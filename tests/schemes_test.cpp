@@ -420,6 +420,12 @@ TEST(Secrets, AreGoneFromTheStack) {
   for (const std::string& form : forms) {
     for (size_t i = 0; i < uses.size(); ++i) EXPECT_FALSE(leftOnStack(uses[i], form)) << i << " " << form;
   }
+  const auto schedule = [] {
+    const unsigned char key[8] = {255, 255, 255, 255, 255, 255, 255, 255};
+    uint32_t words[32];
+    deskey40(words, key, 0);
+  };
+  EXPECT_FALSE(leftOnStack(schedule, std::string(28, '\1'))) << "the bits of a key, a byte each";
 }
 
 // While the trace gets another sink again and again, which the thread sanitizer looks at.
