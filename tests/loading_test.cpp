@@ -158,6 +158,19 @@ TEST(ProviderContext, IsOneForThreadsThatAskAtOnceAndCleanedUpAtExit) {
   EXPECT_EQ(log, kCreation + kEnd);
 }
 
+TEST(ProviderContext, IsLeftAloneAtExitAndRefusedWhileAnotherThreadWorks) {
+  const std::string log = staged("complete", nullptr, [] {
+    std::atexit([] {  // comes after the library's own handler
+      void* context = nullptr;
+      _exit(initQelCrypto(&context) == 1 && context == nullptr ? 0 : 1);
+    });
+    void* context = nullptr;
+    EXPECT_EQ(initQelCrypto(&context), 0);
+    std::thread([] { pause(); }).detach();
+  });
+  EXPECT_EQ(log, kCreation);
+}
+
 TEST(ProviderContext, IsMadeOverOneLibraryAndReleasedOnceHoweverOftenThatIsUnloaded) {
   const std::string log = staged("complete", nullptr, [] {
     void* context = nullptr;
