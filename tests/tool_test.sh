@@ -320,12 +320,17 @@ hunter2|there is no such verb \(--help lists them\)
 keys|a verb is missing \(--help lists them\)
 format -scheme md5|unknown option: -s
 --frob=hunter2 format|unknown option: --frob
+keys restore none hunter2|a seed is not taken from the command line, .*--seed-file
+keys create --directory none hunter2|a seed is not taken from the command line, .*--seed-file
+verify {SHA}x hunter2|a password is not taken from the command line, .*--password-file
+format --scheme md5 hunter2|a password is not taken from the command line, .*--password-file
 ROWS
 yes '{AES128}AAAAAAAAAAAAAAAAAAAAAA==' | head -1500 >many
 run 'many problems' 4 reveal <many
 same 'many problems' '1000 ldappw: 500 more: an AES value needs the key stash (--keys)' \
   "$(grep -c '^ldappw: line ' err) $(grep more: err)"
 same 'results keep step' 1500 "$(wc -l <out)"
+same 'as many problems as are shown' 1000 "$("$tool" reveal < <(head -1000 many) 2>&1 >out | wc -l)"
 mkfifo pipe; cat dir >pipe &
 check 'keys from a pipe' 0 match verify --keys pipe "$aesValue" <<<secret
 run 'a cut in a check' 1 verify --clear 123 < <(printf '%047d\n' 0)
