@@ -142,7 +142,7 @@ TEST(LibraryPath, HoldsTheSystemFolderAfterwards) {
   }
 }
 
-TEST(TraceLines, ArriveWholeWhateverTheirLength) {
+TEST(TraceLines, ArriveWhole) {
   for (const size_t length : {size_t{0}, size_t{511}, size_t{512}, size_t{9000}}) {
     const std::string line(length, 'x');
     const test::TraceCapture trace;
@@ -150,6 +150,10 @@ TEST(TraceLines, ArriveWholeWhateverTheirLength) {
     ASSERT_EQ(trace.records().size(), 1U);
     EXPECT_EQ(trace.records()[0].text, line);
   }
+  testing::internal::CaptureStderr();
+  ldtr_formater_global(LDTR_ERROR, "with %s", "a class");
+  ldtr_formater_global(LDTR_DEBUG, "and an end\n");
+  EXPECT_EQ(testing::internal::GetCapturedStderr(), "00000000 error with a class\n00000000 debug and an end\n");
 }
 
 TEST(CipherSpecs, GetTheStrongerCodeFirst) {
