@@ -149,6 +149,7 @@ TEST(TraceLines, ArriveWhole) {
     ldtr_formater_global(LDTR_ERROR, "%s", line.c_str());
     ASSERT_EQ(trace.records().size(), 1U);
     EXPECT_EQ(trace.records()[0].text, line);
+    EXPECT_TRUE(trace.records()[0].kind == 3 && trace.records()[0].severity == 1);  // sinks know the numbers
   }
   testing::internal::CaptureStderr();
   ldtr_formater_global(LDTR_ERROR, "with %s", "a class");
