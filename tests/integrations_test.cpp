@@ -27,7 +27,8 @@ const plugin::Library& library() {
   static const plugin::Library opened = [] {
     plugin::Library made{};
     const char* problem = "";
-    EXPECT_TRUE(plugin::openLibrary(made, problem)) << problem;
+    EXPECT_TRUE(plugin::openLibrary(made, problem));
+    EXPECT_STREQ(problem, "");
     return made;
   }();
   return opened;
