@@ -76,10 +76,10 @@ class ldtr_function_local {
  public:
   explicit ldtr_function_local(const ldtr_scope& scope) noexcept
       : scope_(scope), events_(ldtr_events() & (scope.mask | static_cast<unsigned>(LDTR_EVENT_DEBUG))) {
-    if (recordsScope()) ldtr_write_entry(&scope_);
+    if (isOn() && recordsScope()) ldtr_write_entry(&scope_);  // one test where nothing is traced, shared with the lines
   }
   ~ldtr_function_local() {
-    if (recordsScope()) ldtr_write_exit(&scope_, rc_);
+    if (isOn() && recordsScope()) ldtr_write_exit(&scope_, rc_);
   }
   ldtr_function_local(const ldtr_function_local&) = delete;
   ldtr_function_local& operator=(const ldtr_function_local&) = delete;
