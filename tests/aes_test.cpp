@@ -184,7 +184,7 @@ TEST_F(Derivation, RandomTextsAreOfTheirRangeAndEndAtTheLastByte) {
   }
 }
 
-TEST_F(Derivation, AFailingGeneratorEndsTheProcess) {
+TEST_F(Derivation, WithoutARandomNumberTheProcessEnds) {
   const rlimit none{0, 0};  // and leave no core files
   unsigned char buffer[4];
   const testing::KilledBySignal aborted(SIGABRT);
@@ -192,6 +192,7 @@ TEST_F(Derivation, AFailingGeneratorEndsTheProcess) {
     EXPECT_EXIT((setrlimit(RLIMIT_CORE, &none), morva_rand_ascii(ctx, buffer, 4)), aborted,
                 "^The PRNG is not seeded!\n$");
   });
+  EXPECT_EXIT((setrlimit(RLIMIT_CORE, &none), ldappw::morva_rand_range(ctx, 5, 5)), aborted, "") << "no number to draw";
 }
 
 // ---- Derivation ----

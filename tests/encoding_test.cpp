@@ -110,7 +110,7 @@ TEST(Base64, CompactsAndTellsOnStandardOutput) {
   EXPECT_EQ(taken(compactToOnlyBase64("=ab=c\ndef=")), "abcdef");
   EXPECT_EQ(taken(compactToOnlyString("hello world", "lo")), "llool");
   EXPECT_EQ(compactToOnlyBase64("=="), nullptr);
-  EXPECT_EQ(taken(binaryBlobToBase64(nullptr, -1)), "");
+  for (const int length : {0, -1}) EXPECT_EQ(taken(binaryBlobToBase64(nullptr, length)), "");
   EXPECT_EQ(binaryBlobToString(bytesOf("a"), 1, kStandard.substr(1).c_str()), nullptr);
   const AllocationWatch watch(0);
   EXPECT_EQ(compactToOnlyBase64("=\nab=c"), nullptr);

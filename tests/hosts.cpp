@@ -144,6 +144,7 @@ void isCancelled() {
     return nullptr;
   };
   CHECK(freopen("/dev/null", "w", stderr) != nullptr && freopen("/dev/null", "w", stdout) != nullptr);
+  close(STDIN_FILENO);  // its number is that of the next file
   CHECK(pthread_create(&thread, nullptr, body, &done) == 0);
   void* result = nullptr;
   CHECK(pthread_join(thread, &result) == 0 && result == PTHREAD_CANCELED && done);

@@ -4,6 +4,7 @@
 #include <climits>
 #include <thread>
 
+#include "crypto_des_tables.h"
 #include "failures.h"
 #include "oracle.h"
 #include "password_schemes.h"
@@ -79,7 +80,7 @@ TEST(CheckFormat, FollowsTheUnevenLengthsOfTheTags) {
       {"{SSHA}", 1},     {"{SSHA}x", 9},     {"{crypt}", 1},  {"{Crypt}a", 4},    {"{qVEIL}", 1},  {"{QVeil}x", 128},
       {"{AES128}", 1},   {"{AES128}x", 135}, {"{AES192}", 1}, {"{aes192}x", 134}, {"{AES256}", 1}, {"{AES256}x", 133},
       {"{VLDL}", 1},     {"{vldl}x", 8},     {"{XYZ}abc", 1}, {"{AES12}xyz", 1},  {"[SHA]abc", 1}, {"xyz{SHA}", 1},
-      {">abcdef<", 128}, {">abcde<", 1},     {">abcdefg", 1}, {"{abcdefg<", 1},   {"{SHA>abc", 1}, {"{crypt", 1}};
+      {">abcdef<", 128}, {">abcde<", 1},     {">abcdefg", 1}, {"{abcdefg<", 1},   {"{SHA]abc", 1}, {"{crypt", 1}};
   for (const auto& [text, code] : rows) {
     SCOPED_TRACE(text);
     Guarded value(text);
@@ -420,12 +421,16 @@ TEST(Secrets, AreGoneFromTheStack) {
   for (const std::string& form : forms) {
     for (size_t i = 0; i < uses.size(); ++i) EXPECT_FALSE(leftOnStack(uses[i], form)) << i << " " << form;
   }
-  const auto schedule = [] {
-    const unsigned char key[8] = {255, 255, 255, 255, 255, 255, 255, 255};
-    uint32_t words[32];
-    deskey40(words, key, 0);
-  };
-  EXPECT_FALSE(leftOnStack(schedule, std::string(28, '\1'))) << "the bits of a key, a byte each";
+  const unsigned char key[8] = {255, 255, 255, 255, 255, 255, 255, 255};
+  uint32_t words[32];
+  EXPECT_FALSE(leftOnStack([&] { deskey40(words, key, 0); }, std::string(28, '\1')))
+      << "the bits of a key, a byte each";
+  const ldappw::RoundWords* const rows[][2] = {{&ldappw::kKeyParts.c[6][15], &ldappw::kKeyParts.c[7][15]},
+                                               {&ldappw::kKeyParts.d[6][15], &ldappw::kKeyParts.d[7][15]}};
+  for (const auto& pair : rows) {
+    const std::string addresses(reinterpret_cast<const char*>(pair), sizeof pair);
+    EXPECT_FALSE(leftOnStack([&] { deskey(words, key, 0); }, addresses)) << "where the parts of a key are";
+  }
 }
 
 // While the trace gets another sink again and again, which the thread sanitizer looks at.
