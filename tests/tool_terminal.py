@@ -114,7 +114,9 @@ def ended_by(number, send):
 
 
 def suspended():
-    shell = (f"set -m; '{TOOL}' verify '{stored(b'secret')}'; echo stopped; read -r; fg >/dev/null; echo rc=$?")
+    # The prompt goes to the terminal, whatever has the messages.
+    verify = f"'{TOOL}' verify '{stored(b'secret')}' 2>/dev/null"
+    shell = f"set -m; {verify}; echo stopped; read -r; fg >/dev/null; echo rc=$?"
     with Terminal(shell=shell) as terminal:
         terminal.asks(b"Password: ")
         terminal.type(b"\x1a")

@@ -498,7 +498,7 @@ complete() { "${BASH}" -c '. "$0"; COMP_WORDS=("$@"); COMP_CWORD=$(($# - 1)); _l
 same 'completion' 'format,create restore show check compare,--seed-file --salt-file,' \
   "$(complete fo),$(complete keys ''),$(complete keys create --s),$(complete verify x)"
 ! LD_DEBUG=files "$tool" --version 2>&1 | grep -E 'libldap-|tresk' || fail 'a library is loaded that is not needed'
-"$tool" identify x >/dev/full 2>err; same 'full output' 5 $?
+"$tool" identify x >/dev/full 2>err; same 'full output' '5 ldappw: standard output: No space left on device' "$? $(<err)"
 "$tool" identify x >&- 2>err; same 'closed output' 5 $?
 "$tool" --version >/dev/full 2>err; same 'full output of the version' 5 $?
 for verb in identify 'format --scheme md5' reveal; do  # whoever asks line by line is answered line by line
