@@ -183,6 +183,8 @@ run 'bytes under one key' 0 ldif --to aes256 --new-keys A --in in --out bytes --
 run 'bytes that another key opens too' 0 ldif --to aes256 --keys C --keys A --new-keys B --allow-binary --in bytes --out moved
 run 'bytes moved' 0 ldif --to clear --allow-clear --keys B --allow-binary --in moved
 sameFile 'the one with more padding is right' in out
+printf 'dn: a\nuserPassword: %s\n' "$(printf '\xff' | "$tool" format --scheme qveil)" >in
+run 'bytes that need no key' 0 ldif --to sha --allow-binary --in in
 run 'longer than qveil holds' 3 ldif --to qveil --keys B --allow-binary --in b
 kept=$(unfold out | grep -ci '^userpassword: {AES256}') long=$(grep -c 'more bytes than' err)
 [[ $kept == "$long" && $kept -gt 100 ]] || fail "qveil: $kept kept, $long listed"
