@@ -260,10 +260,10 @@ std::vector<Run> runsWith(const std::string& password, const std::string& seed) 
   const Words both = {password, content.substr(content.size() - 32, 16)}, keyAlone = {both[1]};
   const std::string aes = valueOf(password, FORMAT_AES256), ssha = valueOf(password, FORMAT_SSHA);
   const std::string mixed = exportOf(aes) + exportOf(password) + exportOf(valueOf(password, FORMAT_QVEIL));
-  const std::string bytes = "\xff" + password;
+  const std::string bytes = std::string("\xff\0", 2) + password;  // releasing looks no further than the NUL
   char* base64 =
       binaryBlobToBase64(reinterpret_cast<const unsigned char*>(bytes.data()), static_cast<int>(bytes.size()));
-  const Words encoded = {base64};
+  const Words encoded = {base64, password};
   free(base64);
   std::ofstream("salt") << "saltsaltsalt\n";
   std::ofstream("bad") << password << '\n';
