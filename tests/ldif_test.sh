@@ -85,6 +85,7 @@ with an option|0|dn: a\npin;Lang-en;b: w\npin: y\n|dn: a\npin;Lang-en;b: $(sha w
 a list|2|dn: a\n|||--attribute a,b
 an empty option|2|dn: a\n|||--attribute a;
 no number|2|dn: a\n|||--attribute 2
+too many|2|dn: a\n||more than 64 attributes|$(printf -- '--attribute a%d ' {1..65})
 ROWS
 run 'an empty attribute' 2 ldif --to sha in --attribute ''
 run 'two exports' 2 ldif --to sha in --in in
