@@ -253,10 +253,11 @@ TEST_F(Terminal, EchoesAgainBeforeASignalActs) {
     SCOPED_TRACE(row.signal);
     const pid_t child = fork();
     if (child == 0) {
+      alarm(60);
       dup2(terminal, STDIN_FILENO);
-      struct sigaction ours {};
-      ours.sa_handler = [](int) {};  // without SA_RESTART: the read is interrupted
-      if (row.isHandled) sigaction(row.signal, &ours, nullptr);
+      struct sigaction ours {};  // without SA_RESTART, so the read is interrupted; a background job ignores some
+      if (row.isHandled) ours.sa_handler = [](int) {};
+      sigaction(row.signal, &ours, nullptr);
       if (freopen("/dev/null", "w", stdout) == nullptr) _exit(99);
       const std::string password = test::taken(getPassword());
       char rest = 0;
