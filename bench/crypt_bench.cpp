@@ -10,7 +10,7 @@
 #include <ctime>
 
 #include "bench_support.h"
-#include "crypto_des.h"
+#include "crypt/crypto_des.h"
 
 namespace {
 

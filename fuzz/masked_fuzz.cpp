@@ -7,9 +7,9 @@
 
 #include "encoding_utils.h"
 #include "fuzz_input.h"
-#include "utils_base64.h"
-#include "utils_masked_bits.h"
-#include "utils_masked_tables.h"
+#include "masked/utils_masked_bits.h"
+#include "masked/utils_masked_tables.h"
+#include "support/utils_base64.h"
 
 using namespace fuzz;
 using namespace ldappw::masking;

@@ -11,7 +11,7 @@ import subprocess
 import sys
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent
-SOURCES = ROOT / "src/libraries/libcrypto"
+SOURCES = ROOT / "src/libraries/libcrypto/include"
 HEADERS = ("password_schemes.h", "encoding_utils.h", "crypto_provider.h", "aes_keys.h")
 FORBIDDEN_IMPORTS = re.compile(r"^(__cxa_throw|__cxa_allocate_exception|_Zn[wa][jm])$")
 

@@ -27,16 +27,17 @@ ALLOWED = {
     "integrations": {"public"},
 }
 
-# The layers of libcrypto by the beginnings of file names, the upper first. A file uses its own layer and those below.
-LAYERS = (
-    ("password schemes", ("rdbm_pwd",)),
-    ("digests, crypt, masked encoding and AES",
-     ("sha", "salted_hash", "unsalted_hash", "crypt", "crypto", "utils_masked", "aes")),
-    ("provider contexts", ("qel_utils",)),
-    ("loader wrappers", ("utils_loader",)),
-    ("helpers", ("utils_base64", "getpw", "locks", "trace_scope", "bits", "cancellation", "owners", "processor",
-                 "text_target", "vector_kernel", "wipe")),
-)
+# The folders of a part, the upper layer first; a file uses its own layer and those below. "." is the part's own folder.
+# "include" has the public headers, which all may use.
+LAYERS = {
+    "src/libraries/libcrypto": (
+        ("passwords",),
+        ("digests", "crypt", "masked", "aes"),
+        ("provider",),
+        ("support",),
+    ),
+}
+OBJECTS = {"src/libraries/libcrypto": "ldappw_objects"}
 
 
 def files(*patterns):
@@ -47,7 +48,7 @@ def files(*patterns):
 def owners():
     result = {}
     for folder in ("libdsutil", "libqel", "libcrypto"):
-        for header in (LIBRARIES / folder).glob("*.h"):
+        for header in (LIBRARIES / folder).rglob("*.h"):
             result.setdefault(header.name, set()).add("public" if header.name in PUBLIC else folder)
     return result
 
@@ -62,8 +63,8 @@ def include_faults():
             if path.name in PUBLIC:
                 if name not in (PUBLIC_SYSTEM if kind == "<" else PUBLIC):
                     yield "%s: a public header includes %s" % (path.relative_to(ROOT), name)
-            elif kind == '"' and name not in own:
-                if not owner.get(name, {"?"}) & ALLOWED[home]:
+            elif kind == '"' and "/" not in name and name not in own:
+                if not owner.get(name, {"?"}) & ({home} | ALLOWED[home] | {"public"}):
                     yield "%s: includes %s against the layers" % (path.relative_to(ROOT), name)
             elif kind == "<" and name.startswith("openssl/") and home not in ("libqel", "tools"):
                 yield "%s: OpenSSL belongs to libqel and the command" % path.relative_to(ROOT)
@@ -82,48 +83,51 @@ def begins_with(stem, beginning):
     return stem == beginning or stem.startswith(beginning + "_")
 
 
-def layer(stem):
-    """The number of a file's layer, 0 being the uppermost; None for a file that is in none."""
-    return next((number for number, (_, beginnings) in enumerate(LAYERS)
-                 if any(begins_with(stem, beginning) for beginning in beginnings)), None)
+def layer(part, place):
+    """The number of the layer of a file, by its place in a part, 0 being the uppermost; None for one that is in none."""
+    folder = str(pathlib.PurePath(place).parent)
+    return next((number for number, folders in enumerate(LAYERS[part]) if folder in folders), None)
 
 
-def missing_layer_faults():
-    for path in files("src/libraries/libcrypto/*.cpp", "src/libraries/libcrypto/*.h", "src/libraries/libcrypto/*.S"):
-        if path.name not in PUBLIC and layer(path.stem) is None:
+def missing_layer_faults(part):
+    for path in files(part + "/*.cpp", part + "/*.h", part + "/*.S"):
+        if path.parent.name != "include" and layer(part, path.relative_to(ROOT / part)) is None:
             yield "%s: is in no layer of scripts/check_tree.py" % path.relative_to(ROOT)
 
 
-def layer_include_faults():
-    for path in files("src/libraries/libcrypto/*.cpp", "src/libraries/libcrypto/*.h"):
+def layer_include_faults(part):
+    """Headers of a part are included by their folders, so that a reader sees the layer."""
+    for path in files(part + "/*.cpp", part + "/*.h"):
+        upper = layer(part, path.relative_to(ROOT / part))
         for name in re.findall(r'^#include "([^"]+)"', path.read_text(), flags=re.M):
-            upper, lower = layer(path.stem), layer(pathlib.Path(name).stem)
-            if name not in PUBLIC and None not in (upper, lower) and lower < upper:
+            if "/" not in name and (path.parent / name).exists() and path.parent != ROOT / part and upper is not None:
+                yield "%s: includes %s without its folder" % (path.relative_to(ROOT), name)
+            lower = layer(part, name)
+            if (ROOT / part / name).exists() and None not in (upper, lower) and lower < upper:
                 yield "%s: includes %s of an upper layer" % (path.relative_to(ROOT), name)
 
 
 def defined_and_needed(objects):
-    """By file name: the symbols that an object file defines for others, and those that it needs of others."""
+    """By a source's place: the symbols that its object file defines for others, and those that it needs of others."""
     defined, needed = collections.defaultdict(set), collections.defaultdict(set)
-    for path in objects:
-        stem = path.name.split(".")[0]
+    for place, path in objects.items():
         rows = subprocess.run(["nm", "--format=posix", path], check=True, stdout=subprocess.PIPE, text=True).stdout
         for symbol, kind in (row.split()[:2] for row in rows.splitlines()):
             if kind in "Uwv":
-                needed[stem].add(symbol)
+                needed[place].add(symbol)
             elif kind.isupper() and kind not in "WV":  # weak: inline functions, which every user has
-                defined[stem].add(symbol)
+                defined[place].add(symbol)
     return defined, needed
 
 
 def calls(defined, needed):
     """By user and used file, the symbol in between that comes first."""
-    home = {symbol: stem for stem, symbols in defined.items() for symbol in symbols}
+    home = {symbol: place for place, symbols in defined.items() for symbol in symbols}
     found = collections.defaultdict(dict)
-    for stem, symbols in needed.items():
+    for place, symbols in needed.items():
         for symbol in sorted(symbols, reverse=True):
-            if home.get(symbol, stem) != stem:
-                found[stem][home[symbol]] = symbol
+            if home.get(symbol, place) != place:
+                found[place][home[symbol]] = symbol
     return found
 
 
@@ -131,10 +135,11 @@ def plain(symbol):
     return subprocess.run(["c++filt", symbol], check=True, stdout=subprocess.PIPE, text=True).stdout.strip()
 
 
-def layer_call_faults(graph):
+def layer_call_faults(part, graph):
     for user, used in sorted((user, used) for user in graph for used in graph[user]):
-        if None not in (layer(user), layer(used)) and layer(used) < layer(user):
-            yield "libcrypto: %s calls %s of an upper layer: %s" % (user, used, plain(graph[user][used]))
+        upper, lower = layer(part, user), layer(part, used)
+        if None not in (upper, lower) and lower < upper:
+            yield "%s: %s calls %s of an upper layer: %s" % (part, user, used, plain(graph[user][used]))
 
 
 def shortest_circle(graph, start):
@@ -150,7 +155,7 @@ def shortest_circle(graph, start):
     return None
 
 
-def circle_faults(graph):
+def circle_faults(part, graph):
     """A line for each circle; a file is named in the shortest one that it is part of."""
     shown = set()
     for start in sorted(graph):
@@ -158,22 +163,29 @@ def circle_faults(graph):
         if way:
             shown.update(way)
             steps = ("%s (%s)" % (used, plain(graph[user][used])) for user, used in zip(way, way[1:] + way[:1]))
-            yield "libcrypto: calls run in a circle: %s -> %s" % (start, " -> ".join(steps))
+            yield "%s: calls run in a circle: %s -> %s" % (part, start, " -> ".join(steps))
+
+
+def begins_with(stem, beginning):
+    return stem == beginning or stem.startswith(beginning + "_")
 
 
 def own_headers(path, defined):
     """The header of the same name; or those of the module, and the public ones that declare what the file defines."""
     own = path.with_suffix(".h")
-    if own.exists() or path.parent.name != "libcrypto":
+    part = ROOT / "src/libraries/libcrypto"
+    if own.exists() or part not in path.parents:
         return {own.name}
     near = {header.name for header in path.parent.glob("*.h")
             if begins_with(path.stem, header.stem) or begins_with(header.stem, path.stem)}
-    return near | {header for header in PUBLIC if check_exports.declared_in(header) & defined.get(path.stem, set())}
+    symbols = defined.get(str(path.relative_to(part)), set())
+    return near | {header for header in PUBLIC if check_exports.declared_in(header) & symbols}
 
 
 def first_include_faults(defined):
     for path in files("src/*.cpp", "tests/*.cpp"):
-        includes = re.findall(r'^#include [<"]([^>"]+)[>"]', path.read_text(), flags=re.M)
+        includes = [pathlib.PurePath(name).name
+                    for name in re.findall(r'^#include [<"]([^>"]+)[>"]', path.read_text(), flags=re.M)]
         own = own_headers(path, defined) & set(includes)
         if own and includes[0] not in own:
             yield "%s: the first include is not its own header, %s" % (path.relative_to(ROOT), " or ".join(sorted(own)))
@@ -188,16 +200,25 @@ def bare_word_faults():
                 yield '%s:%d: a bare "meant"; say why, and what follows' % (path.relative_to(ROOT), number)
 
 
+def objects_of(part, build):
+    folder = build / part / "CMakeFiles" / (OBJECTS[part] + ".dir")
+    objects = {str(path.relative_to(folder).with_suffix("")): path for path in sorted(folder.rglob("*.o"))}
+    if not objects:
+        sys.exit("check_tree: %s has no object files of %s; build it first" % (build, part))
+    # A source that was renamed leaves its object behind.
+    return {place: path for place, path in objects.items() if (ROOT / part / place).exists()}
+
+
 def main():
     build = ROOT / (sys.argv[1] if len(sys.argv) > 1 else "build/release")
-    objects = [path for path in sorted(build.glob("src/libraries/libcrypto/CMakeFiles/ldappw_objects.dir/*.o"))
-               if (LIBRARIES / "libcrypto" / path.stem).exists()]  # a source that was renamed leaves its object behind
-    if not objects:
-        sys.exit("check_tree: %s has no object files of libcrypto; build it first" % build)
-    defined, needed = defined_and_needed(objects)
-    graph = calls(defined, needed)
-    faults = [*include_faults(), *forbidden_call_faults(), *missing_layer_faults(), *layer_include_faults(),
-              *layer_call_faults(graph), *circle_faults(graph), *first_include_faults(defined), *bare_word_faults()]
+    faults = [*include_faults(), *forbidden_call_faults(), *bare_word_faults()]
+    for part in LAYERS:
+        defined, needed = defined_and_needed(objects_of(part, build))
+        graph = calls(defined, needed)
+        faults += [*missing_layer_faults(part), *layer_include_faults(part), *layer_call_faults(part, graph),
+                   *circle_faults(part, graph)]
+        if part == "src/libraries/libcrypto":
+            faults += first_include_faults(defined)
     if faults:
         sys.exit("\n".join(faults))
 

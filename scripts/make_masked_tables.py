@@ -15,7 +15,7 @@ import pathlib
 import sys
 
 DEFAULT_SEED = "ldappw masking tables, first edition"
-DEFAULT_FILE = pathlib.Path(__file__).resolve().parent.parent / "src/libraries/libcrypto/utils_masked_tables.h"
+DEFAULT_FILE = pathlib.Path(__file__).resolve().parent.parent / "src/libraries/libcrypto/masked/utils_masked_tables.h"
 STANDARD = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/"
 
 

@@ -5,7 +5,7 @@
 
 #include <climits>
 
-#include "aes_salt.h"
+#include "aes/aes_salt.h"
 #include "failures.h"
 #include "oracle.h"
 

@@ -4,11 +4,11 @@
 
 #include <array>
 
-#include "crypto_des.h"
+#include "crypt/crypto_des.h"
+#include "masked/utils_masked_tables.h"
 #include "oracle.h"
 #include "support.h"
-#include "utils_base64.h"
-#include "utils_masked_tables.h"
+#include "support/utils_base64.h"
 
 using namespace std::string_literals;
 using namespace test;

@@ -6,7 +6,7 @@
 
 #include <csignal>
 
-#include "aes_file_format.h"
+#include "aes/aes_file_format.h"
 #include "failures.h"
 #include "oracle.h"
 

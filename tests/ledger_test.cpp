@@ -17,7 +17,7 @@
 #include "failures.h"
 #include "oracle.h"
 #include "password_schemes.h"
-#include "qel_utils_table.h"
+#include "provider/qel_utils_table.h"
 
 using namespace test;
 

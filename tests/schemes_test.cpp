@@ -4,11 +4,11 @@
 #include <climits>
 #include <thread>
 
-#include "crypto_des_tables.h"
+#include "crypt/crypto_des_tables.h"
+#include "digests/sha.h"
 #include "failures.h"
 #include "oracle.h"
 #include "password_schemes.h"
-#include "sha.h"
 #include "system_crypt.h"
 
 using namespace std::string_literals;

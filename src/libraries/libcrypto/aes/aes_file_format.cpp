@@ -1,0 +1,122 @@
+// SPDX-License-Identifier: Apache-2.0
+// The stash file format, with its one writer and its one reader.
+#include "aes/aes_file_format.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cstdio>
+
+#include "aes/aes_utils_record.h"
+#include "support/cancellation.h"
+#include "support/trace_scope.h"
+
+static_assert(__BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__, "the file's sync length is little-endian");
+
+namespace ldappw {
+namespace {
+
+constexpr TraceInfo kWrite = operation(kAesFile, 1, "writeKeyStashFile", {"keyStashFile", "keyData"});
+constexpr TraceInfo kRead = operation(kAesFile, 2, "readKeyStashFile", {"keyStashFile", "keyData"});
+
+// A stash file under way. It has no buffer of its own: no key stays behind in one, and a write that the device refuses
+// is noticed at once.
+class StashFile {
+ public:
+  static StashFile forReading(const char* path) noexcept { return StashFile(std::fopen(path, "rbe")); }
+  static StashFile forWriting(const char* path) noexcept {
+    const int descriptor = open(path, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, S_IRUSR | S_IWUSR);
+    if (descriptor < 0) return StashFile(nullptr);
+    FILE* file = fdopen(descriptor, "wb");
+    if (file == nullptr) close(descriptor);
+    return StashFile(file);
+  }
+  ~StashFile() {
+    if (file_ != nullptr) std::fclose(file_);
+  }
+  StashFile(const StashFile&) = delete;
+  StashFile& operator=(const StashFile&) = delete;
+
+  explicit operator bool() const noexcept { return file_ != nullptr; }
+  bool read(void* data, size_t bytes) noexcept { return std::fread(data, 1, bytes, file_) == bytes; }
+  bool write(const void* data, size_t bytes) noexcept { return std::fwrite(data, 1, bytes, file_) == bytes; }
+  bool write(const SecBuffer& buffer) noexcept { return buffer.length == 0 || write(buffer.data, buffer.length); }
+  void flush() noexcept { std::fflush(file_); }
+
+  // Whether a regular file is known to hold less than so many further bytes.
+  bool endsBefore(size_t bytes) noexcept {
+    struct stat about {};
+    const long at = std::ftell(file_);
+    return fstat(fileno(file_), &about) == 0 && S_ISREG(about.st_mode) && at >= 0 &&
+           static_cast<uint64_t>(about.st_size) - static_cast<uint64_t>(at) < bytes;
+  }
+
+ private:
+  explicit StashFile(FILE* file) noexcept : file_(file) {
+    if (file_ != nullptr) std::setvbuf(file_, nullptr, _IONBF, 0);
+  }
+  FILE* file_;
+};
+
+// The sync text with its length before it. What a regular file cannot hold is not allocated.
+int readSync(TracedCall& call, StashFile& file, SecBuffer& sync) noexcept {
+  uint32_t length = 0;
+  const bool isWhole = file.read(&length, sizeof length);
+  release(sync);
+  sync.length = length;
+  if (!isWhole || file.endsBefore(length)) return call.fail(LDAPPW_OPERATIONS_ERROR, "fread(cryptoSync) failed.");
+  sync.data = length == UINT32_MAX ? nullptr : zeroedBytes<unsigned char>(size_t{length} + 1);
+  if (sync.data == nullptr) {  // log readers find the name of the function that usually makes the sync text
+    return call.failText(LDAPPW_NO_MEMORY, "Error - genKeySyncVal: calloc(cryptoSync) returned NULL. rc = %d\n",
+                         static_cast<int>(LDAPPW_NO_MEMORY));
+  }
+  if (!file.read(sync.data, length)) return call.fail(LDAPPW_OPERATIONS_ERROR, "fread(cryptoSync) failed.");
+  return LDAPPW_SUCCESS;
+}
+
+}  // namespace
+
+int writeKeyStashFile(const char* keyStashFile, const AesKeyData* keyData) noexcept {
+  TracedCall call{kWrite, keyStashFile, keyData};
+  if (anyNull(keyStashFile, keyData)) return call.invalid();
+  const NoCancellation uncancelled;
+  StashFile file = StashFile::forWriting(keyStashFile);
+  if (!file) return call.fail(LDAPPW_OPERATIONS_ERROR, "fopen() failed.");
+  const uint32_t length = keyData->cryptoSync.length;
+  if (!file.write(&length, sizeof length) || !file.write(keyData->cryptoSync)) {
+    return call.fail(LDAPPW_OPERATIONS_ERROR, "fwrite(cryptoSync) failed.");
+  }
+  if (!file.write(keyData->cryptoSalt)) return call.fail(LDAPPW_OPERATIONS_ERROR, "fwrite(cryptoSalt) failed.");
+  for (const SecBuffer& key : keyData->aesKeys) {
+    if (!file.write(key)) return call.fail(LDAPPW_OPERATIONS_ERROR, "fwrite(aesKeys) failed.");
+  }
+  file.flush();
+  return call.leave(LDAPPW_SUCCESS);
+}
+
+}  // namespace ldappw
+
+using namespace ldappw;
+
+extern "C" {
+
+// Documented in aes_keys.h.
+
+int readKeyStashFile(const char* keyStashFile, AesKeyData* keyData) noexcept {
+  TracedCall call{kRead, keyStashFile, keyData};
+  if (anyNull(keyStashFile, keyData)) return call.invalid();
+  const NoCancellation uncancelled;
+  StashFile file = StashFile::forReading(keyStashFile);
+  if (!file) return call.fail(LDAPPW_OPERATIONS_ERROR, "fopen() failed.");
+  if (const int rc = readSync(call, file, keyData->cryptoSync); rc != 0) return rc;
+  if (!file.read(keyData->cryptoSalt.data, keyData->cryptoSalt.length)) {
+    return call.fail(LDAPPW_OPERATIONS_ERROR, "fread(cryptoSalt) failed.");
+  }
+  for (const SecBuffer& key : keyData->aesKeys) {
+    if (!file.read(key.data, key.length)) return call.fail(LDAPPW_OPERATIONS_ERROR, "fread(aesKeys) failed.");
+  }
+  return call.leave(LDAPPW_SUCCESS);
+}
+
+}  // extern "C"

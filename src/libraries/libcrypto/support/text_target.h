@@ -1,0 +1,54 @@
+// SPDX-License-Identifier: Apache-2.0
+// Where the base64 text of an operation goes, and the digest and AES operations as the password module calls them: with
+// such a target, and with counted texts, which need no terminator and so no copy.
+#pragma once
+
+#include "aes_keys.h"
+#include "support/owners.h"
+#include "support/utils_base64.h"
+
+namespace ldappw {
+
+// The length of a text that may be null.
+inline size_t lengthOf(const char* text) noexcept {
+  return text == nullptr ? 0 : std::strlen(text);
+}
+
+// A new text in a caller's slot, or characters without a terminator behind a tag that is written already.
+struct TextTarget {
+  char** slot;
+  char* payload;
+  size_t length = 0;  // of the characters behind the tag
+
+  bool isNull() const noexcept { return slot == nullptr && payload == nullptr; }
+};
+
+inline TextTarget toSlot(char** slot) noexcept {
+  return {slot, nullptr};
+}
+inline TextTarget behindTag(char* payload) noexcept {
+  return {nullptr, payload};
+}
+
+// Writes bytes as base64. False when there is no memory for the text, or the alphabet is not whole.
+inline bool writeBase64(TextTarget& target, const unsigned char* data, size_t bytes) noexcept {
+  if (target.slot != nullptr) {
+    char* text = binaryBlobToBase64(data, static_cast<int>(bytes));
+    if (text != nullptr) *target.slot = text;
+    return text != nullptr;
+  }
+  if (!isWholeAlphabet(pBase64)) return false;
+  encodeBytes(data, bytes, pBase64, target.payload);
+  target.length = encodedLength(bytes);
+  return true;
+}
+
+// saltedHashEncrypt, saltedHashVerify, unsaltedHashEncrypt and aesEncryptBuffer. Counted texts hold no NUL.
+int saltedHashTo(TextTarget& target, const char* clear, size_t clearBytes, const char* digestName) noexcept;
+int saltedHashCheck(const char* clear, size_t clearBytes, const char* stored, size_t storedBytes,
+                    const char* digestName) noexcept;
+int unsaltedHashTo(TextTarget& target, const char* digestName, const char* clear, size_t clearBytes) noexcept;
+int aesEncryptTo(TextTarget& target, const char* clear, const char* cipherName, const SecBuffer* key,
+                 const SecBuffer* iv, int clearLength) noexcept;
+
+}  // namespace ldappw
