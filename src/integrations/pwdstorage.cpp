@@ -7,6 +7,7 @@
 #include <cstring>
 #include <string_view>
 
+#include "encoding_utils.h"
 #include "key_file.h"
 #include "passwords.h"
 
@@ -25,7 +26,7 @@ constexpr int kError = -1;
 // What the server takes as texts that it could write to.
 char subsystem[] = "ldappw-pwdstorage";
 char vendor[] = "ldappw";
-char version[] = LDAPPW_VERSION;
+char version[] = LDAPPW_VERSION_TEXT;
 char purpose[] = "Password storage schemes of ldappw";
 char apiVersion[] = SLAPI_PLUGIN_VERSION_01;
 char schemeNames[][7] = {"qVEIL", "AES128", "AES192", "AES256", "VLDL"};  // the tags without their braces

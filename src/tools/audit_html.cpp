@@ -243,7 +243,7 @@ std::string pageOf(const AuditReport& report) {
   std::string page = startOf(report, judged).text;
   page += barOf("bar", facts.strengths, judged).text + legendOf(facts.strengths, judged).text + tiles.text;
   page += schemesOf(report, judged).text + findingsOf(report).text + subtreesOf(report).text;
-  return page + fill(kPageEnd, {{"version", {LDAPPW_VERSION}}}).text;
+  return page + fill(kPageEnd, {{"version", {LDAPPW_VERSION_TEXT}}}).text;
 }
 
 }  // namespace tool

@@ -15,6 +15,7 @@
 #include <vector>
 
 #include "descriptor.h"
+#include "encoding_utils.h"
 #include "messages.h"
 
 namespace tool {
@@ -138,7 +139,7 @@ ExitCode parseAndRun(int argc, char** argv) {
   ExitCode exitCode = kSuccess;
   CLI::App app("Password protection for an LDAP directory server: stored values, key stash files, directory exports",
                "ldappw");
-  app.set_version_flag("--version", "ldappw " LDAPPW_VERSION);
+  app.set_version_flag("--version", "ldappw " LDAPPW_VERSION_TEXT);
   app.require_subcommand(1);
   app.formatter(std::make_shared<HelpFormatter>());
   app.footer("Results go to standard output, messages to standard error. \"ldappw VERB --help\" says more.");

@@ -36,8 +36,10 @@ LDAPPW_DATA AesKeyData* g_DirKeyData;    /* of the directory stash file */
 LDAPPW_DATA char* g_CfgCryptoSync;       /* the configuration's sync text as the server handed it in */
 LDAPPW_DATA const char* g_CipherName[3]; /* provider cipher names by key index; set when a stash file is loaded */
 
-/* Loads the stash file into the global record unless that is set already. Returns 0, 1 or LDAPPW_NO_MEMORY; after a
- * failure the global is still null, so that a later call may succeed. */
+/* Loads the stash file into the global record unless that is set already; no file is looked at then. Returns 0, 1 or
+ * LDAPPW_NO_MEMORY; after a failure the global is still null, so that a later call may succeed. Check the result: with
+ * a null record format_password makes a FORMAT_QVEIL value of FORMAT_AES256 in silence, so that a server without its
+ * stash file would store what anybody can read. */
 LDAPPW_API int setCfgKeyDataGlobal(const char* keyStashFile) LDAPPW_NOEXCEPT;
 LDAPPW_API int setDirKeyDataGlobal(const char* keyStashFile) LDAPPW_NOEXCEPT;
 
@@ -48,7 +50,8 @@ LDAPPW_API AesKeyData* getDirKeyDataGlobal(void) LDAPPW_NOEXCEPT;
 /* Keeps a copy of the text unless one is kept already. Returns 0, 1 for null, or LDAPPW_NO_MEMORY. */
 LDAPPW_API int setCfgCryptoSyncGlobal(const char* cryptoSync) LDAPPW_NOEXCEPT;
 
-/* Fills g_CipherName when its first slot is null. Always 0. */
+/* Fills g_CipherName when its first slot is null. Always 0. setAESKeyData and the set...KeyDataGlobal operations do so;
+ * who has a record from elsewhere calls this before the first password operation with that record. */
 LDAPPW_API int setCipherNameGlobal(void) LDAPPW_NOEXCEPT;
 
 /* ---- Records ---- */

@@ -28,6 +28,10 @@
 #include <stddef.h>
 #include <stdint.h>
 
+/* The version that these headers belong to, as a number (10000 * major + 100 * minor + patch) and as a text. */
+#define LDAPPW_VERSION 10000
+#define LDAPPW_VERSION_TEXT "1.0.0"
+
 /* A program that refers to a variable directly gets a copy of its own, and the library would never see it change. A
  * weak reference goes through the global offset table instead, in code compiled position-independent. */
 #ifdef LDAPPW_BUILDING

@@ -69,7 +69,7 @@ LDAPPW_API int formatted_password_length(int scheme, int clearLength) LDAPPW_NOE
 /*
  * format_password writes the stored value of a clear password.
  *
- *   scheme       in   a scheme code; FORMAT_AES256 without keyData becomes FORMAT_QVEIL
+ *   scheme       in   a scheme code; FORMAT_AES256 without keyData becomes FORMAT_QVEIL in silence
  *   salt         in   FORMAT_CRYPT only: its first two characters salt the crypt (see generate_crypt_salt)
  *   keyData      in   the AES schemes: the key and salt; g_CipherName must have been set
  *   clear        in   clearLength bytes, of which nothing behind a first NUL is read by the one-way schemes and
