@@ -13,3 +13,24 @@ install(EXPORT ldappw NAMESPACE ldappw:: FILE ldappwTargets.cmake DESTINATION ${
 file(RELATIVE_PATH LDAPPW_PC_TO_PREFIX /prefix/${CMAKE_INSTALL_LIBDIR}/pkgconfig /prefix)
 configure_file(cmake/ldappw.pc.in ${CMAKE_BINARY_DIR}/ldappw.pc @ONLY)
 install(FILES ${CMAKE_BINARY_DIR}/ldappw.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT dev)
+
+# The manual of the library: a page a header, which scripts/make_manual.py makes, and a link for each operation on it.
+# Their suffix sets them apart from pages of the same names, of which systems have some. And an example to start from.
+set(manual ${PROJECT_SOURCE_DIR}/docs/man)
+set(links ${CMAKE_BINARY_DIR}/man3)
+foreach(header IN LISTS LDAPPW_PUBLIC_HEADERS)
+  cmake_path(GET header STEM page)
+  install(FILES ${manual}/${page}.3 DESTINATION ${CMAKE_INSTALL_MANDIR}/man3 RENAME ${page}.3ldappw COMPONENT dev)
+  set_property(DIRECTORY APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${manual}/${page}.3)
+  file(STRINGS ${manual}/${page}.3 names REGEX "^\\.Nm ")
+  list(TRANSFORM names REPLACE "^\\.Nm ([A-Za-z0-9_]+).*" "\\1")
+  list(REMOVE_ITEM names ${page})
+  foreach(name IN LISTS names)
+    file(CONFIGURE OUTPUT ${links}/${name}.3ldappw CONTENT ".so man3/${page}.3ldappw\n")
+    install(FILES ${links}/${name}.3ldappw DESTINATION ${CMAKE_INSTALL_MANDIR}/man3 COMPONENT dev)
+  endforeach()
+endforeach()
+install(FILES ${manual}/ldappw.7 DESTINATION ${CMAKE_INSTALL_MANDIR}/man7 COMPONENT dev)
+install(FILES ${PROJECT_SOURCE_DIR}/docs/server.md DESTINATION ${CMAKE_INSTALL_DOCDIR} COMPONENT dev)
+install(FILES ${PROJECT_SOURCE_DIR}/examples/CMakeLists.txt ${PROJECT_SOURCE_DIR}/examples/server.c
+        DESTINATION ${CMAKE_INSTALL_DATADIR}/ldappw/examples COMPONENT dev)

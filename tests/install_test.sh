@@ -23,6 +23,15 @@ cc $CFLAGS -D_GNU_SOURCE -fPIE -pie "$here/consumer.c" -o "$work/outside" $(pkg-
   -Wl,-rpath,"$libdir"
 "$work/outside"
 
+# The examples as they were installed, and the links of the manual.
+cmake -G Ninja -S "$work/moved/share/ldappw/examples" -B "$work/examples" -DCMAKE_PREFIX_PATH="$work/moved" \
+  >> "$work/log"
+cmake --build "$work/examples" >> "$work/log"
+"$here/example_test.sh" "$work/examples/server"
+cd "$work/moved/share/man"
+ls man3/{format_password,initQelCrypto,setAESKeyData,des}.3ldappw man7/ldappw.7 >> "$work/log"
+sed -n 's/^\.so //p' man3/* | xargs -d '\n' ls >> "$work/log"
+
 for file in bash-completion/completions/ldappw zsh/vendor-completions/_ldappw fish/vendor_completions.d/ldappw.fish \
   doc/ldappw/{values,interoperability,moving}.md; do
   [ -s "$work/moved/share/$file" ] || { echo "install_test: $file is missing" >&2; exit 1; }
