@@ -9,11 +9,10 @@
 #include <algorithm>
 #include <vector>
 
+#include "command_line.h"
 #include "fuzz_input.h"
 
 using namespace fuzz;
-
-int commandMain(int argc, char** argv);  // its main, renamed by the build
 
 namespace {
 
@@ -44,7 +43,7 @@ int run(std::vector<std::string> arguments, bool mayBeDamaged) {
   std::vector<char*> pointers;
   for (std::string& argument : arguments) pointers.push_back(argument.data());
   pointers.push_back(nullptr);
-  const int code = commandMain(static_cast<int>(arguments.size()), pointers.data());
+  const int code = tool::runCommand(static_cast<int>(arguments.size()), pointers.data());
   require(code == 0 || code == 3 || code == 4 || (code == 5 && mayBeDamaged));
   return code;
 }

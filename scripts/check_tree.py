@@ -36,8 +36,16 @@ LAYERS = {
         ("provider",),
         ("support",),
     ),
+    "src/tools": (
+        (".",),
+        ("verbs",),
+        ("audit",),
+        ("ldif", "keys"),
+        ("schemes",),
+        ("base",),
+    ),
 }
-OBJECTS = {"src/libraries/libcrypto": "ldappw_objects"}
+OBJECTS = {"src/libraries/libcrypto": "ldappw_objects", "src/tools": "ldappw_command"}
 
 
 def files(*patterns):

@@ -1,0 +1,71 @@
+// SPDX-License-Identifier: Apache-2.0
+// Judges the entries of a batch: schemes, and what is wrong with passwords and their values.
+#pragma once
+
+#include <bitset>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "audit/facts.h"
+#include "audit/marks.h"
+#include "ldif/record.h"
+#include "schemes/key_record.h"
+
+namespace tool {
+
+// What an audit is to look for. Used by many threads at once.
+struct AuditRules {
+  KeyRecord keys;
+  bool allowBinary = false;
+  MarkKey markKey;
+  std::vector<Mark> knownBad;  // sorted
+  std::vector<Secret> tried;   // the same passwords, where they are to be tried on one-way values
+  bool checkHashes = false;    // tries these, and uid and cn, on one-way values
+  std::vector<bool> accepted;  // schemes, as in Facts; none: all
+  size_t subtreeDepth = 3;     // RDNs
+  size_t listed = 20;          // DNs a finding
+
+  // The passwords of a file, one a line.
+  void loadKnownBad(const std::string& path);
+};
+
+// The attributes, besides passwords, that the collector has to see.
+std::vector<std::string> auditedNames();
+
+class Collector {
+ public:
+  explicit Collector(const AuditRules& rules) : rules_(rules), facts_(std::make_unique<Facts>()) {}
+
+  std::unique_ptr<Facts> collect(RecordWalker& walker);
+
+ private:
+  struct Entry {
+    std::string dn;
+    std::vector<Secret> names;      // uid and cn
+    std::vector<Secret> passwords;  // stored values that can be logged in with
+    std::vector<Secret> history;    // earlier ones
+    bool account = false;
+    bool hasPassword = false;  // some are not at hand: behind a URL, or on a line that is not well formed
+    std::bitset<kFindingCount> findings;
+  };
+
+  void takeLine(const RecordWalker& walker);
+  void takePassword(const PasswordLine& line, std::string_view type);
+  void finishEntry();
+  void judge(const Secret& value, bool current, Subtree& subtree);
+  void judgeValue(const StoredValue& value);
+  void judgePassword(std::string_view password);
+  void tryNames(const StoredValue& value);
+  void found(Finding finding) { entry_.findings.set(static_cast<size_t>(finding)); }
+  void sight(const Mark& mark);
+
+  const AuditRules& rules_;
+  std::unique_ptr<Facts> facts_;
+  Sha256 sha256_;
+  Entry entry_;
+  bool inEntry_ = false;
+  bool holds_ = false;  // the entry is the last one of the holders
+};
+
+}  // namespace tool

@@ -1,0 +1,371 @@
+// SPDX-License-Identifier: Apache-2.0
+// The conversion. A value that cannot be carried over unharmed stays what it was and is reported: the export is often
+// the only copy of the passwords in it.
+#include "ldif/passes.h"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <functional>
+#include <optional>
+#include <unordered_map>
+#include <utility>
+
+#include "base/messages.h"
+#include "base/output_file.h"
+#include "base/random.h"
+#include "base/signals.h"
+#include "base/text.h"
+#include "ldif/change_records.h"
+#include "ldif/condition.h"
+#include "ldif/key_ring.h"
+#include "password_schemes.h"
+#include "schemes/schemes.h"
+#include "schemes/values.h"
+
+namespace tool {
+namespace {
+
+// Totals. What becomes of a value is one of those from kMade on.
+enum Total : size_t {
+  kValues,
+  kMade,
+  kCut,
+  kResumed,
+  kDone,
+  kAsTheyAre,
+  kOneWay,
+  kUrls,
+  kDeleted,
+  kAuthPasswords,
+  kFixed,
+  kDropped,
+  kLocked,
+  kWrapped,
+  kUnknownTags,
+  kMalformed,
+  kFailed
+};
+
+constexpr CountName kNames[] = {
+    {"values", "password values"},
+    {"made", "converted"},
+    {"cut", "of these cut by the scheme"},
+    {"resumed", "of these taken from the earlier run"},
+    {"done", "done already, kept"},
+    {"asTheyAre", "clear already, kept"},
+    {"oneWay", "one-way, kept"},
+    {"urls", "behind a URL, kept"},
+    {"deleted", "to be deleted, kept"},
+    {"authPasswords", "of authPassword, kept"},
+    {"fixed", "unwrapped and one-way"},
+    {"dropped", "equal to another value of the entry, dropped"},
+    {"locked", "locked, kept"},
+    {"wrapped", "padded or encoded, kept"},
+    {"unknownTags", "with an unknown tag, kept"},
+    {"malformed", "malformed, kept"},
+    {"failed", "failed, kept"},
+};
+
+constexpr mode_t kNewFileMode = 0600;
+
+// Columns by scheme: what becomes of its values.
+enum Column : size_t { kNow, kLater };
+
+struct Conversion {
+  const Scheme& target;
+  const LdifOptions& options;
+  KeyRecord newKeys;
+  KeyRing keys;  // the new ones first
+  EarlierChanges earlier;
+};
+
+// What became of one value, and the problem if there is one.
+struct Outcome {
+  Total total;
+  Status status;
+};
+
+// The new value takes the place of the only copy, so the server's own check has to accept it first, where it knows the
+// scheme. A dry run spares the work that is long on purpose; such values have a salt, for which some random bytes stand.
+Status makeTarget(const Secret& clear, const Conversion& conversion, Secret& made) {
+  const Scheme& target = conversion.target;
+  if (target.reversible() && target.cuts(clear.size())) {
+    return {kBadValue, "the password has more bytes than the scheme holds"};
+  }
+  if (conversion.options.dryRun && isCostly(target)) {
+    constexpr size_t kStandInBytes = 16;
+    made.resize(kStandInBytes);
+    drawRandom(made.data(), made.size());
+    return passwordProblem(target, clear.view());
+  }
+  const Status status = makeValue(target, conversion.newKeys, clear, made, conversion.options.costs);
+  if (!status.ok() || target.code == FORMAT_NONE || serverAccepts(made, conversion.newKeys, clear)) return status;
+  return {kBadValue, "the new value does not verify"};
+}
+
+// Of a scheme that the server's check does not know one value is checked before all others are made: twice the work for
+// each would be too much.
+void proveTarget(const Conversion& conversion) {
+  const Scheme& target = conversion.target;
+  if (target.code != FORMAT_NONE || target.isClear() || conversion.options.dryRun) return;
+  const KeyRecord none;
+  Secret made;
+  const Status status = makeTarget(Secret("probe"), conversion, made);
+  if (!status.ok()) throw Failure(status.code, status.text);
+  if (!checkValue(StoredValue(made), none, Secret("probe")).ok() ||
+      checkValue(StoredValue(made), none, Secret("Probe")).code != kNoMatch) {
+    throw Failure(kInternal, std::string("values of ") + target.name + " do not verify");
+  }
+}
+
+Outcome convertValue(const Secret& whole, const Conversion& conversion, Secret& made) {
+  const StoredValue value(whole);
+  const Scheme& source = value.scheme();
+  const ConditionText& condition = textOf(conditionOf(value, value.problem()));
+  const Wrapping wrapping = wrappingOf(value);
+  if (source.kind == Kind::kUnknown) return {kUnknownTags, {kBadValue, "unknown tag; the value is kept"}};
+  if (wrapping != Wrapping::kNone) {
+    return {wrapping == Wrapping::kLocked ? kLocked : kWrapped, {condition.code, condition.text}};
+  }
+  if (source.kind == Kind::kOneWay) {
+    if (&source == &conversion.target && condition.code == kSuccess) return {kDone, {}};
+    return {condition.code == kSuccess ? kOneWay : kMalformed, {condition.code, condition.text}};
+  }
+  if (source.isClear() && conversion.target.isClear()) return {kAsTheyAre, {}};
+  Secret clear;
+  size_t used = KeyRing::kNoKey;
+  // The new keys are for values that this run or an earlier one has made: those of another scheme are none of them.
+  const size_t first = conversion.newKeys && &source != &conversion.target ? 1 : 0;
+  Status status = conversion.keys.open(value, first, conversion.options.allowBinary, clear, used);
+  const bool underNew = !source.needsKey() || (conversion.newKeys && used == 0);
+  if (status.ok() && &source == &conversion.target && underNew && !value.tag().empty()) return {kDone, {}};
+  if (status.ok()) status = makeTarget(clear, conversion, made);
+  if (!status.ok()) return {kFailed, status};
+  return {conversion.target.cuts(clear.size()) ? kCut : kMade, {}};
+}
+
+// What is within a padded or encoded value takes its place, converted where it can be.
+Outcome fixValue(const Secret& whole, const Conversion& conversion, Secret& made) {
+  const Wrapping wrapping = wrappingOf(StoredValue(whole));
+  if (!conversion.options.fix || wrapping == Wrapping::kNone || wrapping == Wrapping::kLocked) {
+    return convertValue(whole, conversion, made);
+  }
+  Secret inner = unwrapped(whole, wrapping);
+  const Outcome outcome = convertValue(inner, conversion, made);
+  if (outcome.total != kOneWay && outcome.total != kAsTheyAre && outcome.total != kDone) return outcome;
+  made = std::move(inner);
+  return {kFixed, {}};
+}
+
+Outcome outcomeOf(const RecordWalker& walker, const Conversion& conversion, Secret& made) {
+  constexpr Total kKept[] = {kMade, kUrls, kDeleted, kAuthPasswords};
+  const PasswordLine& password = walker.password();
+  if (password.form == ValueForm::kBroken) return {kFailed, {kBadValue, password.problem}};
+  if (password.form != ValueForm::kBytes) return {kKept[static_cast<size_t>(password.form)], {}};
+  if (conversion.options.changes && (walker.inChange() || walker.dn().empty() || walker.dn().front() == ':')) {
+    return {kFailed, {kBadValue, "no change can be written for a change record, or without a well-formed dn"}};
+  }
+  if (const Secret* earlier = conversion.earlier.find(walker, password.whole(password.value))) {
+    made = Secret(earlier->view().substr(password.history.size()));
+    if (!password.history.empty()) made = Secret(made.view().substr(made.view().find('#') + 1));
+    const StoredValue value(made);
+    if (&value.scheme() == &conversion.target && value.problem() == nullptr) return {kResumed, {}};
+  }
+  return fixValue(password.value, conversion, made);
+}
+
+// The values that the lines of one entry have come to. Servers refuse an entry with two equal ones.
+class EntryValues {
+ public:
+  // True when an equal value stands in the entry already and one of the two is new.
+  bool repeats(const RecordWalker& walker, const Secret& value, bool changed) {
+    if (group_ != walker.group()) values_.clear();
+    group_ = walker.group();
+    const std::string& name = walker.password().description;
+    const size_t hash = std::hash<std::string_view>()(value.view());
+    const auto equal = values_.equal_range(hash);
+    const bool found = std::any_of(equal.first, equal.second, [&](const auto& row) {
+      const Value& other = row.second;
+      return (changed || other.changed) && sameName(other.name, name) && other.value.view() == value.view();
+    });
+    if (!found) values_.emplace(hash, Value{name, Secret(value.view()), changed});
+    return found;
+  }
+
+ private:
+  struct Value {
+    std::string name;
+    Secret value;
+    bool changed;
+  };
+  std::unordered_multimap<size_t, Value> values_;
+  std::uint64_t group_ = 0;
+};
+
+constexpr bool isChanged(Total total) {
+  return total == kMade || total == kCut || total == kResumed || total == kFixed;
+}
+
+// What the scheme's values come to, for the plan. A one-way value that is weaker than the new ones has to wait until its
+// owner presents the password.
+void countForPlan(const PasswordLine& password, Total total, const Conversion& conversion, Tally& tally) {
+  if (password.form != ValueForm::kBytes) return;
+  const Scheme& source = StoredValue(password.value).scheme();
+  if (source.kind == Kind::kUnknown) return;
+  const bool later = total == kOneWay && source.strength < conversion.target.strength;
+  if (isChanged(total)) ++tally.of(source)[kNow];
+  if (later && conversion.target.kind == Kind::kOneWay) ++tally.of(source)[kLater];
+}
+
+// One after the other the lines of a batch.
+class Converter {
+ public:
+  Converter(const Conversion& conversion, Part& part) : conversion_(conversion), part_(part) {}
+
+  void all(RecordWalker& walker) {
+    while (walker.next()) walker.atPassword() ? convert(walker) : keep(walker);
+    changes_.flush(part_.out);
+  }
+
+ private:
+  bool writesExport() const noexcept { return !conversion_.options.changes && !conversion_.options.dryRun; }
+  void keep(const RecordWalker& walker) {
+    if (writesExport()) part_.out.append(walker.line().raw);
+  }
+
+  void convert(const RecordWalker& walker) {
+    Secret made;
+    const PasswordLine& password = walker.password();
+    const Outcome outcome = outcomeOf(walker, conversion_, made);
+    const bool changed = isChanged(outcome.total);
+    auto& totals = part_.tally.totals;
+    ++totals[kValues];
+    if (!outcome.status.ok()) part_.report(walker.lineNumber(), walker.dn(), outcome.status.code, outcome.status.text);
+    const Secret whole = password.whole(changed ? made : password.value);
+    const bool repeated = password.form == ValueForm::kBytes && values_.repeats(walker, whole, changed);
+    ++totals[repeated ? kDropped : outcome.total];
+    if (!repeated && (outcome.total == kCut || outcome.total == kResumed)) ++totals[kMade];
+    countForPlan(password, outcome.total, conversion_, part_.tally);
+    write(walker, whole, changed, repeated);
+  }
+
+  void write(const RecordWalker& walker, const Secret& whole, bool changed, bool repeated) {
+    const PasswordLine& password = walker.password();
+    if (conversion_.options.dryRun) return;
+    if (!conversion_.options.changes) {
+      if (repeated) return;
+      return changed ? writeChanged(walker.line(), password.description, whole, part_.out) : keep(walker);
+    }
+    if (!changed && !repeated) return;
+    const Secret old = password.whole(password.value);
+    repeated ? changes_.drop(walker, old, whole, changed, part_.out) : changes_.replace(walker, old, whole, part_.out);
+  }
+
+  const Conversion& conversion_;
+  Part& part_;
+  EntryValues values_;
+  ChangeWriter changes_;
+};
+
+const Scheme& targetOf(const LdifOptions& options) {
+  const Scheme* scheme = findScheme(options.to);
+  if (scheme == nullptr || scheme->make == nullptr) {
+    throw Failure(kUsage, options.to + " is not a scheme that values can be made under");
+  }
+  if (scheme->isClear() && !options.allowClear) {
+    throw Failure(kUsage, "passwords are written in the clear only with --allow-clear");
+  }
+  if (scheme->needsKey() && options.newKeys.empty()) throw Failure(kUsage, options.to + " needs --new-keys");
+  return *scheme;
+}
+
+// The number of a column by scheme, "clear 3, aes256 2".
+std::string listed(const Tally& tally, Column column) {
+  std::string list;
+  forEachScheme(tally, column, [&](const Scheme& scheme, std::uint64_t count) {
+    list += (list.empty() ? "" : ", ") + std::string(scheme.name) + " " + std::to_string(count);
+  });
+  return list;
+}
+
+void addListed(Json& json, const char* name, const Tally& tally, Column column) {
+  json.open(name);
+  forEachScheme(tally, column, [&](const Scheme& scheme, std::uint64_t count) { json.number(scheme.name, count); });
+  json.close();
+}
+
+void showSummary(const Tally& tally, const Conversion& conversion) {
+  const Scheme& target = conversion.target;
+  if (tally.totals[kCut] > 0) {
+    warning(std::to_string(tally.totals[kCut]) + " passwords are longer than the " + std::to_string(target.cutBytes) +
+            " bytes that " + target.name + " uses: only their beginnings will be checked");
+  }
+  if (conversion.options.json) {
+    Results results;
+    Json object;
+    object.number("entries", tally.entries);
+    addCounts(object, kNames, tally.totals.data());
+    addListed(object, "now", tally, kNow);
+    addListed(object, "atNextLogin", tally, kLater);
+    results.line(object.end());
+    return results.flush();
+  }
+  message("entries: " + std::to_string(tally.entries));
+  for (size_t total = kValues; total <= kFailed; ++total) {
+    const std::uint64_t count = tally.totals[total];
+    if (total <= kMade || count > 0) message(std::string(kNames[total].text) + ": " + std::to_string(count));
+  }
+  const std::string now = listed(tally, kNow);
+  const std::string later = listed(tally, kLater);
+  if (!now.empty()) message((conversion.options.dryRun ? "would now be " : "now ") + (target.name + (": " + now)));
+  if (!later.empty()) message(std::string(target.name) + " only at the next login: " + later);
+}
+
+Conversion conversionOf(const LdifOptions& options) {
+  const Scheme& target = targetOf(options);
+  completeCosts(target, options.costs);  // refuses what the scheme does not have
+  requireProvider();
+  std::vector<std::string> paths = options.keys;
+  paths.insert(paths.begin(), options.newKeys);
+  return {target, options, KeyRecord::load(options.newKeys), KeyRing(paths), {}};
+}
+
+void requireOtherKeys(const Conversion& conversion) {
+  const std::vector<KeyRecord>& keys = conversion.keys.keys();
+  for (size_t i = 1; conversion.newKeys && i < keys.size(); ++i) {
+    if (sameRecord(keys[i], conversion.newKeys)) throw Failure(kUsage, "--keys and --new-keys hold the same keys");
+  }
+}
+
+}  // namespace
+
+ExitCode convertExport(const LdifOptions& options) {
+  Conversion conversion = conversionOf(options);
+  requireOtherKeys(conversion);
+  proveTarget(conversion);
+  Input input = openExport(options.source);
+  if (!options.resume.empty()) conversion.earlier.load(options.resume, AttributeSet(options.source.attributes));
+  std::optional<OutputFile> file;
+  if (options.out != "-" && !options.dryRun) {
+    file.emplace(options.out, kNewFileMode, options.force);
+    file->keepAccess();
+  }
+  std::optional<GracefulStop> stop;  // what has been written of changes is whole, what of an export is not
+  if (options.changes) stop.emplace();
+  const auto deliver = [&](const Part& part) {
+    file ? file->write(part.out.view()) : writeAll(STDOUT_FILENO, part.out.view(), "standard output");
+  };
+  ExportOptions source = options.source;
+  source.resultsOnStdout = !file;
+  source.costly = isCostly(conversion.target);
+  const Part sum = runExport(
+      input, source, [&](RecordWalker& walker, Part& part) { Converter(conversion, part).all(walker); }, deliver);
+  if (file) file->commit();
+  if (!options.quiet) showSummary(sum.tally, conversion);
+  if (stop && stopIsAsked()) message("stopped before the end of the export; --resume goes on with what was written");
+  if (stop) stop->finish();
+  return sum.exitCode;
+}
+
+}  // namespace tool

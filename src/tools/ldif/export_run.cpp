@@ -1,0 +1,226 @@
+// SPDX-License-Identifier: Apache-2.0
+// The threads of a pass. A thread reads its next batch itself and waits until its part is due, so there are never more
+// batches in memory than threads.
+#include "ldif/export_run.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
+#include <condition_variable>
+#include <exception>
+#include <mutex>
+#include <system_error>
+#include <thread>
+
+#include "base/messages.h"
+#include "base/signals.h"
+#include "ldif/library.h"
+
+namespace tool {
+namespace {
+
+constexpr std::chrono::milliseconds kStep{200};
+constexpr std::chrono::milliseconds kLogStep{5000};  // where lines stay
+constexpr size_t kCostlyBatchBytes = size_t{4} << 10;
+constexpr char kClearLine[] = "\r\033[K";
+
+std::string whole(double number) {
+  return std::to_string(static_cast<std::uint64_t>(number));
+}
+
+// A line on standard error with entries, rate and time left, when that is a terminal; lines from time to time when they
+// are asked for and it is none. Used by one thread at a time.
+class Progress {
+ public:
+  // inputFd says how much there is to come, when it is a file. Results that go to a terminal are not disturbed.
+  Progress(int inputFd, bool resultsOnStdout, bool asked);
+  ~Progress() { hide(); }
+  Progress(const Progress&) = delete;
+  Progress& operator=(const Progress&) = delete;
+
+  // Counts entries; bytes is how far the input has been read.
+  void advance(std::uint64_t entries, std::uint64_t bytes);
+  // Takes the line away, so that a message can be written.
+  void hide() noexcept;
+
+ private:
+  using Clock = std::chrono::steady_clock;
+
+  bool shown_;
+  bool logged_;
+  bool visible_ = false;
+  std::uint64_t total_ = 0;
+  std::uint64_t entries_ = 0;
+  std::uint64_t bytes_ = 0;
+  Clock::time_point start_ = Clock::now();
+  Clock::time_point next_ = start_;
+};
+
+Progress::Progress(int inputFd, bool resultsOnStdout, bool asked)
+    : shown_(isatty(STDERR_FILENO) == 1 && !(resultsOnStdout && isatty(STDOUT_FILENO) == 1)),
+      logged_(asked && !shown_) {
+  struct stat status {};
+  if (fstat(inputFd, &status) == 0 && S_ISREG(status.st_mode)) total_ = static_cast<std::uint64_t>(status.st_size);
+}
+
+void Progress::advance(std::uint64_t entries, std::uint64_t bytes) {
+  entries_ += entries;
+  bytes_ = bytes;
+  const Clock::time_point now = Clock::now();
+  if ((!shown_ && !logged_) || now < next_) return;
+  next_ = now + (logged_ ? kLogStep : kStep);
+  const double seconds = std::chrono::duration<double>(now - start_).count();
+  const double rate = seconds > 0 ? static_cast<double>(entries_) / seconds : 0;
+  std::string line = std::to_string(entries_) + " entries, " + whole(rate) + " a second";
+  if (total_ > bytes_ && bytes_ > 0) {
+    line += ", " + whole(seconds * static_cast<double>(total_ - bytes_) / static_cast<double>(bytes_)) + " s left";
+  }
+  if (logged_) return message(line);
+  tryWrite(STDERR_FILENO, kClearLine + line);
+  visible_ = true;
+}
+
+void Progress::hide() noexcept {
+  if (visible_) tryWrite(STDERR_FILENO, kClearLine);
+  visible_ = false;
+}
+
+class Run {
+ public:
+  Run(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
+      const std::function<void(const Part&)>& deliver)
+      : input_(input),
+        reader_(input, options.costly ? kCostlyBatchBytes : RecordReader::kBatchBytes),
+        attributes_(options.attributes, options.others),
+        progress_(input.fd(), options.resultsOnStdout, options.progress),
+        work_(work),
+        deliver_(deliver) {}
+
+  Part all(unsigned threads) {
+    std::vector<std::thread> helpers;
+    helpers.reserve(threads);
+    try {
+      for (unsigned i = 1; i < threads; ++i) helpers.emplace_back([this] { loop(); });
+    } catch (const std::system_error&) {
+      // Fewer threads do the same work.
+    }
+    loop();
+    for (std::thread& helper : helpers) helper.join();
+    progress_.hide();
+    messages_.finish();
+    if (failure_) std::rethrow_exception(failure_);
+    reportWhole();
+    return std::move(sum_);
+  }
+
+ private:
+  void loop() noexcept {
+    try {
+      Batch batch;
+      Part part;
+      while (take(batch)) {
+        RecordWalker walker(batch, attributes_);
+        work_(walker, part);
+        part.tally.entries = walker.entries();
+        part.tally.outside = walker.outside().size();
+        for (const std::uint64_t line : walker.outside()) part.report(line, "", kBadValue, kOutsideText);
+        if (!hand(batch, part, walker.seen())) return;
+        part.out.clear();
+        part = {std::move(part.out), {}, {}, kSuccess, nullptr};
+      }
+    } catch (...) {
+      stop(std::current_exception());
+    }
+  }
+
+  bool take(Batch& batch) {
+    const std::lock_guard<std::mutex> lock(reading_);
+    if (stopped() || stopIsAsked() || !reader_.next(batch)) return false;
+    batch.inputBytes = input_.bytesRead();
+    return true;
+  }
+
+  bool hand(const Batch& batch, const Part& part, std::uint64_t seen) {
+    std::unique_lock<std::mutex> lock(output_);
+    turn_.wait(lock, [&] { return failure_ || due_ == batch.number; });
+    if (failure_) return false;
+    deliver_(part);
+    if (!part.messages.empty()) progress_.hide();
+    for (const Part::Message& one : part.messages) messages_.add(one.text, one.kind);
+    if (batch.number == 0 && batch.text.view().substr(0, kByteOrderMark.size()) == kByteOrderMark) {
+      warning(input_.name() + " begins with a byte order mark, which LDIF does not have");
+    }
+    seen_ |= seen;
+    cutOff_ = batch.text.view().back() != '\n';
+    keepFirst(sum_.exitCode, part.exitCode);
+    sum_.tally.add(part.tally);
+    progress_.advance(part.tally.entries, batch.inputBytes);
+    ++due_;
+    turn_.notify_all();
+    return true;
+  }
+
+  void reportWhole() const {
+    if (stopIsAsked()) return;
+    if (sum_.tally.entries == 0) {
+      throw Failure(kBadValue, input_.name() + " has no entry, no line that begins with \"dn:\"; it seems to be " +
+                                   input_.seems());
+    }
+    if (cutOff_) warning(input_.name() + ": the last line does not end in a newline; the export may be cut off");
+    for (size_t i = 0; i < attributes_.given(); ++i) {
+      if ((seen_ >> i & 1U) == 0) warning("no entry has an attribute " + attributes_.name(i));
+    }
+  }
+
+  bool stopped() {
+    const std::lock_guard<std::mutex> lock(output_);
+    return static_cast<bool>(failure_);
+  }
+
+  void stop(std::exception_ptr failure) {
+    const std::lock_guard<std::mutex> lock(output_);
+    if (!failure_) failure_ = std::move(failure);
+    turn_.notify_all();
+  }
+
+  Input& input_;
+  RecordReader reader_;
+  const AttributeSet attributes_;
+  Progress progress_;
+  const std::function<void(RecordWalker&, Part&)>& work_;
+  const std::function<void(const Part&)>& deliver_;
+  std::mutex reading_;
+  std::mutex output_;
+  std::condition_variable turn_;
+  std::uint64_t due_ = 0;
+  std::exception_ptr failure_;
+  Repeated messages_{kMostOfAKind, message};
+  std::uint64_t seen_ = 0;
+  bool cutOff_ = false;
+  Part sum_;
+};
+
+}  // namespace
+
+void Part::report(std::uint64_t line, const std::string& dn, ExitCode code, const std::string& text) {
+  messages.push_back({"line " + std::to_string(line) + ": " + (dn.empty() ? "(no dn)" : dn) + ": " + text, text});
+  keepFirst(exitCode, code);
+}
+
+Input openExport(const ExportOptions& options) {
+  ldifLibrary();
+  const AttributeSet checked(options.attributes);
+  Input input = Input(options.in);
+  input.requireText();
+  return input;
+}
+
+Part runExport(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
+               const std::function<void(const Part& part)>& deliver) {
+  const unsigned threads = options.threads > 0 ? options.threads : std::max(1U, std::thread::hardware_concurrency());
+  return Run(input, options, work, deliver).all(threads);
+}
+
+}  // namespace tool

@@ -1,0 +1,72 @@
+// SPDX-License-Identifier: Apache-2.0
+// ldappw ldif: the command line of the conversion and the audit of a directory export.
+#include "ldif/passes.h"
+
+#include "verbs/options.h"
+
+namespace tool {
+namespace {
+
+constexpr char kFooter[] =
+    R"(Conversion (--to) covers every clear or reversible value and leaves all other bytes of the export as they are. A
+changed line keeps the spelling of its attribute, its options and its line ends; it is written as text or as base64,
+as the value needs, and folded at 76 columns only if the line was folded before. One-way values and values behind a
+URL are kept and counted; of two values of an entry that become equal the second is dropped and counted. In change
+records the values of add and replace blocks are treated like those of entries; the values of delete blocks are kept,
+because they name what is stored.
+What cannot be carried over unharmed is kept as it was and listed by DN on standard error, and the exit code is not 0:
+3 for an unknown tag, a malformed, locked, padded or doubly encoded value or a password that the scheme cannot hold,
+4 for a value that the old keys do not open; 5 when a file cannot be read or written, and then --out has not changed.
+An audit (--audit) exits with 0 when it has no finding, else with the code of the first one. With --json it writes one
+object; with --verbose a line (with --json an object) for each value comes before it.)";
+
+ExitCode run(const LdifOptions& options) {
+  if (options.audit == !options.to.empty()) throw Failure(kUsage, "give either --to or --audit");
+  if (options.audit && (!options.newKeys.empty() || options.changes || options.dryRun || !options.resume.empty() ||
+                        options.fix || options.out != "-")) {
+    throw Failure(kUsage, "--new-keys, --fix, --changes, --dry-run, --resume and --out go with --to");
+  }
+  if (!options.audit && options.json && options.out == "-" && !options.dryRun) {
+    throw Failure(kUsage, "--json needs --out: the export goes to standard output");
+  }
+  return options.audit ? auditExport(options) : convertExport(options);
+}
+
+}  // namespace
+
+void setUpLdif(CLI::App& verb, ExitCode& exitCode) {
+  const auto options = std::make_shared<LdifOptions>();
+  verb.add_option("--to", options->to, "scheme to convert the values to");
+  verb.add_flag("--audit", options->audit, "count schemes and findings instead");
+  addKeys(verb, "--keys", options->keys, "key stash file that opens the AES values of the export; may be repeated");
+  addPath(verb, "--new-keys", options->newKeys, "key stash file for the new values");
+  verb.add_option("--attribute", options->source.attributes,
+                  "attribute that holds passwords, as often as there are such; without it userPassword, pwdHistory, "
+                  "olcRootPW, nsslapd-rootpw and authPassword")
+      ->expected(1)
+      ->allow_extra_args(false)
+      ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll)
+      ->type_name("NAME");
+  CLI::Option* in = addPath(verb, "--in", options->source.in, "export to read, \"-\" (default) for standard input");
+  addPath(verb, "FILE", options->source.in, "export to read, in place of --in")->excludes(in);
+  addPath(verb, "--out", options->out, "file to write (default: standard output); may be the one that is read");
+  verb.add_flag("--force", options->force, "replace the file of --out");
+  verb.add_flag("--changes", options->changes, "write change records for ldapmodify in place of the export");
+  verb.add_flag("--dry-run", options->dryRun, "write nothing but the summary");
+  addPath(verb, "--resume", options->resume, "change records of a stopped run; what they hold is not made again");
+  verb.add_flag("--progress", options->source.progress, "show progress where standard error is no terminal too");
+  addCosts(verb, options->costs);
+  verb.add_flag("--fix", options->fix, "unwrap values with blanks around them or encoded in base64 once more");
+  verb.add_flag("--allow-clear", options->allowClear, "allow --to clear");
+  verb.add_flag("--allow-binary", options->allowBinary,
+                "accept values that open into bytes that are not text; a wrong key gives such bytes now and then");
+  verb.add_option("--threads", options->source.threads, "threads to work with (default: one a processor)")
+      ->check(CLI::Range(1U, 256U));
+  verb.add_flag("--verbose", options->verbose, "in an audit, report every value");
+  CLI::Option* json = verb.add_flag("--json", options->json, "counts as JSON, on standard output");
+  verb.add_flag("--quiet", options->quiet, "no counts after a conversion")->excludes(json);
+  verb.footer(kFooter);
+  verb.callback([options, &exitCode] { exitCode = run(*options); });
+}
+
+}  // namespace tool

@@ -1,0 +1,186 @@
+// SPDX-License-Identifier: Apache-2.0
+// Pairs of a value and a password are checked one after the other. Pairs of a DN and a password wait for the entry to
+// come by in the export, on whatever thread it does.
+#include "verbs/verify_batch.h"
+
+#include <mutex>
+#include <unordered_map>
+#include <vector>
+
+#include "base/input.h"
+#include "base/results.h"
+#include "schemes/values.h"
+#ifdef LDAPPW_WITH_LDIF
+#include "ldif/export_run.h"
+#include "schemes/schemes.h"
+#endif
+
+namespace tool {
+namespace {
+
+constexpr Status kNoTab{kBadValue, "there is no tab in the record"};
+constexpr Status kUntaggedValue{kBadValue, "the value has no tag (--clear takes it as a clear password)"};
+
+Status check(const Secret& whole, const KeyRecord& key, const Secret& password, bool clear) {
+  const StoredValue value(whole);
+  return value.scheme().isClear() && !clear ? kUntaggedValue : checkValue(value, key, password);
+}
+
+class Answers {
+ public:
+  explicit Answers(const BatchOptions& options) : options_(options), results_(options.null ? '\0' : '\n') {}
+
+  void add(const Status& status, bool mayWait) {
+    ++index_;
+    keepFirst(exitCode_, status.code);
+    const bool answered = status.code <= kNoMatch;
+    if (options_.quiet) return;
+    if (!options_.json) {
+      results_.line(status.ok() ? "match" : answered ? "no match" : status.text);
+    } else if (answered) {
+      results_.line(Json().number("index", index_).flag("match", status.ok()).end());
+    } else {
+      showProblem(status);
+    }
+    if (mayWait) results_.flush();
+  }
+
+  ExitCode finish() {
+    if (index_ == 0) throw Failure(kUsage, "there is no record in " + Input::nameOf(options_.file));
+    results_.flush();
+    return exitCode_;
+  }
+
+ private:
+  void showProblem(const Status& status) { results_.line(Json().number("index", index_).problem(status).end()); }
+
+  const BatchOptions& options_;
+  Results results_;
+  size_t index_ = 0;
+  ExitCode exitCode_ = kSuccess;
+};
+
+// Calls work with what stands before and after the first tab of each record, or with nothing where there is no tab.
+template <typename Work>
+void forEachRecord(const BatchOptions& options, Work work) {
+  LineReader lines(Input(options.file), options.null ? '\0' : '\n');
+  Secret line;
+  while (lines.next(line)) {
+    const size_t tab = line.view().find('\t');
+    const bool whole = tab != std::string_view::npos;
+    const Secret subject(line.view().substr(0, whole ? tab : 0));
+    const Secret password(line.view().substr(whole ? tab + 1 : line.size()));
+    work(subject, password, whole, !lines.lineBuffered());
+  }
+}
+
+ExitCode checkValues(const BatchOptions& options, const KeyRecord& key) {
+  Answers answers(options);
+  forEachRecord(options, [&](const Secret& value, const Secret& password, bool whole, bool mayWait) {
+    answers.add(whole ? check(value, key, password, options.clear) : kNoTab, mayWait);
+  });
+  return answers.finish();
+}
+
+#ifdef LDAPPW_WITH_LDIF
+constexpr Status kNoEntry{kBadValue, "the export has no such entry"};
+constexpr Status kNoPassword{kBadValue, "the entry has no password"};
+
+// DNs as they are compared: without regard to case, and to blanks beside the separators.
+std::string plainName(std::string_view dn) {
+  std::string plain;
+  for (const char byte : dn) {
+    const bool separator = byte == ',' || byte == '=' || byte == '+';
+    while (separator && !plain.empty() && plain.back() == ' ') plain.pop_back();
+    const bool afterOne = !plain.empty() && (plain.back() == ',' || plain.back() == '=' || plain.back() == '+');
+    if (byte == ' ' && (plain.empty() || afterOne)) continue;
+    plain += byte >= 'A' && byte <= 'Z' ? static_cast<char>(byte - 'A' + 'a') : byte;
+  }
+  while (!plain.empty() && plain.back() == ' ') plain.pop_back();
+  return plain;
+}
+
+// The records, and what is known of each. An entry may have several values: any of them may match, and one that cannot
+// be checked leaves the answer open.
+class Waiting {
+ public:
+  explicit Waiting(const BatchOptions& options) {
+    forEachRecord(options, [&](const Secret& dn, const Secret& password, bool whole, bool) {
+      if (whole) places_.emplace(plainName(dn.view()), passwords_.size());
+      passwords_.emplace_back(password.view());
+      answers_.push_back(whole ? kNoEntry : kNoTab);
+    });
+  }
+
+  void meet(const std::string& dn) {
+    if (places_.count(plainName(dn)) > 0) settle(plainName(dn), [](const Secret&) { return kNoPassword; });
+  }
+  void meet(const std::string& dn, const Secret& value, const KeyRecord& key, bool clear) {
+    settle(plainName(dn), [&](const Secret& password) { return check(value, key, password, clear); });
+  }
+
+  const std::vector<Status>& answers() const noexcept { return answers_; }
+
+ private:
+  template <typename Find>
+  void settle(const std::string& name, Find find) {
+    const auto places = places_.equal_range(name);
+    for (auto place = places.first; place != places.second; ++place) {
+      const Status found = find(passwords_[place->second]);
+      const std::lock_guard<std::mutex> lock(mutex_);
+      Status& known = answers_[place->second];
+      if (rank(found) > rank(known)) known = found;
+    }
+  }
+
+  // Which of two answers counts.
+  static int rank(const Status& status) noexcept {
+    if (status.ok()) return 4;
+    if (status.text == kNoEntry.text) return 0;
+    if (status.text == kNoPassword.text) return 1;
+    return status.code == kNoMatch ? 2 : 3;
+  }
+
+  std::unordered_multimap<std::string, size_t> places_;
+  std::vector<Secret> passwords_;
+  std::vector<Status> answers_;
+  std::mutex mutex_;
+};
+
+ExitCode checkEntries(const BatchOptions& options, const KeyRecord& key) {
+  Waiting waiting(options);
+  ExportOptions source;
+  source.in = options.ldif;
+  Input input = openExport(source);
+  const auto work = [&](RecordWalker& walker, Part&) {
+    std::uint64_t entries = 0;
+    while (walker.next()) {
+      if (walker.entries() > entries) waiting.meet(walker.dn());
+      entries = walker.entries();
+      const bool current = walker.atPassword() && walker.password().history.empty();
+      if (current && walker.password().form == ValueForm::kBytes) {
+        waiting.meet(walker.dn(), walker.password().value, key, options.clear);
+      }
+    }
+  };
+  runExport(input, source, work, [](const Part&) {});
+  Answers answers(options);
+  for (const Status& status : waiting.answers()) answers.add(status, false);
+  return answers.finish();
+}
+#endif
+
+}  // namespace
+
+ExitCode verifyBatch(const BatchOptions& options) {
+  requireProvider();
+  const KeyRecord key = KeyRecord::load(options.keys);
+  if (options.ldif.empty()) return checkValues(options, key);
+#ifdef LDAPPW_WITH_LDIF
+  return checkEntries(options, key);
+#else
+  throw Failure(kUsage, "this command is built without LDIF");
+#endif
+}
+
+}  // namespace tool
