@@ -6,6 +6,8 @@
 #include <zlib.h>
 #include <zstd.h>
 
+#include <algorithm>
+#include <cstddef>
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>

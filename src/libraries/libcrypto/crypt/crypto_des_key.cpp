@@ -6,29 +6,24 @@
 namespace ldappw {
 namespace {
 
-using Rows = const RoundWords* [8];  // one for each byte of the key
-
-// The reference is restricted so that the compiler uses vectors.
-void combine(RoundWords& __restrict words, const Rows& rows) noexcept {
-  for (unsigned round = 0; round < 16; ++round) {
-    words[round] = (*rows[0])[round] | (*rows[1])[round] | (*rows[2])[round] | (*rows[3])[round] | (*rows[4])[round] |
-                   (*rows[5])[round] | (*rows[6])[round] | (*rows[7])[round];
-  }
+// Unrolled, this takes a quarter less time from gcc than all rows of a word at once do; 32 bits lack the registers.
+inline void add(RoundWords& __restrict words, const RoundWords& row) noexcept {
+#ifdef __x86_64__
+#pragma GCC unroll 16
+#endif
+  for (unsigned round = 0; round < 16; ++round) words[round] |= row[round];
 }
 
 }  // namespace
 
+// One row after the other: their addresses are the key, and a compiler that has many of them keeps some on the stack.
 void deriveRoundKeys(RoundKeys& keys, const unsigned char* key) noexcept {
-  Rows c;
-  Rows d;
-  for (unsigned i = 0; i < 8; ++i) {
-    c[i] = &kKeyParts.c[i][key[i] >> 4U];
-    d[i] = &kKeyParts.d[i][(key[i] >> 1U) & 15U];
+  keys.c = kKeyParts.c[0][key[0] >> 4U];
+  keys.d = kKeyParts.d[0][(key[0] >> 1U) & 15U];
+  for (unsigned i = 1; i < 8; ++i) {
+    add(keys.c, kKeyParts.c[i][key[i] >> 4U]);
+    add(keys.d, kKeyParts.d[i][(key[i] >> 1U) & 15U]);
   }
-  combine(keys.c, c);
-  combine(keys.d, d);
-  wipe(c, sizeof c);  // the rows' addresses are the key
-  wipe(d, sizeof d);
 }
 
 }  // namespace ldappw
