@@ -185,14 +185,16 @@ TEST_F(Derivation, RandomTextsAreOfTheirRangeAndEndAtTheLastByte) {
 }
 
 TEST_F(Derivation, WithoutARandomNumberTheProcessEnds) {
-  const rlimit none{0, 0};  // and leave no core files
+  const auto prepare = [] {
+    const rlimit noCoreFile{0, 0};
+    setrlimit(RLIMIT_CORE, &noCoreFile);
+    alarm(60);
+  };
   unsigned char buffer[4];
   const testing::KilledBySignal aborted(SIGABRT);
-  replacing(pQEL_RAND_bytes, [](void*, unsigned char*, int) { return 2; })([&] {
-    EXPECT_EXIT((setrlimit(RLIMIT_CORE, &none), morva_rand_ascii(ctx, buffer, 4)), aborted,
-                "^The PRNG is not seeded!\n$");
-  });
-  EXPECT_EXIT((setrlimit(RLIMIT_CORE, &none), ldappw::morva_rand_range(ctx, 5, 5)), aborted, "") << "no number to draw";
+  replacing(pQEL_RAND_bytes, [](void*, unsigned char*, int) { return 2; })(
+      [&] { EXPECT_EXIT((prepare(), morva_rand_ascii(ctx, buffer, 4)), aborted, "^The PRNG is not seeded!\n$"); });
+  EXPECT_EXIT((prepare(), ldappw::morva_rand_range(ctx, 5, 5)), aborted, "") << "no number to draw";
 }
 
 // ---- Derivation ----

@@ -209,6 +209,7 @@ berval bervalOf(std::string& text) {
 
 // Loads the module as slapd does, stores and checks one password under each scheme from several threads, and ends.
 [[noreturn]] void runSlapd(std::vector<std::string> arguments) {
+  alarm(60);
   void* handle = openPlugin(LDAPPW_SLAPD_MODULE);
   std::vector<char*> argv;
   for (std::string& argument : arguments) argv.push_back(argument.data());
@@ -276,6 +277,7 @@ constexpr int kArgv = 6, kArgc = 7, kClose = 210, kEncode = 800, kCompare = 802,
 std::map<int, void*> block;
 
 [[noreturn]] void run389(const char* entry, std::vector<std::string> arguments) {
+  alarm(60);
   void* handle = openPlugin(LDAPPW_389_PLUGIN);
   std::vector<char*> argv;
   for (std::string& argument : arguments) argv.push_back(argument.data());

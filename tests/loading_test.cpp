@@ -35,6 +35,7 @@ std::string staged(const char* system, const char* shipped, const Body& body) {
   std::fflush(nullptr);
   const pid_t child = fork();
   if (child == 0) {
+    alarm(60);
     namespace fs = std::filesystem;
     fs::current_path(folder.file(""));
     fs::create_directories("install/qel/qellib");

@@ -77,8 +77,10 @@ TEST(InstallFolder, IsThatOfTheLibraryWhereverTheProcessGoes) {
   const std::string library =
       std::filesystem::canonical("/proc/self/exe").parent_path().parent_path() / "lib/libdsutil.so.1";
   for (const size_t levels : {0U, 1U, 25U}) {
+    if (levels == 25 && !test::loaderFindsDeepFolders()) continue;
     const pid_t child = fork();
     if (child == 0) {
+      alarm(60);
       std::filesystem::current_path(folder.file(""));
       std::string expected = std::filesystem::current_path();
       const std::string name(200, 'd');

@@ -190,6 +190,7 @@ std::string leftBy(const Words& program, const std::string& input, const Words& 
     dup2(open(kLog, O_WRONLY | O_CREAT | O_TRUNC, 0600), STDERR_FILENO);
     setenv("LDTR_EVENTS", "0x4011000", 1);
     setenv("LDAP_DEBUG", "1", 1);
+    alarm(120);
     ptrace(PTRACE_TRACEME, 0, nullptr, nullptr);
     execv(arguments[0], arguments.data());
     _exit(127);

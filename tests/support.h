@@ -2,6 +2,7 @@
 // What the suites share: a recorder for the trace, failing allocations, guarded memory, replaced provider entries.
 #pragma once
 
+#include <gnu/libc-version.h>
 #include <pthread.h>
 #include <sys/mman.h>
 #include <unistd.h>
@@ -158,6 +159,12 @@ class Replaced {
 };
 template <class T, class V>
 Replaced(T&, V) -> Replaced<T>;
+
+// Whether a relative name can be opened from a folder deeper than any path. The loader of a C library newer than 2.36
+// waits for ever there, for a lock of its own.
+inline bool loaderFindsDeepFolders() {
+  return strverscmp(gnu_get_libc_version(), "2.37") < 0;
+}
 
 // A folder of its own, removed with all that is in it.
 class TempFolder {
