@@ -1,6 +1,6 @@
 /* SPDX-License-Identifier: Apache-2.0 */
 /* Opens and closes the library many times without linking it, before and after the provider's first use, and sees that
- * memory stays as it is: loader_loop LIBRARY [TIMES]. */
+ * memory stays as it is, and that the library path which it has set outlives it: loader_loop LIBRARY [TIMES]. */
 #include <dlfcn.h>
 #include <malloc.h>
 #include <stdio.h>
@@ -13,9 +13,11 @@ int main(int argc, char** argv) {
   enum { kWithoutProvider = 2, kWithProvider = 9 }; /* {SHA} and {SSHA} */
   const int times = argc > 2 ? atoi(argv[2]) : 200;
   size_t before = 0;
+  setenv("LD_LIBRARY_PATH", "/opt/x", 1);
   for (int i = 0; argc > 1 && i < times; ++i) {
     void* library = dlopen(argv[1], RTLD_NOW | RTLD_LOCAL);
     Format format = NULL;
+    int (*setPath)(void) = NULL;
     char value[128];
     if (library == NULL) {
       fprintf(stderr, "%s\n", dlerror());
@@ -23,6 +25,9 @@ int main(int argc, char** argv) {
     }
     void* symbol = dlsym(library, "format_password");
     memcpy(&format, &symbol, sizeof symbol);
+    symbol = dlsym(library, "setDefLibpath");
+    memcpy(&setPath, &symbol, sizeof symbol);
+    setPath();
     const int scheme = i % 2 == 0 ? kWithoutProvider : kWithProvider;
     if (format == NULL || format(scheme, NULL, NULL, "abc", 3, value, sizeof value) == 0) {
       fprintf(stderr, "round %d: nothing was formatted\n", i);
@@ -30,6 +35,10 @@ int main(int argc, char** argv) {
     }
     if (dlclose(library) != 0 || dlopen(argv[1], RTLD_NOW | RTLD_NOLOAD) != NULL) {
       fprintf(stderr, "round %d: the library stays\n", i);
+      return 1;
+    }
+    if (strcmp(getenv("LD_LIBRARY_PATH"), "/opt/x:/usr/lib") != 0) {
+      fprintf(stderr, "round %d: the library path is gone\n", i);
       return 1;
     }
     if (i == 20) before = mallinfo2().uordblks;

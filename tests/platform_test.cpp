@@ -139,7 +139,7 @@ TEST(LibraryPath, HoldsTheSystemFolderAfterwards) {
     }
     EXPECT_EQ(overflows(debugOutput(1, [] { EXPECT_EQ(setDefLibpath(), 0); })), row.overflows);
     EXPECT_EQ(getenv("LD_LIBRARY_PATH"), row.after);
-    EXPECT_EQ(debugOutput(0, [] { setDefLibpath(); }), "");  // reads what the first call's buffer holds
+    EXPECT_EQ(debugOutput(0, [] { setDefLibpath(); }), "");
     EXPECT_EQ(getenv("LD_LIBRARY_PATH"), row.after);
   }
 }

@@ -24,7 +24,6 @@ constexpr size_t kSpecsSize = 65;
 constexpr char kVariable[] = "LD_LIBRARY_PATH";
 constexpr char kSystemFolder[] = "/usr/lib";
 
-char libraryPath[kPathSize];  // handed to putenv, so it lives as long as the process
 void** closedCell = nullptr;
 
 bool isDebugging() noexcept {
@@ -94,7 +93,6 @@ void* ldapGetSymAddress(void** handle, const char* symbol) noexcept {
 }
 
 int setDefLibpath(void) noexcept {
-  // Read before the buffer is touched: after an earlier call the environment's value lies in it.
   const PlainOwner<char> value(ldap_getenv(kVariable));
   if (!value && ldap_chkenv(kVariable) != 0) return LDAPPW_NO_MEMORY;  // set, but there is no copy: the path stays
   if (value) {
@@ -102,7 +100,8 @@ int setDefLibpath(void) noexcept {
     kub_strlcat(elements, value.get(), sizeof elements);
     if (holdsElement(elements, kSystemFolder)) return 0;
   }
-  std::snprintf(libraryPath, sizeof libraryPath, "%s", kVariable);
+  char libraryPath[kPathSize] = "";
+  kub_strlcat(libraryPath, kVariable, sizeof libraryPath);
   const size_t first = kub_strlcat(libraryPath, "=", sizeof libraryPath);
   reportOverflow(first, sizeof libraryPath, __LINE__);
   if (value) {
@@ -114,7 +113,7 @@ int setDefLibpath(void) noexcept {
     kub_strlcat(libraryPath, kSystemFolder, sizeof libraryPath);
     reportOverflow(first, sizeof libraryPath, __LINE__);
   }
-  return putenv(libraryPath);
+  return setenv(kVariable, libraryPath + first, 1);  // a copy, which outlives this library
 }
 
 void fixupCipherSpecs(char* specs) noexcept {
