@@ -83,17 +83,19 @@ TEST(SetkeyAndEncrypt, AreDesOnBitsInEveryForm) {
       EXPECT_EQ(block, bitsOf(opensslDes(key, plain, true)));
     }
   }
-  // Formatting leaves what a key without bits would leave, but for the text.
-  const char* shared = _crypt("key", "zz");
+  // Making and checking values leaves the shared state to its user.
+  const char* const sharedText = _crypt("key", "zz");
+  const std::string shared = sharedText;
+  _crypt_r("key", "zz", &state);
   char value[21] = {};
   ASSERT_EQ(format_password(4, std::string("ab").data(), nullptr, "secret", 6, value, sizeof value), 20);
-  EXPECT_STREQ(shared, value + 7);
-  _crypt_r("", "ab", &state);
+  EXPECT_EQ(verify_password("secret", 6, value, 20, 1, nullptr), 0);
   std::string block = bitsOf("8 bytes!");
   std::string expected = block;
   _encrypt(block.data(), 0);
   _encrypt_r(expected.data(), 0, &state);
   EXPECT_EQ(block, expected);
+  EXPECT_EQ(sharedText, shared);
 }
 
 TEST(GenerateCryptSalt, DrawsFromClockAndProcessNumber) {

@@ -215,6 +215,28 @@ TEST(FormatPassword, ReadsNothingBehindAFirstNul) {
   }
 }
 
+// A provider that makes more than there is room for.
+TEST(FormatPassword, WritesNothingBehindTheRoomItHas) {
+  const std::string clear = letters(740);  // as AES, nearly all that verification has room for
+  const struct {
+    int scheme, outSize, written;
+    Failure tooMuch;
+  } rows[] = {{9, 62, 6, replacing(pQEL_EVP_MD_size, [](auto...) { return 60; })},
+              {3, 21, 29, replacing(pQEL_EVP_MD_size, [](auto...) { return 20; })},
+              {135, 1016, 8, replacing(pQEL_EVP_EncryptFinal, [](void*, void*, unsigned char* end, int* count) {
+                 return std::memset(end, 1, 64), *count = 64, 1;
+               })}};
+  for (const auto& row : rows) {
+    const std::string stored = format(row.scheme, clear);
+    Guarded in(clear);
+    Guarded out(std::string(static_cast<size_t>(std::max(row.outSize, row.written)), '!'));
+    row.tooMuch([&] {
+      EXPECT_EQ(format_password(row.scheme, nullptr, keys(), in.data(), 740, out.data(), row.outSize), 0);
+      EXPECT_NE(verify(clear, stored, 1), 0);
+    });
+  }
+}
+
 TEST(FormatPassword, TakesTaggedShaAsAlreadyHashed) {
   const Lines final{"format_password: This pwd update is in SHA format and is from an ORVEX supplier. Do nothing.\n"};
   const Lines raw{"format_password: This pwd update is in SHA format and is NOT from an ORVEX supplier. Base64 it.\n"};
@@ -294,6 +316,7 @@ TEST(VerifyPassword, TreatsTheOddPairsAsPromised) {
       {"an unknown alphabet stands for itself", noAlphabet, noAlphabet, 0, 1, keys()},
       {"what cannot be unmasked matches nothing", tooShort, tooShort, 99, 1, keys()},
       {"less than a digest", "secret", "{SSHA}" + opensslBase64(std::string(19, 'x')), 1, 0, keys()},
+      {"a stored tag alone makes a digest of zeros", "{SHA}" + std::string(27, 'A') + "=", "{SHA}", 0, 0, keys()},
       {"no base64", "secret", "{SSHA}" + std::string(56, '!'), 1, 0, keys()},
       {"a salted value presented stays the password", salted8, "skip 6" + saltedPayload(salted8, "salt"), 0, 0, keys()},
   };
@@ -345,6 +368,19 @@ TEST(Reversal, GivesTheClearTextOrNothing) {
   EXPECT_EQ(clear, nullptr);
   EXPECT_EQ(morva_decodePW(nullptr, "x", nullptr), 1);
   EXPECT_EQ(unformat_password(nullptr, &clear, nullptr, nullptr), 0);
+}
+
+TEST(Tracing, ShowsWhereAValueGoes) {
+  char out[64];
+  for (const auto& [scheme, start] : {std::pair{9, 6}, std::pair{133, 8}}) {
+    const TraceCapture trace(TraceCapture::kLinesOnly);
+    format_password(scheme, nullptr, keys(), "secret", 6, out, sizeof out);
+    std::ostringstream target;
+    target << ", out = " << static_cast<void*>(out + start) << ", ";
+    const auto isShown = [&](const Record& r) { return r.text.find(target.str()) != std::string::npos; };
+    const auto records = trace.records();
+    EXPECT_EQ(std::count_if(records.begin(), records.end(), isShown), 1) << scheme;
+  }
 }
 
 TEST(Tracing, RecordsTheNestedCalls) {
@@ -448,7 +484,7 @@ TEST(Threads, FormatVerifyAndReverseAllSchemesAtOnce) {
       }
       std::string value = format(4, clear);
       const std::string expected = value;
-      for (int round = 0; round < 10000 && value == expected; ++round)  // it works on a shared state
+      for (int round = 0; round < 10000 && value == expected; ++round)  // as long as a host works on the shared state
         format_password(4, std::string("ab").data(), nullptr, clear.data(), 20, value.data(), 20);
       EXPECT_EQ(value, expected);
     });

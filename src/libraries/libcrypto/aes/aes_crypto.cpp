@@ -136,8 +136,8 @@ int run(TracedCall& call, const Direction& direction, const Cipher& cipher, cons
 
 int aesEncryptTo(TextTarget& target, const char* clear, const char* cipherName, const SecBuffer* key,
                  const SecBuffer* iv, int clearLength) noexcept {
-  TracedCall call{kEncrypt.trace, clear, target.slot, cipherName, key, iv};
-  if (anyNull(clear, cipherName, key, iv) || target.isNull() || clearLength < 0) return call.invalid();
+  TracedCall call{kEncrypt.trace, clear, target.address(), cipherName, key, iv};
+  if (anyNull(clear, target.address(), cipherName, key, iv) || clearLength < 0) return call.invalid();
   void* qelCtx = nullptr;
   if (const int rc = initQelCrypto(&qelCtx); rc != 0) return call.fail(rc, "initQelCrypto() failed.");
   OutGuard<char> result(target.slot);

@@ -2,14 +2,13 @@
 // The traditional Unix crypt: DES applied 25 times to a block of zeros, the password as key, with an expansion that the
 // salt perturbs. The hash has a kernel of its own (crypt_hash.cpp); the one-bit-a-byte state that the interface promises
 // is filled from its results, and only _encrypt_r works from that state.
-#include "crypt/crypt_state.h"
+#include "password_schemes.h"
 
 #include <cstring>
 #include <utility>
 
 #include "crypt/crypt_hash.h"
 #include "crypt/crypto_des.h"
-#include "password_schemes.h"
 #include "support/bits.h"
 
 static_assert(sizeof(ldappw_crypt_data) == 898 && offsetof(ldappw_crypt_data, KS) == 48 &&
@@ -18,9 +17,6 @@ static_assert(sizeof(ldappw_crypt_data) == 898 && offsetof(ldappw_crypt_data, KS
 
 namespace ldappw {
 namespace {
-
-constexpr unsigned kHashCharacters = 11;
-constexpr char kDigits[] = "./0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz";
 
 ldappw_crypt_data CD;  // of the forms that take no state
 
@@ -67,18 +63,6 @@ void storeExpansion(ldappw_crypt_data* state, const CryptSalt& salt) noexcept {
   }
 }
 
-// The salt characters and the hash, as text.
-char* storeText(ldappw_crypt_data* state, const CryptSalt& salt, uint64_t hash) noexcept {
-  state->iobuf[0] = salt.characters[0];
-  state->iobuf[1] = salt.characters[salt.characters[1] == '\0' ? 0 : 1];
-  for (unsigned k = 0; k < kHashCharacters; ++k) {
-    const uint64_t six = k < 10 ? hash >> (58U - 6U * k) : hash << 2U;
-    state->iobuf[2 + k] = kDigits[six & 63U];
-  }
-  state->iobuf[13] = '\0';
-  return state->iobuf;
-}
-
 // The round function as the state has it: any expansion, any round keys.
 uint32_t stateRound(uint32_t half, const ldappw_crypt_data* state, unsigned round) noexcept {
   uint32_t result = 0;
@@ -95,15 +79,6 @@ uint32_t stateRound(uint32_t half, const ldappw_crypt_data* state, unsigned roun
 }
 
 }  // namespace
-
-char* cryptWiped(const CryptInput& input) noexcept {
-  char* text = storeText(&CD, input.salt(), input.hash());
-  storeExpansion(&CD, input.salt());
-  wipe(CD.KS, sizeof CD.KS);
-  wipe(CD.block, sizeof CD.block);
-  return text;
-}
-
 }  // namespace ldappw
 
 using namespace ldappw;
@@ -120,7 +95,9 @@ char* _crypt_r(char const* key, char const* salt, ldappw_crypt_data* state) noex
   storeExpansion(state, input.salt());
   spreadBits(state->block, hash, 64);
   state->block[64] = state->block[65] = 0;
-  return storeText(state, input.salt(), hash);
+  writeCryptText(input.salt(), hash, state->iobuf);
+  state->iobuf[kCryptCharacters] = '\0';
+  return state->iobuf;
 }
 
 int _setkey_r(char const* key, ldappw_crypt_data* state) noexcept {

@@ -17,6 +17,7 @@ namespace ldappw {
 namespace {
 
 constexpr unsigned kIterations = 25;
+constexpr char kDigits[] = "./0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz";
 
 // The six bits of a salt character. Characters that no salt should hold count by the same arithmetic.
 unsigned bitsOf(char character) noexcept {
@@ -99,6 +100,15 @@ struct KeySteps {
 
 CryptSalt::CryptSalt(const char* salt) noexcept
     : characters{salt[0], salt[0] == '\0' ? '\0' : salt[1]}, bits{bitsOf(characters[0]), bitsOf(characters[1])} {}
+
+void writeCryptText(const CryptSalt& salt, uint64_t hash, char* text) noexcept {
+  text[0] = salt.characters[0];
+  text[1] = salt.characters[salt.characters[1] == '\0' ? 0 : 1];
+  for (unsigned k = 0; k < kCryptCharacters - 2; ++k) {
+    const uint64_t six = k < 10 ? hash >> (58U - 6U * k) : hash << 2U;
+    text[2 + k] = kDigits[six & 63U];
+  }
+}
 
 CryptInput::CryptInput(const char* key, const char* salt) noexcept
     : salt_(salt), saltMask_(maskOf(0, salt_.bits[0]) | maskOf(1, salt_.bits[1])) {

@@ -15,6 +15,10 @@ struct CryptSalt {
   unsigned bits[2];
 };
 
+// Writes the salt's characters and the hash as text, without a terminator.
+constexpr unsigned kCryptCharacters = 13;
+void writeCryptText(const CryptSalt& salt, uint64_t hash, char* text) noexcept;
+
 // A key and a salt, made ready. The key is wiped when it goes.
 class CryptInput {
  public:

@@ -49,8 +49,8 @@ size_t digestBytes(const Digest& digest) noexcept {
 }  // namespace
 
 int saltedHashTo(TextTarget& target, const char* clear, size_t clearBytes, const char* digestName) noexcept {
-  TracedCall call{kEncrypt, clear, target.slot, digestName};
-  if (anyNull(clear, digestName) || target.isNull()) return call.invalid();
+  TracedCall call{kEncrypt, clear, target.address(), digestName};
+  if (anyNull(clear, target.address(), digestName)) return call.invalid();
   void* qelCtx = nullptr;
   if (const int rc = initQelCrypto(&qelCtx); rc != 0) return call.fail(rc, "initQelCrypto() failed.");
   OutGuard<char> result(target.slot);

@@ -27,7 +27,7 @@ constexpr size_t kUsualDigest = 64;  // what needs no allocation
 
 int unsaltedHashTo(TextTarget& target, const char* digestName, const char* clear, size_t clearBytes) noexcept {
   TracedCall call{kEncrypt};
-  if (clear == nullptr || target.isNull() || clearBytes > UINT32_MAX) return call.leave(LDAPPW_OPERATIONS_ERROR);
+  if (anyNull(clear, target.address()) || clearBytes > UINT32_MAX) return call.leave(LDAPPW_OPERATIONS_ERROR);
   void* qelCtx = nullptr;
   if (const int rc = initQelCrypto(&qelCtx); rc != 0) return call.leave(rc);
   DigestOwner digest(qelCtx);

@@ -5,9 +5,8 @@
 #include <cstring>
 #include <iterator>
 
-#include "crypt/crypt_state.h"
+#include "crypt/crypt_hash.h"
 #include "digests/sha.h"
-#include "support/locks.h"
 #include "support/text_target.h"
 
 namespace ldappw {
@@ -17,8 +16,7 @@ constexpr TraceInfo kFormatPassword = passwordOperation("format_password", kForm
 
 constexpr size_t kDigestBytes = sizeof(sha_digest);
 constexpr size_t kCryptKeyBytes = 8;  // that count
-constexpr size_t kCryptCharacters = 13;
-constexpr size_t kMaskedClear = 46;  // a longer password is cut silently, as in every stored value (EachScheme suite)
+constexpr size_t kMaskedClear = 46;   // a longer password is cut silently, as in every stored value (EachScheme suite)
 constexpr size_t kMaskedCharacters = 164;
 
 // The clear text up to a first NUL, behind which nothing is read, since it may be the end of what there is.
@@ -30,13 +28,18 @@ size_t least(size_t a, size_t b) noexcept {
   return a < b ? a : b;
 }
 
+size_t most(size_t a, size_t b) noexcept {
+  return a > b ? a : b;
+}
+
 // ---- The makers ----
 
-// Each writes a payload behind the tag and returns its length, 0 for failure.
-using PayloadMaker = size_t (*)(TracedCall& call, const Scheme& scheme, const FormatRequest& request, char* payload);
+// Each writes a payload to its target, where the scheme's own always fits, and returns its length, 0 for failure.
+using PayloadMaker = size_t (*)(TracedCall& call, const Scheme& scheme, const FormatRequest& request,
+                                TextTarget& target);
 
-size_t makeClear(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
-  if (request.clearBytes != 0) std::memcpy(payload, request.clear, request.clearBytes);
+size_t makeClear(TracedCall&, const Scheme&, const FormatRequest& request, TextTarget& target) noexcept {
+  if (request.clearBytes != 0) std::memcpy(target.payload, request.clear, request.clearBytes);
   return request.clearBytes;
 }
 
@@ -61,7 +64,7 @@ void takeDigest(const FormatRequest& request, size_t tagBytes, unsigned char* di
   std::memcpy(digest, request.clear + tagBytes, least(request.clearBytes - tagBytes, kDigestBytes));
 }
 
-size_t makeSha(TracedCall& call, const Scheme& scheme, const FormatRequest& request, char* payload) noexcept {
+size_t makeSha(TracedCall& call, const Scheme& scheme, const FormatRequest& request, TextTarget& target) noexcept {
   sha_digest digest{};
   auto* digestBytes = reinterpret_cast<unsigned char*>(&digest);
   const bool isTagged = !request.isClear && bytesBeforeNul(request) >= scheme.tagBytes && hasTag(request.clear, scheme);
@@ -77,43 +80,38 @@ size_t makeSha(TracedCall& call, const Scheme& scheme, const FormatRequest& requ
   } else if (!digestClear(request, digest)) {
     return 0;
   }
-  TextTarget target = behindTag(payload);
   return writeBase64(target, digestBytes, kDigestBytes) ? target.length : 0;
 }
 
-size_t makeMd5(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
-  TextTarget target = behindTag(payload);
+size_t makeMd5(TracedCall&, const Scheme&, const FormatRequest& request, TextTarget& target) noexcept {
   return unsaltedHashTo(target, "md5", request.clear, bytesBeforeNul(request)) == 0 ? target.length : 0;
 }
 
-size_t makeSsha(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
-  TextTarget target = behindTag(payload);
+size_t makeSsha(TracedCall&, const Scheme&, const FormatRequest& request, TextTarget& target) noexcept {
   return saltedHashTo(target, request.clear, bytesBeforeNul(request), kSaltedDigest) == 0 ? target.length : 0;
 }
 
-size_t makeCrypt(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
+size_t makeCrypt(TracedCall&, const Scheme&, const FormatRequest& request, TextTarget& target) noexcept {
   SecretArray<kCryptKeyBytes + 1> key;
   std::memcpy(key.data(), request.clear, strnlen(request.clear, least(request.clearBytes, kCryptKeyBytes)));
   const CryptInput input(key.text(), request.salt);
-  const CryptLock lock;
-  std::memcpy(payload, cryptWiped(input), kCryptCharacters);
+  writeCryptText(input.salt(), input.hash(), target.payload);
   return kCryptCharacters;
 }
 
-size_t makeMasked(TracedCall&, const Scheme&, const FormatRequest& request, char* payload) noexcept {
+size_t makeMasked(TracedCall&, const Scheme&, const FormatRequest& request, TextTarget& target) noexcept {
   SecretArray<kMaskedClear + 1> clear;
   std::memcpy(clear.data(), request.clear, strnlen(request.clear, least(request.clearBytes, kMaskedClear)));
   char* made = nullptr;
   const int rc = _morva_utils_encode_buffer(clear.text(), &made);
   const PlainOwner<char> encoded(made);
   if (rc != 0) return 0;
-  std::memcpy(payload, encoded.get(), kMaskedCharacters);
+  std::memcpy(target.payload, encoded.get(), kMaskedCharacters);
   return kMaskedCharacters;
 }
 
-size_t makeAes(TracedCall&, const Scheme& scheme, const FormatRequest& request, char* payload) noexcept {
+size_t makeAes(TracedCall&, const Scheme& scheme, const FormatRequest& request, TextTarget& target) noexcept {
   if (request.keyData == nullptr) return 0;
-  TextTarget target = behindTag(payload);
   const int rc =
       aesEncryptTo(target, request.clear, g_CipherName[scheme.keyIndex], &request.keyData->aesKeys[scheme.keyIndex],
                    &request.keyData->cryptoSalt, static_cast<int>(request.clearBytes));
@@ -157,7 +155,10 @@ int formattedValue(TracedCall& call, const Scheme& asked, const FormatRequest& r
   if (scheme.code == FORMAT_CRYPT && request.salt == nullptr) return 0;
   std::memcpy(out, scheme.tag, scheme.tagBytes);
   if (outSize - scheme.tagBytes < scheme.payloadRoom) return 0;
-  const size_t payload = kMakers[&scheme - kSchemes].make(call, scheme, request, out + scheme.tagBytes);
+  // A {MD5} value takes the room of its text whatever outSize is, as long as that is the scheme's least.
+  const size_t room = most(outSize - scheme.tagBytes, encodedLength(scheme.payloadRoom));
+  TextTarget target = behindTag(out + scheme.tagBytes, room);
+  const size_t payload = kMakers[&scheme - kSchemes].make(call, scheme, request, target);
   return payload == 0 ? 0 : static_cast<int>(scheme.tagBytes + payload);
 }
 

@@ -25,7 +25,7 @@ inline const Scheme& schemeToMake(const Scheme& asked, const AesKeyData* keyData
 }
 
 // The work of format_password, traced as such. Writes the value and nothing behind it, and returns its length, 0 for
-// failure. A {SSHA} or {MD5} value is written whatever outSize is, as long as that is the scheme's least.
+// failure.
 int formatValue(const Scheme& scheme, const FormatRequest& request, char* out, size_t outSize) noexcept;
 
 // The same for {SHA} and a clear text, of which the caller wants the digest before it is written as base64. False for

@@ -106,7 +106,7 @@ int verifySalted(const Comparison& c) noexcept {
 
 int compareFormattedStored(const Comparison& c) noexcept {
   WorkBuffer work;
-  return compareTexts(work.formatLike(c.stored, true, c.presentedScheme, c.presented, c.keyData), c.presented);
+  return compareTexts(work.formatLike(c.stored, false, c.presentedScheme, c.presented, c.keyData), c.presented);
 }
 
 // Tags compare without regard to case, payloads exactly. The tags differ only where another scheme was made.

@@ -8,17 +8,13 @@ namespace ldappw {
 namespace {
 
 pthread_mutex_t creationMutex = PTHREAD_MUTEX_INITIALIZER;
-// Who finds it locked spins before it sleeps: it is held for less time than going to sleep takes.
-pthread_mutex_t cryptMutex = PTHREAD_ADAPTIVE_MUTEX_INITIALIZER_NP;
 thread_local bool isCreating = false;  // this thread holds creationMutex
 
 void beforeFork() noexcept {
   if (!isCreating) pthread_mutex_lock(&creationMutex);
-  pthread_mutex_lock(&cryptMutex);
 }
 
 void afterFork() noexcept {
-  pthread_mutex_unlock(&cryptMutex);
   if (!isCreating) pthread_mutex_unlock(&creationMutex);
 }
 
@@ -39,14 +35,6 @@ CreationLock::~CreationLock() {
   if (passed_) return;
   isCreating = false;
   pthread_mutex_unlock(&creationMutex);
-}
-
-CryptLock::CryptLock() noexcept {
-  pthread_mutex_lock(&cryptMutex);
-}
-
-CryptLock::~CryptLock() {
-  pthread_mutex_unlock(&cryptMutex);
 }
 
 }  // namespace ldappw

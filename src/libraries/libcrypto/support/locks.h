@@ -18,13 +18,4 @@ class CreationLock {
   bool passed_;
 };
 
-// Held while the Unix crypt works on the process-wide state. Whoever holds it takes no other lock.
-class CryptLock {
- public:
-  CryptLock() noexcept;
-  ~CryptLock();
-  CryptLock(const CryptLock&) = delete;
-  CryptLock& operator=(const CryptLock&) = delete;
-};
-
 }  // namespace ldappw

@@ -18,26 +18,28 @@ inline size_t lengthOf(const char* text) noexcept {
 struct TextTarget {
   char** slot;
   char* payload;
-  size_t length = 0;  // of the characters behind the tag
+  size_t room;        // for the characters behind the tag
+  size_t length = 0;  // of those
 
-  bool isNull() const noexcept { return slot == nullptr && payload == nullptr; }
+  const void* address() const noexcept { return slot != nullptr ? static_cast<const void*>(slot) : payload; }
 };
 
 inline TextTarget toSlot(char** slot) noexcept {
-  return {slot, nullptr};
+  return {slot, nullptr, 0};
 }
-inline TextTarget behindTag(char* payload) noexcept {
-  return {nullptr, payload};
+inline TextTarget behindTag(char* payload, size_t room) noexcept {
+  return {nullptr, payload, room};
 }
 
-// Writes bytes as base64. False when there is no memory for the text, or the alphabet is not whole.
+// Writes bytes as base64. False when there is no memory or no room for the text, as where a provider has made more than
+// there should be, or the alphabet is not whole.
 inline bool writeBase64(TextTarget& target, const unsigned char* data, size_t bytes) noexcept {
   if (target.slot != nullptr) {
     char* text = binaryBlobToBase64(data, static_cast<int>(bytes));
     if (text != nullptr) *target.slot = text;
     return text != nullptr;
   }
-  if (!isWholeAlphabet(pBase64)) return false;
+  if (encodedLength(bytes) > target.room || !isWholeAlphabet(pBase64)) return false;
   encodeBytes(data, bytes, pBase64, target.payload);
   target.length = encodedLength(bytes);
   return true;
