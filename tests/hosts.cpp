@@ -4,15 +4,19 @@
 #include <dlfcn.h>
 #include <openssl/opensslv.h>
 #include <pthread.h>
+#include <sys/time.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <atomic>
+#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <exception>
+#include <fstream>
 #include <iterator>
+#include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -85,6 +89,21 @@ void worksInThreads() {
   });
 }
 
+// In a child: a stash file is rebuilt while memory runs out, and has its former bytes or the new ones afterwards.
+int restoreWithoutMemory(const char* path, long number, int andLater) {
+  const std::string former(200, 'x');
+  CHECK(restoreKeyStashFile(path, "a-seed-of-characters", "saltsaltsalt") == 0);
+  std::ofstream(path) << former;
+  alarm(20);
+  bump_refuse(number, andLater);
+  const int rc = restoreKeyStashFile(path, "a-seed-of-characters", "saltsaltsalt");
+  const bool isEnd = bump_refuse(-1, 0) != 0;
+  std::ostringstream content;
+  content << std::ifstream(path).rdbuf();
+  CHECK(rc == 0 ? content.str().size() == 116 : content.str() == former);
+  return isEnd ? 77 : 0;
+}
+
 // In a child: a value is made while memory runs out at that request, and another one afterwards. 77: nothing was refused.
 int useWithoutMemory(int scheme, long number, int andLater) {
   alarm(20);
@@ -114,12 +133,17 @@ void startOpenssl() {
 void runsOutOfMemory() {
   if (bump_refuse == nullptr) return;
   startOpenssl();
-  for (const int scheme : {FORMAT_SSHA, FORMAT_AES256}) {
+  char path[] = "/tmp/ldappw-hosts-XXXXXX";
+  CHECK(close(mkstemp(path)) == 0);
+  for (const int scheme : {int{FORMAT_SSHA}, int{FORMAT_AES256}, 0}) {  // 0: no scheme, but a stash file
     for (const int andLater : {0, 1}) {
       int status = 0;
       for (long number = 0; status == 0; number += 1 + number / 50) {
         const pid_t child = fork();
-        if (child == 0) _exit(useWithoutMemory(scheme, number, andLater));
+        if (child == 0) {
+          _exit(scheme == 0 ? restoreWithoutMemory(path, number, andLater)
+                            : useWithoutMemory(scheme, number, andLater));
+        }
         CHECK(waitpid(child, &status, 0) == child);
         if (status != 0 && status != 77 << 8U) {
           std::fprintf(stderr, "scheme %d, request %ld%s\n", scheme, number, andLater ? " and later" : "");
@@ -128,6 +152,7 @@ void runsOutOfMemory() {
       CHECK(status == 77 << 8U);
     }
   }
+  unlink(path);
 }
 
 [[gnu::noinline]] void useMuch() {
@@ -190,6 +215,21 @@ void throwsFromItsSink() {
   } catch (int) {
   }
   CHECK(!"reached");
+}
+
+// A signal handler forks while the host makes {crypt} values.
+void forksInASignalHandler() {
+  static volatile sig_atomic_t forks = 0;
+  const auto handler = [](int) {
+    const pid_t child = fork();
+    if (child == 0) _exit(0);
+    if (child > 0 && waitpid(child, nullptr, 0) == child) ++forks;
+  };
+  std::signal(SIGPROF, handler);
+  const itimerval often{{0, 1000}, {0, 1000}};
+  CHECK(setitimer(ITIMER_PROF, &often, nullptr) == 0);
+  char salt[] = "ab", value[32];
+  while (forks < 50) CHECK(format_password(FORMAT_CRYPT, salt, nullptr, "secret", 6, value, sizeof value) == 20);
 }
 
 #ifndef __SANITIZE_ADDRESS__  // its own allocator leaves locks taken in the child
@@ -293,6 +333,7 @@ constexpr Host kHosts[] = {
     {"is cancelled", isCancelled},
     {"traces into itself", tracesIntoItself},
     {"throws from its sink", throwsFromItsSink},
+    {"forks in a signal handler", forksInASignalHandler},
 #ifndef __SANITIZE_ADDRESS__
     {"forks", forks},
 #endif

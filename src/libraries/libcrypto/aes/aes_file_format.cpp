@@ -6,7 +6,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <cstdio>
+#include <cerrno>
 
 #include "aes/aes_utils_record.h"
 #include "support/cancellation.h"
@@ -20,43 +20,46 @@ namespace {
 constexpr TraceInfo kWrite = operation(kAesFile, 1, "writeKeyStashFile", {"keyStashFile", "keyData"});
 constexpr TraceInfo kRead = operation(kAesFile, 2, "readKeyStashFile", {"keyStashFile", "keyData"});
 
-// A stash file under way. It has no buffer of its own: no key stays behind in one, and a write that the device refuses
-// is noticed at once.
+// A stash file under way. There is no stream: that would want memory after the file has been cut to nothing, and keep
+// keys in its buffer.
 class StashFile {
  public:
-  static StashFile forReading(const char* path) noexcept { return StashFile(std::fopen(path, "rbe")); }
-  static StashFile forWriting(const char* path) noexcept {
-    const int descriptor = open(path, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, S_IRUSR | S_IWUSR);
-    if (descriptor < 0) return StashFile(nullptr);
-    FILE* file = fdopen(descriptor, "wb");
-    if (file == nullptr) close(descriptor);
-    return StashFile(file);
-  }
+  explicit StashFile(const char* path, int flags) noexcept
+      : descriptor_(open(path, flags | O_CLOEXEC, S_IRUSR | S_IWUSR)) {}
   ~StashFile() {
-    if (file_ != nullptr) std::fclose(file_);
+    if (descriptor_ >= 0) close(descriptor_);
   }
   StashFile(const StashFile&) = delete;
   StashFile& operator=(const StashFile&) = delete;
 
-  explicit operator bool() const noexcept { return file_ != nullptr; }
-  bool read(void* data, size_t bytes) noexcept { return std::fread(data, 1, bytes, file_) == bytes; }
-  bool write(const void* data, size_t bytes) noexcept { return std::fwrite(data, 1, bytes, file_) == bytes; }
-  bool write(const SecBuffer& buffer) noexcept { return buffer.length == 0 || write(buffer.data, buffer.length); }
-  void flush() noexcept { std::fflush(file_); }
+  explicit operator bool() const noexcept { return descriptor_ >= 0; }
+  bool read(void* data, size_t bytes) noexcept { return wholly(::read, static_cast<char*>(data), bytes); }
+  bool write(const void* data, size_t bytes) noexcept { return wholly(::write, static_cast<const char*>(data), bytes); }
+  bool write(const SecBuffer& buffer) noexcept { return write(buffer.data, buffer.length); }
 
   // Whether a regular file is known to hold less than so many further bytes.
   bool endsBefore(size_t bytes) noexcept {
     struct stat about {};
-    const long at = std::ftell(file_);
-    return fstat(fileno(file_), &about) == 0 && S_ISREG(about.st_mode) && at >= 0 &&
+    const off_t at = lseek(descriptor_, 0, SEEK_CUR);
+    return fstat(descriptor_, &about) == 0 && S_ISREG(about.st_mode) && at >= 0 &&
            static_cast<uint64_t>(about.st_size) - static_cast<uint64_t>(at) < bytes;
   }
 
  private:
-  explicit StashFile(FILE* file) noexcept : file_(file) {
-    if (file_ != nullptr) std::setvbuf(file_, nullptr, _IONBF, 0);
+  // All bytes, in as many steps as it takes.
+  template <class Step, class Data>
+  bool wholly(Step step, Data* data, size_t bytes) noexcept {
+    while (bytes != 0) {
+      const ssize_t count = step(descriptor_, data, bytes);
+      if (count < 0 && errno == EINTR) continue;
+      if (count <= 0) return false;
+      data += count;
+      bytes -= static_cast<size_t>(count);
+    }
+    return true;
   }
-  FILE* file_;
+
+  int descriptor_;
 };
 
 // The sync text with its length before it. What a regular file cannot hold is not allocated.
@@ -81,7 +84,7 @@ int writeKeyStashFile(const char* keyStashFile, const AesKeyData* keyData) noexc
   TracedCall call{kWrite, keyStashFile, keyData};
   if (anyNull(keyStashFile, keyData)) return call.invalid();
   const NoCancellation uncancelled;
-  StashFile file = StashFile::forWriting(keyStashFile);
+  StashFile file(keyStashFile, O_WRONLY | O_CREAT | O_TRUNC);
   if (!file) return call.fail(LDAPPW_OPERATIONS_ERROR, "fopen() failed.");
   const uint32_t length = keyData->cryptoSync.length;
   if (!file.write(&length, sizeof length) || !file.write(keyData->cryptoSync)) {
@@ -91,7 +94,6 @@ int writeKeyStashFile(const char* keyStashFile, const AesKeyData* keyData) noexc
   for (const SecBuffer& key : keyData->aesKeys) {
     if (!file.write(key)) return call.fail(LDAPPW_OPERATIONS_ERROR, "fwrite(aesKeys) failed.");
   }
-  file.flush();
   return call.leave(LDAPPW_SUCCESS);
 }
 
@@ -107,7 +109,7 @@ int readKeyStashFile(const char* keyStashFile, AesKeyData* keyData) noexcept {
   TracedCall call{kRead, keyStashFile, keyData};
   if (anyNull(keyStashFile, keyData)) return call.invalid();
   const NoCancellation uncancelled;
-  StashFile file = StashFile::forReading(keyStashFile);
+  StashFile file(keyStashFile, O_RDONLY);
   if (!file) return call.fail(LDAPPW_OPERATIONS_ERROR, "fopen() failed.");
   if (const int rc = readSync(call, file, keyData->cryptoSync); rc != 0) return rc;
   if (!file.read(keyData->cryptoSalt.data, keyData->cryptoSalt.length)) {
