@@ -90,13 +90,14 @@ int morva_pkcs5_F(const Digest& digest, const DerivationInput& input, uint32_t b
   return call.leave(LDAPPW_SUCCESS);
 }
 
-// Reports argument and memory failures alone.
+// A failed step of the provider counts only where the key must be whole.
 int derive(const Digest& digest, const DerivationInput& input, unsigned char* derivedKey, uint64_t derivedKeyLen,
-           bool& isWhole) noexcept {
+           bool mustBeWhole) noexcept {
   TracedCall call{kPbkdf2, digest.qelCtx, digest.context, digest.algorithm, input.seed, input.salt, derivedKey};
   if (!digest.isComplete() || anyNull(input.seed, input.salt, derivedKey)) return call.invalid();
   if (anyNull(pQEL_EVP_DigestInit, pQEL_EVP_DigestUpdate, pQEL_EVP_DigestFinal)) return call.invalid();  // not loaded
   if (derivedKeyLen > kLongestKey) return call.fail(LDAPPW_OPERATIONS_ERROR, "derivedKeyLen too long.");
+  bool isWhole = true;
   const uint64_t wholeBlocks = derivedKeyLen / kBlockBytes;
   const auto rest = static_cast<size_t>(derivedKeyLen % kBlockBytes);
   for (uint64_t i = 0; i < wholeBlocks; ++i, derivedKey += kBlockBytes) {
@@ -112,16 +113,14 @@ int derive(const Digest& digest, const DerivationInput& input, unsigned char* de
     }
     std::memcpy(derivedKey, last.data(), rest);
   }
-  return call.leave(LDAPPW_SUCCESS);
+  return call.leave(mustBeWhole && !isWhole ? LDAPPW_OPERATIONS_ERROR : LDAPPW_SUCCESS);
 }
 
 }  // namespace
 
 int deriveWhole(const Digest& digest, const DerivationInput& input, unsigned char* derivedKey,
                 uint64_t derivedKeyLen) noexcept {
-  bool isWhole = true;
-  const int rc = derive(digest, input, derivedKey, derivedKeyLen, isWhole);
-  return rc == LDAPPW_SUCCESS && !isWhole ? int{LDAPPW_OPERATIONS_ERROR} : rc;
+  return derive(digest, input, derivedKey, derivedKeyLen, true);
 }
 
 }  // namespace ldappw
@@ -135,9 +134,8 @@ extern "C" {
 int morva_pbkdf2(void* qelCtx, void* digestCtx, void* digest, const unsigned char* seed, uint32_t seedLen,
                  const unsigned char* salt, uint64_t saltLen, uint32_t iterations, unsigned char* derivedKey,
                  uint64_t derivedKeyLen) noexcept {
-  bool isWhole = true;
   return derive({qelCtx, digestCtx, digest}, {seed, seedLen, salt, saltLen, iterations}, derivedKey, derivedKeyLen,
-                isWhole);
+                false);
 }
 
 }  // extern "C"
