@@ -6,8 +6,9 @@
 // Rows called "same" give one memory twice.
 //
 // Then what it gives, and the line that it traces, when memory or the provider fails at any point: each allocation
-// refused, alone and with all later ones; no provider; each of the provider's entries giving 0, 2, -1 or null. What a row
-// does not name there has to go well, and one without such memory allocates nothing.
+// refused, alone and with all later ones; no provider; each of the provider's entries giving 0, 2, -1 or null; and when
+// the host has taken the base64 alphabet away. What a row does not name there has to go well, and one without such
+// memory allocates nothing.
 #include <climits>
 #include <map>
 #include <regex>
@@ -135,7 +136,8 @@ struct Row {
 
 // Results of operations that serve as arguments; decoding writes to its text.
 std::string maskedValue, cipherValue, longCipherValue;
-const std::string longText(300, 'x'), saltedValue = saltedPayload(text, letters(500));
+const std::string longText(300, 'x'),
+    saltedValue = saltedPayload(text, letters(500)), shaValue = "{SHA}" + opensslBase64(opensslDigest("SHA1", text));
 const char* maskedText() {
   return std::strcpy(masked, maskedValue.c_str());
 }
@@ -168,7 +170,7 @@ Lines noKeys(const std::string& step) {
 }
 Lines digestSteps(const std::string& step) {
   return {"no provider: 1 initQelCrypto() failed.", "get_digestbyname=0 MD_CTX_new=0: 1 initQelDigest() failed.",
-          "DigestInit DigestUpdate DigestFinal: 1 " + step + " failed."};
+          "DigestInit DigestUpdate DigestFinal no alphabet: 1 " + step + " failed."};
 }
 Lines saltedSteps(const Lines& sizes, const Lines& last = {}) {
   const Lines start = {"no provider: 1 debug: initQelCrypto() failed.",
@@ -206,12 +208,15 @@ Lines contextSteps(const std::string& name, const std::string& kind, const std::
 const Row kRows[] = {
     {"check_format", [](Odd& a) -> std::string { return shown(run(check_format, Arguments{a.pointer(value), static_cast<unsigned>(a.bytes(8))})); }, "1 | 133 133 1"},
     {"formatted_password_length", [](Odd& a) -> std::string { return shown(run(formatted_password_length, Arguments{a.number(133), a.number(16)})); }, "-1 -1 -1 -1 | -1 8 32 -1"},
-    {"format_password", [](Odd& a) -> std::string { return shown(run(format_password, Arguments{a.number(2), a.pointer(salt), a.pointer(keys), a.pointer(text), a.bytes(6), a.pointer(room), a.bytes(256)})); }, "0 0 0 0 | 33 | 33 | 0 | 0 0 33 | 0 | 0 0 0"},
+    {"format_password", [](Odd& a) -> std::string { return shown(run(format_password, Arguments{a.number(2), a.pointer(salt), a.pointer(keys), a.pointer(text), a.bytes(6), a.pointer(room), a.bytes(256)})); }, "0 0 0 0 | 33 | 33 | 0 | 0 0 33 | 0 | 0 0 0",
+     {}, {"no alphabet: 0 "}},
     {"format_password, crypt", [](Odd& a) -> std::string { return shown(run(format_password, Arguments{4, a.pointer(salt), nullptr, a.pointer(text), a.bytes(6), a.pointer(room), a.bytes(256)})); }, "0 | 0 | 0 0 20 | 0 | 0 0 0"},
     {"format_password, AES", [](Odd& a) -> std::string { return shown(run(format_password, Arguments{134, nullptr, a.pointer(keys), a.pointer(text), a.bytes(6), a.pointer(room), a.bytes(256)})); }, "0 | 0 | 0 0 32 | 0 | 0 0 0",
-     {}, cipherSteps("Encrypt", "0 debug: Error - aesEncryptBuffer: ", " rc = 1\n")},
+     {}, cipherSteps("Encrypt", "0 debug: Error - aesEncryptBuffer: ", " rc = 1\n") + Lines{"no alphabet: 0 debug: Error - aesEncryptBuffer: binaryBlobToBase64() returned NULL. rc = 1\n"}},
     {"format_password, same", [](Odd& a) -> std::string { return shown(run(format_password, Arguments{a.number(1), nullptr, nullptr, room, 3, room, 256})); }, "0 0 0 0"},
     {"verify_password", [](Odd& a) -> std::string { return shown(run(verify_password, Arguments{a.pointer(text), a.bytes(6), a.pointer(text), a.bytes(6), a.number(1), a.pointer(keys)})); }, "99 | 99 99 99 | 99 | 99 99 99 | 0 0 0 0 | 0"},
+    {"verify_password, SHA", [](Odd& a) -> std::string { return shown(run(verify_password, Arguments{text, 6, shaValue.c_str(), a.bytes(33), 1, a.pointer(keys)})); }, "99 99 99 | 0",
+     {}, {"no alphabet: 99 "}},
     {"unformat_password", [](Odd& a) -> std::string { return with(run(unformat_password, Arguments{a.pointer(maskedText()), a.slot(&made), a.pointer(keys), a.pointer(&number)}), made); }, "0 | 0 1+ | 1+ | 1+",
      {"0 "}},
     {"morva_decodePW", [](Odd& a) -> std::string { return with(run(morva_decodePW, Arguments{a.slot(&made), a.pointer(maskedText()), a.pointer(keys)}), made); }, "1 0+ | 1 | 0+",
@@ -235,28 +240,28 @@ const Row kRows[] = {
     {"SHA", [](Odd& a) -> std::string { return (run(SHA, Arguments{a.pointer(text), 6, a.pointer(&digest)}), "-"); }, "- | -"},
     {"SHA, same", [](Odd& a) -> std::string { return (run(SHA, Arguments{reinterpret_cast<char*>(digest.word), 20, a.pointer(&digest)}), "-"); }, "-"},
     {"saltedHashEncrypt", [](Odd& a) -> std::string { return with(run(saltedHashEncrypt, Arguments{a.pointer(text), a.slot(&made), a.pointer("SHA1")}), made); }, "1! | 1! 0+ | 1!",
-     {"1 debug: binaryBlobToBase64() returned NULL."}, saltedSteps({"MD_size=0 MD_size=-1: 90 debug: calloc() returned NULL."}, {"RAND_bytes: 1 debug: QEL_RAND_bytes() failed."})},
+     {"1 debug: binaryBlobToBase64() returned NULL."}, saltedSteps({"MD_size=0 MD_size=-1: 90 debug: calloc() returned NULL."}, {"RAND_bytes: 1 debug: QEL_RAND_bytes() failed."}) + Lines{"no alphabet: 1 debug: binaryBlobToBase64() returned NULL."}},
     {"unsaltedHashEncrypt", [](Odd& a) -> std::string { return with(run(unsaltedHashEncrypt, Arguments{a.pointer("md5"), a.pointer(text), a.slot(&made)}), made); }, "1 | 1 | 1 0+",
      {"1 debug: binaryBlobToBase64()returned NULL."}, {
       "no provider: 1 Error - initQelCrypto: loadQelCrypto() failed. \n", "get_digestbyname=0 MD_CTX_new=0: 1 debug: Error - unsaltedHashEncrypt: initQelDigest() failed",
       "MD_size=0 MD_size=-1: 90 debug: Error - unsaltedHashEncrypt : calloc() failed\n", "DigestInit=0: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_DigestInit() failed",
-      "DigestInit=2 DigestInit=-1 DigestUpdate=0: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_DigestUpdate() failed", "DigestFinal=0: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_DigestFinal() failed"}},
+      "DigestInit=2 DigestInit=-1 DigestUpdate=0: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_DigestUpdate() failed", "DigestFinal=0: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_DigestFinal() failed", "no alphabet: 1 debug: binaryBlobToBase64()returned NULL."}},
     {"saltedHashVerify", [](Odd& a) -> std::string { return shown(run(saltedHashVerify, Arguments{a.pointer(text), a.pointer(saltedValue.c_str()), a.pointer("SHA1")})); }, "1! | 1! | 1!",
-     {"1 debug: base64ToBinaryBlob() returned NULL."}, saltedSteps({"MD_size=0: 90 debug: calloc() returned NULL.", "MD_size=2: 49 ", "MD_size=-1: 90 debug: calloc() returned NULL."})},
+     {"1 debug: base64ToBinaryBlob() returned NULL."}, saltedSteps({"MD_size=0: 90 debug: calloc() returned NULL.", "MD_size=2: 49 ", "MD_size=-1: 90 debug: calloc() returned NULL."}) + Lines{"no alphabet: 1 debug: base64ToBinaryBlob() returned NULL."}},
     {"binaryBlobToString", [](Odd& a) -> std::string { return shown(run(binaryBlobToString, Arguments{a.pointer(bytes), a.bytes(16), a.pointer(pBase64)})); }, "null | some some some | null",
-     {"null "}},
+     {"null "}, {"no alphabet: null "}},
     {"binaryBlobToBase64", [](Odd& a) -> std::string { return shown(run(binaryBlobToBase64, Arguments{a.pointer(bytes), a.bytes(16)})); }, "null | some some some",
-     {"null "}},
+     {"null "}, {"no alphabet: null "}},
     {"stringToBinaryBlob", [](Odd& a) -> std::string { return blob(run(stringToBinaryBlob, Arguments{a.pointer(base64), a.pointer(&length), a.pointer(pBase64)})); }, "null | null | null",
-     {"null "}},
+     {"null "}, {"no alphabet: null "}},
     {"stringToBinaryBlob, same", [](Odd& a) -> std::string { return blob(run(stringToBinaryBlob, Arguments{pBase64, a.pointer(&length), pBase64})); }, "null",
-     {"null "}},
+     {"null "}, {"no alphabet: null "}},
     {"base64ToBinaryBlob", [](Odd& a) -> std::string { return blob(run(base64ToBinaryBlob, Arguments{a.pointer(base64), a.pointer(&length)})); }, "null | null",
-     {"null "}},
+     {"null "}, {"no alphabet: null "}},
     {"compactToOnlyString", [](Odd& a) -> std::string { return shown(run(compactToOnlyString, Arguments{a.pointer(base64), a.pointer(pBase64)})); }, "null | null",
-     {"null "}},
+     {"null "}, {"no alphabet: null "}},
     {"compactToOnlyBase64", [](Odd& a) -> std::string { return shown(run(compactToOnlyBase64, Arguments{a.pointer(base64)})); }, "null",
-     {"null "}},
+     {"null "}, {"no alphabet: null "}},
     {"des", [](Odd& a) -> std::string { return (run(des, Arguments{a.pointer(words), a.pointer(bytes)}), "-"); }, "- | -"},
     {"deskey", [](Odd& a) -> std::string { return (run(deskey, Arguments{a.pointer(words), a.pointer(bytes), a.number(0)}), "-"); }, "- | - | - - - -"},
     {"deskey, same", [](Odd& a) -> std::string { return (run(deskey, Arguments{words, reinterpret_cast<unsigned char*>(a.pointer(words)), 0}), "-"); }, "-"},
@@ -327,21 +332,21 @@ const Row kRows[] = {
     {"growKeysFromSeed", [](Odd& a) -> std::string { return shown(run(growKeysFromSeed, Arguments{a.pointer(ctx), a.pointer(digestCtx), a.pointer(sha1), a.pointer(seed), a.pointer(keys)})); }, "1! | 1! | 1! | 1! | 1!",
      {"90 morva_pbkdf2() failed."}, {"DigestInit DigestUpdate DigestFinal: 1 morva_pbkdf2() failed."}},
     {"genKeySyncVal", [](Odd& a) -> std::string { return shown(run(genKeySyncVal, Arguments{a.pointer(ctx), a.pointer(digestCtx), a.pointer(sha1), a.pointer(seed), a.pointer(keys)})); }, "1! | 1! | 1! | 1! | 1!",
-     {"90 calloc(cryptoSync) returned NULL.", "90 morva_pbkdf2() failed.", "1 binaryBlobToBase64() returned NULL."}, {"DigestInit DigestUpdate DigestFinal: 1 morva_pbkdf2() failed."}},
+     {"90 calloc(cryptoSync) returned NULL.", "90 morva_pbkdf2() failed.", "1 binaryBlobToBase64() returned NULL."}, {"DigestInit DigestUpdate DigestFinal: 1 morva_pbkdf2() failed.", "no alphabet: 1 binaryBlobToBase64() returned NULL."}},
     {"genKeyDataVal", [](Odd& a) -> std::string { return withRecord(run(genKeyDataVal, Arguments{a.pointer(ctx), a.pointer(digestCtx), a.pointer(sha1), a.pointer(seed), a.pointer(keySalt), a.slot(&record)})); }, "1! | 1! | 1! | 0+ | 0+ | 1! 0+",
-     {"90 initAesKeyData() failed.", "90 strdup() returned NULL.", "90 genKeySyncVal() failed.", "1 genKeySyncVal() failed.", "90 growKeysFromSeed() failed."}, {"DigestInit DigestUpdate DigestFinal: 1 genKeySyncVal() failed."}},
+     {"90 initAesKeyData() failed.", "90 strdup() returned NULL.", "90 genKeySyncVal() failed.", "1 genKeySyncVal() failed.", "90 growKeysFromSeed() failed."}, {"DigestInit DigestUpdate DigestFinal no alphabet: 1 genKeySyncVal() failed."}},
     {"genTmpKeyDataVal", [](Odd& a) -> std::string { return withRecord(run(genTmpKeyDataVal, Arguments{a.pointer(seed), a.pointer(keySalt), a.slot(&record)})); }, "1! | 1! | 1! 0+",
      noKeys("genKeyDataVal()"), digestSteps("genKeyDataVal()")},
     {"aesEncryptBuffer", [](Odd& a) -> std::string { return with(run(aesEncryptBuffer, Arguments{a.pointer(text), a.slot(&made), a.pointer("AES-256-ECB"), a.pointer(&key), a.pointer(&key), a.number(6)}), made); }, "1! | 1! 0+ | 1! | 1! | 1! | 1! 1! 0+ 90",
-     {"1 debug: binaryBlobToBase64() returned NULL."}, cipherSteps("Encrypt")},
+     {"1 debug: binaryBlobToBase64() returned NULL."}, cipherSteps("Encrypt") + Lines{"no alphabet: 1 debug: binaryBlobToBase64() returned NULL."}},
     {"aesEncryptBuffer, long", [](Odd&) { return with(aesEncryptBuffer(longText.c_str(), &made, "AES-256-ECB", &key, &key, 300), made); }, "",
-     {"90 debug: calloc() returned NULL.", "1 debug: binaryBlobToBase64() returned NULL."}, cipherSteps("Encrypt")},
+     {"90 debug: calloc() returned NULL.", "1 debug: binaryBlobToBase64() returned NULL."}, cipherSteps("Encrypt") + Lines{"no alphabet: 1 debug: binaryBlobToBase64() returned NULL."}},
     {"aesDecryptBuffer, long", [](Odd&) { return with(aesDecryptBuffer(longCipherValue.c_str(), &made, "AES-256-ECB", &key, &key, &number), made); }, "",
-     {"1 debug: base64ToBinaryBlob() returned NULL.", "90 debug: QEL_EVP_DecryptInit() failed."}, cipherSteps("Decrypt")},
+     {"1 debug: base64ToBinaryBlob() returned NULL.", "90 debug: QEL_EVP_DecryptInit() failed."}, cipherSteps("Decrypt") + Lines{"no alphabet: 1 debug: base64ToBinaryBlob() returned NULL."}},
     {"freeQelCipher, live", [](Odd&) { return initQelCipher(ctx, &context, "AES-128-ECB", &algorithm) != 0 ? "none" : shown(freeQelCipher(ctx, context)); }, "", {}, contextSteps("Cipher", "CIPHER", "cipherbyname")},
     {"freeQelDigest, live", [](Odd&) { return initQelDigest(ctx, &context, "SHA1", &algorithm) != 0 ? "none" : shown(freeQelDigest(ctx, context)); }, "", {}, contextSteps("Digest", "MD", "digestbyname")},
     {"aesDecryptBuffer", [](Odd& a) -> std::string { return with(run(aesDecryptBuffer, Arguments{a.pointer(cipherText()), a.slot(&made), a.pointer("AES-256-ECB"), a.pointer(&key), a.pointer(&key), a.pointer(&number)}), made); }, "1! | 1! 0+ | 1! | 1! | 1! | 0+",
-     {"90 debug: QEL_EVP_DecryptInit() failed."}, cipherSteps("Decrypt")},
+     {"90 debug: QEL_EVP_DecryptInit() failed."}, cipherSteps("Decrypt") + Lines{"no alphabet: 1 debug: base64ToBinaryBlob() returned NULL."}},
 };
 // clang-format on
 
@@ -452,6 +457,7 @@ Lines providerOutcomes(const Row& row) {
     add(name + "=2", replacing(slot, gives<2>));
     add(name + "=-1", replacing(slot, gives<-1>));
   }
+  add("no alphabet", replacing(pBase64, nullptr));
   return outcomes.lines();
 }
 

@@ -20,7 +20,7 @@ inline bool isStandard(const char* alphabet) noexcept {
 
 // Whether an alphabet has all its 64 characters.
 inline bool isWholeAlphabet(const char* alphabet) noexcept {
-  return isStandard(alphabet) || std::memchr(alphabet, '\0', kSymbols) == nullptr;
+  return isStandard(alphabet) || (alphabet != nullptr && std::memchr(alphabet, '\0', kSymbols) == nullptr);
 }
 
 // The size of a buffer for the bytes of a text of so many characters, and for the text of so many bytes with its NUL.
@@ -58,8 +58,9 @@ inline void encodeBytes(const unsigned char* data, size_t bytes, const char* alp
   (processor.hasSse41 ? encodeWithVectors : encodePlainly)(data, bytes, alphabet, out);
 }
 
-// Decodes a text into decodedRoom(length) bytes, of which it writes each.
+// Decodes a text into decodedRoom(length) bytes, of which it writes each. Without an alphabet nothing is clean.
 inline DecodedText decodeText(const char* text, size_t length, const char* alphabet, unsigned char* out) noexcept {
+  if (alphabet == nullptr) return {0, false};
   return (processor.hasSse41 ? decodeWithVectors : decodePlainly)(text, length, alphabet, out);
 }
 
