@@ -16,6 +16,7 @@
 #include <exception>
 #include <fstream>
 #include <iterator>
+#include <mutex>
 #include <sstream>
 #include <string>
 #include <thread>
@@ -232,7 +233,55 @@ void forksInASignalHandler() {
   while (forks < 50) CHECK(format_password(FORMAT_CRYPT, salt, nullptr, "secret", 6, value, sizeof value) == 20);
 }
 
+std::atomic<bool> isConstructing{false}, isLoading{false};
+
+void await(const std::atomic<bool>& flag) {
+  while (!flag) usleep(100);
+}
+
+// A plug-in makes values while it is loaded, and another thread is on its way to the loader in its first use.
+void constructsAPlugIn() {
+  ldtr_set_sink(
+      [](const ldtr_record* record, void*) {
+        if (record->text == nullptr || std::strncmp(record->text, "loadQelCrypto: Entering", 23) != 0) return;
+        isLoading = true;
+        await(isConstructing);
+      },
+      nullptr);
+  trcEvents = LDTR_EVENT_DEBUG;
+  std::thread user([] { useEachScheme(); });
+  await(isLoading);
+  CHECK(dlopen(LDAPPW_PLUG_IN, RTLD_NOW) != nullptr);
+  user.join();
+}
+
 #ifndef __SANITIZE_ADDRESS__  // its own allocator leaves locks taken in the child
+// A process forks with a mutex that the sink of another thread's first use waits for.
+void forksWithWhatItsSinkWants() {
+  static std::mutex mutex;
+  ldtr_set_sink(
+      [](const ldtr_record* record, void*) {
+        if (record->text == nullptr || std::strncmp(record->text, "loadQelCrypto: Entering", 23) != 0) return;
+        isLoading = true;
+        const std::lock_guard<std::mutex> lock(mutex);
+      },
+      nullptr);
+  trcEvents = LDTR_EVENT_DEBUG;
+  mutex.lock();
+  std::thread user([] { useEachScheme(); });
+  await(isLoading);
+  const pid_t child = fork();
+  mutex.unlock();
+  if (child == 0) {
+    alarm(20);
+    useEachScheme();
+    _exit(0);
+  }
+  int status = -1;
+  CHECK(waitpid(child, &status, 0) == child && status == 0);
+  user.join();
+}
+
 void expectChildrenThatWork(int count) {
   for (int i = 0; i < count; ++i) {
     const pid_t child = fork();
@@ -334,8 +383,10 @@ constexpr Host kHosts[] = {
     {"traces into itself", tracesIntoItself},
     {"throws from its sink", throwsFromItsSink},
     {"forks in a signal handler", forksInASignalHandler},
+    {"constructs a plug-in", constructsAPlugIn},
 #ifndef __SANITIZE_ADDRESS__
     {"forks", forks},
+    {"forks with what its sink wants", forksWithWhatItsSinkWants},
 #endif
     {"exits among threads", exitsAmongThreads},
     {"asks too early", asksTooEarly},
@@ -343,6 +394,13 @@ constexpr Host kHosts[] = {
 };
 
 }  // namespace
+
+// Called by plug_in.c while it is loaded.
+extern "C" __attribute__((visibility("default"))) void hostIsConstructed() {
+  isConstructing = true;
+  usleep(50000);  // the other thread comes to the loader
+  useEachScheme();
+}
 
 int main(int argc, char** argv) {
   const int times = argc > 1 ? std::atoi(argv[1]) : 20;

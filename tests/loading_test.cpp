@@ -5,6 +5,7 @@
 #include <sys/wait.h>
 
 #include <atomic>
+#include <map>
 #include <thread>
 
 #include "dsutil.h"
@@ -156,14 +157,27 @@ TEST(ProviderContext, IsOneForThreadsThatAskAtOnceAndCleanedUpAtExit) {
     for (std::thread& thread : threads) thread.join();
     for (const void* context : contexts) EXPECT_EQ(context, qelCtxGlobal);
   });
-  EXPECT_EQ(log, kCreation + kEnd);
+  std::map<std::string, long> steps;
+  std::istringstream lines(log);
+  for (std::string line; std::getline(lines, line);) ++steps[line];
+  const long made = steps["Init /toolkit"], kept = kEnd == "closed\n" ? 1 : 0;
+  const std::map<std::string, long> expected = {
+      {"Attach", made},        {"Cleanup", made - kept},      {"Init /toolkit", made},
+      {"SetValue 0 on", made}, {"SetValue 1 /toolkit", made}, {"closed", 1}};
+  EXPECT_EQ(steps, expected) << "of those that are made at once, all but one are cleaned up at once";
+  EXPECT_EQ(log.substr(log.size() - kEnd.size()), kEnd);
 }
 
-TEST(ProviderContext, IsLeftAloneAtExitAndRefusedWhileAnotherThreadWorks) {
+TEST(ProviderContext, ServesAtExitWhileAnotherThreadWorksAndNoNewOneIsMade) {
   const std::string log = staged("complete", nullptr, [] {
     std::atexit([] {  // comes after the library's own handler
       void* context = nullptr;
-      _exit(initQelCrypto(&context) == 1 && context == nullptr ? 0 : 1);
+      const bool serves = initQelCrypto(&context) == 0 && context == qelCtxGlobal;
+      const TraceCapture trace(TraceCapture::kLinesOnly);
+      qelCtxGlobal = nullptr;
+      const bool isRefused = initQelCrypto(&context) == 1;
+      const std::string line = trace.messages().empty() ? "" : trace.messages().back();
+      _exit(serves && isRefused && line == "Error - initQelCrypto: the process is exiting. rc = 1\n" ? 0 : 1);
     });
     void* context = nullptr;
     EXPECT_EQ(initQelCrypto(&context), 0);
@@ -198,7 +212,7 @@ TEST(ProviderContext, IsMadeOverOneLibraryAndReleasedOnceHoweverOftenThatIsUnloa
     EXPECT_EQ(qelCtxGlobal, context);
     EXPECT_NE(pQEL_Init, nullptr);
   });
-  EXPECT_EQ(log, kCreation + "Cleanup\nCleanup\nclosed\n");
+  EXPECT_EQ(log, kCreation + "Cleanup\nCleanup again\nclosed\n");
 }
 
 TEST(ProviderContext, UnloadingClosesANewLibraryInTheOldCell) {

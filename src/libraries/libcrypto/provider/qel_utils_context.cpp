@@ -10,7 +10,7 @@
 #include <cstdlib>
 
 #include "support/cancellation.h"
-#include "support/locks.h"
+#include "support/no_fork.h"
 #include "support/owners.h"
 #include "support/trace_scope.h"
 
@@ -74,7 +74,7 @@ constexpr ContextKind kDigest{
 // ---- The end of the process, and of the library ----
 
 bool isUnloading = false;  // dlclose has begun
-bool isExiting = false;    // exit has begun, with other threads about: they get no context any more
+bool isExiting = false;    // exit has begun, with other threads about: no context is made any more
 
 // Runs before the exit handlers of a library that is unloaded, and after those of a process that exits.
 [[gnu::destructor]] void noteUnloading() noexcept {
@@ -103,29 +103,45 @@ void* currentContext() noexcept {
   return __atomic_load_n(&qelCtxGlobal, __ATOMIC_ACQUIRE);
 }
 
-// Loads the provider and makes the context; under the lock.
-int createProviderContext(TracedCall& call) noexcept {
+// A new context, set up; null when the provider gives none. A provider too old to report its path leaves the table
+// unresolved.
+void* newContext(const char* path) noexcept {
+  const NoFork unforked;
   QelStatus status{};
-  char* loadedPath = nullptr;
-  const int rc = loadQelCrypto(&loadedPath);
-  const PlainOwner<char> path(loadedPath);
-  if (rc != LDAPPW_SUCCESS) return call.failText(rc, "Error - initQelCrypto: loadQelCrypto() failed. \n");
-  if (currentContext() != nullptr) return LDAPPW_SUCCESS;  // a trace sink of this thread was first, from inside loading
-  // A provider too old to report its path leaves the table unresolved.
-  void* context = callEntry(pQEL_Init, &status, path.get());
-  if (context == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "QEL_Init() returned NULL context.");
-  callEntry(pQEL_SetValue, context, &status, kPathValue, path.get());
+  void* context = callEntry(pQEL_Init, &status, path);
+  if (context == nullptr) return nullptr;
+  callEntry(pQEL_SetValue, context, &status, kPathValue, path);
   callEntry(pQEL_SetValue, context, &status, kStateValue, "on");
   callEntry(pQEL_Attach, context, &status);
-  std::atexit(unloadAtExit);
-  __atomic_store_n(&qelCtxGlobal, context, __ATOMIC_RELEASE);
-  return LDAPPW_SUCCESS;
+  return context;
+}
+
+// Makes the context the process's. Of several threads, or of a thread and a trace sink inside its loading, one is first;
+// the others have theirs cleaned up.
+void publishContext(void* context) noexcept {
+  const NoFork unforked;
+  void* none = nullptr;
+  if (__atomic_compare_exchange_n(&qelCtxGlobal, &none, context, false, __ATOMIC_ACQ_REL, __ATOMIC_ACQUIRE)) {
+    std::atexit(unloadAtExit);
+  } else if (none != context) {  // a provider may have one for all
+    QelStatus status{};
+    callEntry(pQEL_Cleanup, context, &status);
+  }
 }
 
 [[gnu::cold]] int firstContext(TracedCall& call) noexcept {
   const NoCancellation uncancelled;
-  const CreationLock lock;
-  return currentContext() != nullptr ? int{LDAPPW_SUCCESS} : createProviderContext(call);
+  if (__atomic_load_n(&isExiting, __ATOMIC_RELAXED)) {
+    return call.fail(LDAPPW_OPERATIONS_ERROR, "the process is exiting.");
+  }
+  char* loadedPath = nullptr;
+  const int rc = loadQelCrypto(&loadedPath);
+  const PlainOwner<char> path(loadedPath);
+  if (rc != LDAPPW_SUCCESS) return call.failText(rc, "Error - initQelCrypto: loadQelCrypto() failed. \n");
+  void* context = newContext(path.get());
+  if (context == nullptr) return call.fail(LDAPPW_OPERATIONS_ERROR, "QEL_Init() returned NULL context.");
+  publishContext(context);
+  return LDAPPW_SUCCESS;
 }
 
 // ---- Contexts for one call: a copy for each kind, in which the kind's row is known ----
@@ -174,7 +190,6 @@ extern "C" {
 int initQelCrypto(void** qelCtx) noexcept {
   TracedCall call{kInitCrypto, qelCtx};
   if (qelCtx == nullptr) return call.invalid();
-  if (__atomic_load_n(&isExiting, __ATOMIC_RELAXED)) return call.leave(LDAPPW_OPERATIONS_ERROR);
   if (currentContext() == nullptr) {
     if (const int rc = firstContext(call); rc != LDAPPW_SUCCESS) return rc;
   }

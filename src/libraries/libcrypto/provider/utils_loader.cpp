@@ -12,6 +12,7 @@
 #include "dsutil.h"
 #include "encoding_utils.h"
 #include "support/cancellation.h"
+#include "support/no_fork.h"
 #include "support/owners.h"
 
 namespace ldappw {
@@ -32,6 +33,16 @@ bool isDebugging() noexcept {
 
 void reportOverflow(size_t tried, size_t size, int line) noexcept {
   if (tried >= size && isDebugging()) PrintDebug(kTextClass, "kubstr error near %s:%d\n", __FILE__, line);
+}
+
+void* open(const char* fileName, int flags) noexcept {
+  const NoFork unforked;
+  return dlopen(fileName, flags);
+}
+
+void* find(void* library, const char* symbol) noexcept {
+  const NoFork unforked;
+  return dlsym(library, symbol);
 }
 
 bool holdsElement(char* path, const char* element) noexcept {
@@ -67,7 +78,7 @@ void** ldapLoadLib(const char* fileName, int flags) noexcept {
   const NoCancellation uncancelled;
   PlainOwner<void*> cell(static_cast<void**>(std::malloc(sizeof(void*))));
   if (!cell) return nullptr;
-  *cell = dlopen(fileName, flags == 0 ? defFlags : flags);
+  *cell = open(fileName, flags == 0 ? defFlags : flags);
   if (*cell == nullptr) {  // the loader's text is asked for once: without debugging it stays for the caller
     if (isDebugging()) PrintDebug(kLoaderClass, "dlopen failed for %s: %s\n", fileName, dlerror());
     return nullptr;
@@ -79,7 +90,10 @@ void** ldapLoadLib(const char* fileName, int flags) noexcept {
 int ldapUnloadLib(void** handle) noexcept {
   if (handle == nullptr) return LDAPPW_OTHER;
   const NoCancellation uncancelled;
-  if (*handle != nullptr) dlclose(*handle);
+  if (*handle != nullptr) {
+    const NoFork unforked;
+    dlclose(*handle);
+  }
   *handle = nullptr;
   std::free(handle);
   return LDAPPW_SUCCESS;
@@ -87,7 +101,7 @@ int ldapUnloadLib(void** handle) noexcept {
 
 void* ldapGetSymAddress(void** handle, const char* symbol) noexcept {
   if (handle == nullptr || symbol == nullptr) return nullptr;
-  void* address = dlsym(*handle, symbol);
+  void* address = find(*handle, symbol);
   if (address == nullptr && isDebugging()) PrintDebug(kLoaderClass, "dlsym failed: %s\n", dlerror());
   return address;
 }
