@@ -101,13 +101,14 @@ LDAPPW_API void unloadQelCrypto(void) LDAPPW_NOEXCEPT;
 
 /*
  * initQelCrypto hands out the process-wide provider context, which the first call creates. Many threads may call at
- * once: one context is created. The provider is unloaded at exit, or when this library is unloaded; a process that
- * exits while other threads run keeps it mapped, and those threads get no context any more.
+ * once: all get the same, and what some of them have made beside it is cleaned up. The provider is unloaded at exit, or
+ * when this library is unloaded; in a process that exits while other threads run it stays, and they go on with the
+ * context that there is.
  *
  *   qelCtx  out  the context; untouched after a failure, and any later call tries again
  *
- * Returns 0; 1 for a null argument, when the provider gives no context, or when the process is exiting; or the code of
- * loadQelCrypto.
+ * Returns 0; 1 for a null argument, when the provider gives no context, or when there is none and the process is
+ * exiting; or the code of loadQelCrypto.
  */
 LDAPPW_API int initQelCrypto(void** qelCtx) LDAPPW_NOEXCEPT;
 
