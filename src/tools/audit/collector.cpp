@@ -5,8 +5,6 @@
 
 #include "base/input.h"
 #include "base/text.h"
-#include "ldif/condition.h"
-#include "ldif/wrapping.h"
 #include "schemes/schemes.h"
 #include "schemes/values.h"
 
@@ -169,15 +167,14 @@ void Collector::finishEntry() {
 
 // current: a value to log in with.
 void Collector::judge(const Secret& value, bool current, Subtree& subtree) {
-  const StoredValue stored(value);
-  const Wrapping wrapping = wrappingOf(stored);
+  const Examined examined = examine(value);
+  const Wrapping wrapping = examined.wrapping;
   if (wrapping == Wrapping::kPadded || wrapping == Wrapping::kEncoded) {
     found(Finding::kWrapped);
     return judge(unwrapped(value, wrapping), false, subtree);
   }
-  const char* problem = stored.problem();
-  const Condition condition = conditionOf(stored, problem);
-  const Scheme& scheme = wrapping == Wrapping::kLocked ? *findScheme("locked") : stored.scheme();
+  const Condition condition = examined.condition;
+  const Scheme& scheme = wrapping == Wrapping::kLocked ? *findScheme("locked") : examined.scheme();
   const bool locked = scheme.strength == Strength::kLocked;
   const auto strength = static_cast<size_t>(scheme.strength);
   ++facts_->schemes[rowOf(scheme)];
@@ -187,10 +184,10 @@ void Collector::judge(const Secret& value, bool current, Subtree& subtree) {
   if (isFinding(scheme.strength)) found(findingOf(scheme.strength));
   if (condition == Condition::kMalformed || condition == Condition::kForeign) found(Finding::kMalformed);
   if (!locked && !rules_.accepted.empty() && !rules_.accepted[rowOf(scheme)]) found(Finding::kNotAccepted);
-  if (current && !locked && problem == nullptr) judgeValue(stored);
+  if (current && !locked && examined.problem == nullptr) judgeValue(examined);
 }
 
-void Collector::judgeValue(const StoredValue& value) {
+void Collector::judgeValue(const Examined& value) {
   const Scheme& scheme = value.scheme();
   if (scheme.open != nullptr && (!scheme.needsKey() || rules_.keys)) {
     Secret password;
@@ -205,7 +202,7 @@ void Collector::judgeValue(const StoredValue& value) {
     std::string name = scheme.name;
     name += ' ';
     Secret bytes(name);
-    bytes.append(value.payload());
+    bytes.append(value.value.payload());
     sight(rules_.markKey.of(sha256_, MarkKind::kValue, bytes.view()));
   }
   if (rules_.checkHashes && scheme.kind == Kind::kOneWay && scheme.check != nullptr) tryNames(value);
@@ -220,7 +217,7 @@ void Collector::judgePassword(std::string_view password) {
   sight(mark);
 }
 
-void Collector::tryNames(const StoredValue& value) {
+void Collector::tryNames(const Examined& value) {
   const auto matches = [&](const Secret& password) { return checkValue(value, rules_.keys, password).ok(); };
   if (std::any_of(entry_.names.begin(), entry_.names.end(), matches)) found(Finding::kName);
   if (std::any_of(rules_.tried.begin(), rules_.tried.end(), matches)) found(Finding::kKnownBad);

@@ -10,6 +10,7 @@
 #include "audit/facts.h"
 #include "audit/marks.h"
 #include "ldif/record.h"
+#include "schemes/examine.h"
 #include "schemes/key_record.h"
 
 namespace tool {
@@ -54,9 +55,9 @@ class Collector {
   void takePassword(const PasswordLine& line, std::string_view type);
   void finishEntry();
   void judge(const Secret& value, bool current, Subtree& subtree);
-  void judgeValue(const StoredValue& value);
+  void judgeValue(const Examined& value);
   void judgePassword(std::string_view password);
-  void tryNames(const StoredValue& value);
+  void tryNames(const Examined& value);
   void found(Finding finding) { entry_.findings.set(static_cast<size_t>(finding)); }
   void sight(const Mark& mark);
 

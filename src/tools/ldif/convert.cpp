@@ -17,7 +17,6 @@
 #include "base/signals.h"
 #include "base/text.h"
 #include "ldif/change_records.h"
-#include "ldif/condition.h"
 #include "ldif/key_ring.h"
 #include "password_schemes.h"
 #include "schemes/schemes.h"
@@ -113,20 +112,18 @@ void proveTarget(const Conversion& conversion) {
   Secret made;
   const Status status = makeTarget(Secret("probe"), conversion, made);
   if (!status.ok()) throw Failure(status.code, status.text);
-  if (!checkValue(StoredValue(made), none, Secret("probe")).ok() ||
-      checkValue(StoredValue(made), none, Secret("Probe")).code != kNoMatch) {
+  if (!checkValue(examine(made), none, Secret("probe")).ok() ||
+      checkValue(examine(made), none, Secret("Probe")).code != kNoMatch) {
     throw Failure(kInternal, std::string("values of ") + target.name + " do not verify");
   }
 }
 
-Outcome convertValue(const Secret& whole, const Conversion& conversion, Secret& made) {
-  const StoredValue value(whole);
+Outcome convertValue(const Examined& value, const Conversion& conversion, Secret& made) {
   const Scheme& source = value.scheme();
-  const ConditionText& condition = textOf(conditionOf(value, value.problem()));
-  const Wrapping wrapping = wrappingOf(value);
+  const ConditionText& condition = textOf(value.condition);
   if (source.kind == Kind::kUnknown) return {kUnknownTags, {kBadValue, "unknown tag; the value is kept"}};
-  if (wrapping != Wrapping::kNone) {
-    return {wrapping == Wrapping::kLocked ? kLocked : kWrapped, {condition.code, condition.text}};
+  if (value.wrapping != Wrapping::kNone) {
+    return {value.wrapping == Wrapping::kLocked ? kLocked : kWrapped, {condition.code, condition.text}};
   }
   if (source.kind == Kind::kOneWay) {
     if (&source == &conversion.target && condition.code == kSuccess) return {kDone, {}};
@@ -139,40 +136,44 @@ Outcome convertValue(const Secret& whole, const Conversion& conversion, Secret& 
   const size_t first = conversion.newKeys && &source != &conversion.target ? 1 : 0;
   Status status = conversion.keys.open(value, first, conversion.options.allowBinary, clear, used);
   const bool underNew = !source.needsKey() || (conversion.newKeys && used == 0);
-  if (status.ok() && &source == &conversion.target && underNew && !value.tag().empty()) return {kDone, {}};
+  if (status.ok() && &source == &conversion.target && underNew && !value.value.tag().empty()) return {kDone, {}};
   if (status.ok()) status = makeTarget(clear, conversion, made);
   if (!status.ok()) return {kFailed, status};
   return {conversion.target.cuts(clear.size()) ? kCut : kMade, {}};
 }
 
 // What is within a padded or encoded value takes its place, converted where it can be.
-Outcome fixValue(const Secret& whole, const Conversion& conversion, Secret& made) {
-  const Wrapping wrapping = wrappingOf(StoredValue(whole));
+Outcome fixValue(const Examined& value, const Conversion& conversion, Secret& made) {
+  const Wrapping wrapping = value.wrapping;
   if (!conversion.options.fix || wrapping == Wrapping::kNone || wrapping == Wrapping::kLocked) {
-    return convertValue(whole, conversion, made);
+    return convertValue(value, conversion, made);
   }
-  Secret inner = unwrapped(whole, wrapping);
-  const Outcome outcome = convertValue(inner, conversion, made);
+  Secret inner = unwrapped(value.value.whole(), wrapping);
+  const Outcome outcome = convertValue(examine(inner), conversion, made);
   if (outcome.total != kOneWay && outcome.total != kAsTheyAre && outcome.total != kDone) return outcome;
   made = std::move(inner);
   return {kFixed, {}};
 }
 
-Outcome outcomeOf(const RecordWalker& walker, const Conversion& conversion, Secret& made) {
+// Of a line that holds no value to convert.
+Outcome outcomeWithout(const PasswordLine& password) {
   constexpr Total kKept[] = {kMade, kUrls, kDeleted, kAuthPasswords};
-  const PasswordLine& password = walker.password();
   if (password.form == ValueForm::kBroken) return {kFailed, {kBadValue, password.problem}};
-  if (password.form != ValueForm::kBytes) return {kKept[static_cast<size_t>(password.form)], {}};
+  return {kKept[static_cast<size_t>(password.form)], {}};
+}
+
+Outcome outcomeOf(const RecordWalker& walker, const Examined& value, const Conversion& conversion, Secret& made) {
+  const PasswordLine& password = walker.password();
   if (conversion.options.changes && (walker.inChange() || walker.dn().empty() || walker.dn().front() == ':')) {
     return {kFailed, {kBadValue, "no change can be written for a change record, or without a well-formed dn"}};
   }
   if (const Secret* earlier = conversion.earlier.find(walker, password.whole(password.value))) {
     made = Secret(earlier->view().substr(password.history.size()));
     if (!password.history.empty()) made = Secret(made.view().substr(made.view().find('#') + 1));
-    const StoredValue value(made);
-    if (&value.scheme() == &conversion.target && value.problem() == nullptr) return {kResumed, {}};
+    const StoredValue taken(made);
+    if (&taken.scheme() == &conversion.target && taken.problem() == nullptr) return {kResumed, {}};
   }
-  return fixValue(password.value, conversion, made);
+  return fixValue(value, conversion, made);
 }
 
 // The values that the lines of one entry have come to. Servers refuse an entry with two equal ones.
@@ -209,9 +210,7 @@ constexpr bool isChanged(Total total) {
 
 // What the scheme's values come to, for the plan. A one-way value that is weaker than the new ones has to wait until its
 // owner presents the password.
-void countForPlan(const PasswordLine& password, Total total, const Conversion& conversion, Tally& tally) {
-  if (password.form != ValueForm::kBytes) return;
-  const Scheme& source = StoredValue(password.value).scheme();
+void countForPlan(const Scheme& source, Total total, const Conversion& conversion, Tally& tally) {
   if (source.kind == Kind::kUnknown) return;
   const bool later = total == kOneWay && source.strength < conversion.target.strength;
   if (isChanged(total)) ++tally.of(source)[kNow];
@@ -237,16 +236,18 @@ class Converter {
   void convert(const RecordWalker& walker) {
     Secret made;
     const PasswordLine& password = walker.password();
-    const Outcome outcome = outcomeOf(walker, conversion_, made);
+    std::optional<Examined> value;
+    if (password.form == ValueForm::kBytes) value = examine(password.value);
+    const Outcome outcome = value ? outcomeOf(walker, *value, conversion_, made) : outcomeWithout(password);
     const bool changed = isChanged(outcome.total);
     auto& totals = part_.tally.totals;
     ++totals[kValues];
     if (!outcome.status.ok()) part_.report(walker.lineNumber(), walker.dn(), outcome.status.code, outcome.status.text);
     const Secret whole = password.whole(changed ? made : password.value);
-    const bool repeated = password.form == ValueForm::kBytes && values_.repeats(walker, whole, changed);
+    const bool repeated = value && values_.repeats(walker, whole, changed);
     ++totals[repeated ? kDropped : outcome.total];
     if (!repeated && (outcome.total == kCut || outcome.total == kResumed)) ++totals[kMade];
-    countForPlan(password, outcome.total, conversion_, part_.tally);
+    if (value) countForPlan(value->scheme(), outcome.total, conversion_, part_.tally);
     write(walker, whole, changed, repeated);
   }
 

@@ -22,7 +22,7 @@ KeyRing::KeyRing(const std::vector<std::string>& paths) {
   }
 }
 
-Status KeyRing::open(const StoredValue& value, size_t first, bool allowBinary, Secret& clear, size_t& used) const {
+Status KeyRing::open(const Examined& value, size_t first, bool allowBinary, Secret& clear, size_t& used) const {
   used = kNoKey;
   Status refused;
   Secret bytes;

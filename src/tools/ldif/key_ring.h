@@ -24,7 +24,7 @@ class KeyRing {
   // gives text: of two keys the one that finds more padding, which a wrong one hardly ever does; with equal padding
   // neither. Keys before first are left out; used is the place of the key, or kNoKey. The key that opened the last value
   // is tried first, as it mostly opens the next one, and another takes longer to fail.
-  Status open(const StoredValue& value, size_t first, bool allowBinary, Secret& clear, size_t& used) const;
+  Status open(const Examined& value, size_t first, bool allowBinary, Secret& clear, size_t& used) const;
 
  private:
   std::vector<KeyRecord> keys_;

@@ -16,10 +16,10 @@ constexpr Status kNulByte{kBadValue, "the password holds a NUL byte"};
 constexpr Status kNoKey{kBadKey, "an AES value needs the key stash (--keys)"};
 constexpr Status kElsewhere{kBadValue, "the password is checked by another service and cannot be computed here"};
 
-Status valueProblem(const StoredValue& value, const KeyRecord& key) {
+Status problemOf(const Examined& value, const KeyRecord& key) {
   const Scheme& scheme = value.scheme();
-  if (value.whole().size() > kMaxValueBytes) return {kBadValue, "the value is too long"};
-  if (const char* problem = value.problem()) return {kBadValue, problem};
+  if (value.value.whole().size() > kMaxValueBytes) return {kBadValue, "the value is too long"};
+  if (value.problem != nullptr) return {kBadValue, value.problem};
   if (scheme.check == nullptr && scheme.strength == Strength::kExternal) return kElsewhere;
   if (scheme.check == nullptr) return {kBadValue, "a value of this scheme can only be recognised"};
   if (scheme.needsKey() && !key) return kNoKey;
@@ -69,19 +69,19 @@ Costs completeCosts(const Scheme& scheme, const Costs& chosen) {
   return costs;
 }
 
-Status openValue(const StoredValue& value, const KeyRecord& key, Secret& out) {
-  const Status problem = valueProblem(value, key);
+Status openValue(const Examined& value, const KeyRecord& key, Secret& out) {
+  const Status problem = problemOf(value, key);
   if (!problem.ok()) return problem;
   out.clear();
-  if (value.scheme().open != nullptr) return value.scheme().open(value, key, out);
+  if (value.scheme().open != nullptr) return value.scheme().open(value.value, key, out);
   return {kBadValue, "the scheme is one-way: the password cannot be recovered from the value"};
 }
 
-Status checkValue(const StoredValue& value, const KeyRecord& key, const Secret& password) {
-  const Status problem = valueProblem(value, key);
+Status checkValue(const Examined& value, const KeyRecord& key, const Secret& password) {
+  const Status problem = problemOf(value, key);
   if (!problem.ok()) return problem;
   if (password.view().find('\0') != std::string_view::npos) return kNulByte;
-  return value.scheme().check(value, key, password);
+  return value.scheme().check(value.value, key, password);
 }
 
 bool serverAccepts(const Secret& value, const KeyRecord& key, const Secret& password) noexcept {

@@ -7,6 +7,7 @@
 
 #include "base/failure.h"
 #include "base/secret.h"
+#include "schemes/examine.h"
 #include "schemes/key_record.h"
 #include "schemes/scheme.h"
 
@@ -29,11 +30,11 @@ Costs completeCosts(const Scheme& scheme, const Costs& chosen);
 
 // Turns a stored value into clear text; clear text comes back as it is. kBadValue for an unknown tag, a malformed
 // payload or a one-way scheme; kBadKey for an AES value when there is no key, or when the key does not open it.
-Status openValue(const StoredValue& value, const KeyRecord& key, Secret& out);
+Status openValue(const Examined& value, const KeyRecord& key, Secret& out);
 
 // Checks a password against a stored value: kSuccess, kNoMatch, or the problem (as of openValue, one-way schemes
 // being fine). Bytes beyond comparedBytes do not count.
-Status checkValue(const StoredValue& value, const KeyRecord& key, const Secret& password);
+Status checkValue(const Examined& value, const KeyRecord& key, const Secret& password);
 
 // The check that the server makes, which has no room for the AES value of a long password.
 bool serverAccepts(const Secret& value, const KeyRecord& key, const Secret& password) noexcept;

@@ -18,7 +18,7 @@ void tryBatch(RecordWalker& walker, const KeyRecord& keys, Tally& tally) {
   Secret clear;
   while (walker.next()) {
     if (!walker.atPassword() || walker.password().form != ValueForm::kBytes) continue;
-    const StoredValue value(walker.password().value);
+    const Examined value = examine(walker.password().value);
     if (!value.scheme().needsKey()) continue;
     ++tally.totals[kValues];
     const bool opened = openValue(value, keys, clear).ok();

@@ -3,7 +3,6 @@
 #include "ldif/passes.h"
 
 #include "base/text.h"
-#include "ldif/condition.h"
 #include "ldif/key_ring.h"
 #include "schemes/schemes.h"
 #include "schemes/values.h"
@@ -29,7 +28,7 @@ struct Verdict {
 };
 
 // Tries the keys on a reversible value. Without keys only what needs none is tried.
-Condition tryToOpen(const StoredValue& value, const KeyRing& keys, bool allowBinary, Tally::Row& counts) {
+Condition tryToOpen(const Examined& value, const KeyRing& keys, bool allowBinary, Tally::Row& counts) {
   if (!value.scheme().reversible() || (value.scheme().needsKey() && keys.empty())) return Condition::kFine;
   if (value.scheme().open == nullptr) return Condition::kFine;  // of another server, which alone has the key
   Secret clear;
@@ -44,9 +43,9 @@ Condition tryToOpen(const StoredValue& value, const KeyRing& keys, bool allowBin
   return text || (allowBinary && status.ok()) ? Condition::kFine : Condition::kNotText;
 }
 
-Verdict auditValue(const StoredValue& value, const KeyRing& keys, bool allowBinary, Tally& tally) {
-  const char* problem = value.problem();
-  Condition condition = conditionOf(value, problem);
+Verdict auditValue(const Examined& value, const KeyRing& keys, bool allowBinary, Tally& tally) {
+  const char* problem = value.problem;
+  Condition condition = value.condition;
   const Scheme& scheme = value.scheme();
   if (condition == Condition::kUnknownTag) return {scheme.name, condition, ""};
   Tally::Row& counts = tally.of(scheme);
@@ -60,7 +59,7 @@ Verdict auditValue(const StoredValue& value, const KeyRing& keys, bool allowBina
 
 Verdict auditLine(const PasswordLine& password, const KeyRing& keys, bool allowBinary, Tally& tally) {
   ++tally.totals[kValues];
-  if (password.form == ValueForm::kBytes) return auditValue(StoredValue(password.value), keys, allowBinary, tally);
+  if (password.form == ValueForm::kBytes) return auditValue(examine(password.value), keys, allowBinary, tally);
   if (password.form == ValueForm::kBroken) return {"unknown", Condition::kBroken, password.problem};
   constexpr Total kKept[] = {kValues, kUrls, kDeleted, kAuthPasswords};
   constexpr const char* kKinds[] = {"", "url", "deleted", "authPassword"};

@@ -36,7 +36,7 @@ ExitCode reveal(const Options& options) {
   Results results(options.end);
   Repeated problems(kMostOfAKind, message);
   forEachValue(*options.values, options.end, results, [&](const Secret& whole, size_t index, const std::string& place) {
-    const StoredValue value(whole);
+    const Examined value = examine(whole);
     Secret clear;
     Status status = openValue(value, key, clear);
     if (status.ok() && !options.json && !isOneLine(clear, options.end)) {

@@ -89,7 +89,7 @@ const char* tryPassword(const Scheme& scheme, const Secret& password, const KeyR
   Secret clear;
   const size_t held = scheme.cutBytes != 0 ? scheme.cutBytes : std::string_view::npos;
   const bool same =
-      openValue(StoredValue(stored), keys, clear).ok() && equalBytes(clear.view(), password.view().substr(0, held));
+      openValue(examine(stored), keys, clear).ok() && equalBytes(clear.view(), password.view().substr(0, held));
   check(same, kRecovered, "the password does not come back from the value");
   return problem;
 }
@@ -113,8 +113,12 @@ void tryScheme(const Scheme& scheme, const std::vector<Candidate>& candidates, c
 // Counts the value, and returns it when it is a clear password.
 std::optional<Candidate> candidateOf(const RecordWalker& walker, const KeyRecord& keys, Tally& tally) {
   const PasswordLine& password = walker.password();
-  const StoredValue value(password.value);
-  const Kind kind = password.form == ValueForm::kBytes ? value.scheme().kind : Kind::kUnknown;
+  if (password.form != ValueForm::kBytes) {
+    ++tally.totals[kOther];
+    return std::nullopt;
+  }
+  const Examined value = examine(password.value);
+  const Kind kind = value.scheme().kind;
   Secret opened;
   if (kind == Kind::kClear) {
     ++tally.totals[kClear];

@@ -37,9 +37,9 @@ void warnOfCut(const Scheme& scheme, const Secret& password) {
           " bytes of the password count");
 }
 
-Status checkPassword(const Options& options, const StoredValue& value) {
+Status checkPassword(const Options& options, const Examined& value) {
   const Scheme& scheme = value.scheme();
-  if (const char* problem = value.problem()) return {kBadValue, problem};
+  if (value.problem != nullptr) return {kBadValue, value.problem};
   if (scheme.needsProvider) requireProvider();
   const KeyRecord key = KeyRecord::load(scheme.needsKey() ? options.keys : "");
   if (scheme.needsKey() && !key) throw Failure(kBadKey, "an AES value needs the key stash (--keys)");
@@ -79,7 +79,7 @@ ExitCode verify(const Options& options) {
   if (!options.batch.file.empty()) return batch(options);
   refuseSecrets(options.secrets, "password");
   const Secret whole = storedValue(options);
-  const StoredValue value(whole);
+  const Examined value = examine(whole);
   if (value.scheme().isClear() && !options.clear) {
     throw Failure(kBadValue, "the value has no tag: --clear takes it as a clear password");
   }

@@ -22,7 +22,7 @@ constexpr Status kNoTab{kBadValue, "there is no tab in the record"};
 constexpr Status kUntaggedValue{kBadValue, "the value has no tag (--clear takes it as a clear password)"};
 
 Status check(const Secret& whole, const KeyRecord& key, const Secret& password, bool clear) {
-  const StoredValue value(whole);
+  const Examined value = examine(whole);
   return value.scheme().isClear() && !clear ? kUntaggedValue : checkValue(value, key, password);
 }
 

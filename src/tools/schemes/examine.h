@@ -1,15 +1,16 @@
 // SPDX-License-Identifier: Apache-2.0
-// In what condition the password values of an export are: what an audit counts and a conversion refuses.
+// Everything that a stored value shows without keys, found once and handed on: payloads are decoded for it.
 #pragma once
 
 #include <cstddef>
 
 #include "base/failure.h"
-#include "ldif/wrapping.h"
 #include "schemes/schemes.h"
+#include "schemes/wrapping.h"
 
 namespace tool {
 
+// What a conversion refuses and an audit reports.
 enum class Condition {
   kFine,
   kUnknownTag,
@@ -43,21 +44,22 @@ constexpr ConditionText kConditions[] = {
     {"encoded", "a value encoded in base64 once more", kBadValue},
 };
 constexpr size_t kConditionCount = sizeof kConditions / sizeof kConditions[0];
+static_assert(kConditionCount == static_cast<size_t>(Condition::kEncoded) + 1);
 
 constexpr const ConditionText& textOf(Condition condition) {
   return kConditions[static_cast<size_t>(condition)];
 }
 
-// As far as it shows without keys. problem is that of the value.
-inline Condition conditionOf(const StoredValue& value, const char* problem) {
-  constexpr Condition kWrapped[] = {Condition::kFine, Condition::kLocked, Condition::kPadded, Condition::kEncoded};
-  const Scheme& scheme = value.scheme();
-  if (scheme.kind == Kind::kUnknown) return Condition::kUnknownTag;
-  if (value.foreign()) return Condition::kForeign;
-  const Condition wrapped = kWrapped[static_cast<size_t>(wrappingOf(value))];
-  if (wrapped != Condition::kFine) return wrapped;
-  if (!scheme.isClear() && value.tag().empty()) return Condition::kUntagged;
-  return problem != nullptr ? Condition::kMalformed : Condition::kFine;
-}
+// Refers to the bytes of the value, like StoredValue.
+struct Examined {
+  StoredValue value;
+  const char* problem;  // of value, or null
+  Wrapping wrapping;
+  Condition condition;  // never one that only keys or lines can show: kUnopened, kNotText, kBroken
+
+  const Scheme& scheme() const noexcept { return value.scheme(); }
+};
+
+Examined examine(const Secret& value);
 
 }  // namespace tool

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ldif/wrapping.h"
+#include "schemes/wrapping.h"
 
 #include <algorithm>
 #include <iterator>
@@ -46,11 +46,11 @@ Secret decoded(std::string_view base64) {
 
 }  // namespace
 
-Wrapping wrappingOf(const StoredValue& value) {
+Wrapping wrappingOf(const StoredValue& value, const char* problem) {
   const bool clear = value.scheme().isClear();
   const std::string_view whole = value.whole().view();
   const std::string_view lockable = clear ? whole : value.payload();
-  if (isLocked(lockable, !clear) && (clear || value.problem() != nullptr)) return Wrapping::kLocked;
+  if (isLocked(lockable, !clear) && (clear || problem != nullptr)) return Wrapping::kLocked;
   const std::string_view inner = trimmed(whole);
   if (inner.size() != whole.size() && isTagged(inner)) return Wrapping::kPadded;
   if (!clear || whole.empty() || whole.front() != 'e') return Wrapping::kNone;  // base64 of "{"
