@@ -9,9 +9,18 @@
 // refused, alone and with all later ones; no provider; each of the provider's entries giving 0, 2, -1 or null; and when
 // the host has taken the base64 alphabet away. What a row does not name there has to go well, and one without such
 // memory allocates nothing.
+//
+// And what of the host's state is another after any of these calls: its environment, signal mask, locale, errno or
+// floating-point state. An operation that changes one names it. The variable in which the loading of
+// the provider says which copy it tries does not count.
+#include <cerrno>
+#include <cfenv>
 #include <climits>
+#include <clocale>
+#include <csignal>
 #include <map>
 #include <regex>
+#include <set>
 #include <tuple>
 
 #include "crypto_provider.h"
@@ -132,6 +141,7 @@ struct Row {
   std::string (*call)(Odd&);
   const char* outcomes;
   Lines memory = {}, provider = {};
+  std::string changes = {};
 };
 
 // Results of operations that serve as arguments; decoding writes to its text.
@@ -203,6 +213,33 @@ Lines contextSteps(const std::string& name, const std::string& kind, const std::
   }
   return lines;
 }
+
+// What operations must leave alone, by name; with values that nobody has by accident.
+class HostState {
+ public:
+  static void prepare() {
+    sigset_t signals;
+    sigemptyset(&signals);
+    sigaddset(&signals, SIGUSR2);
+    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+    uselocale(newlocale(LC_NUMERIC_MASK, "C.UTF-8", nullptr));
+    fesetround(FE_UPWARD);
+  }
+  static std::map<std::string, std::string> now() {
+    std::map<std::string, std::string> host = {{"errno", std::to_string(errno)}};
+    const int floating[] = {fetestexcept(FE_ALL_EXCEPT), fegetround()};
+    host["floating point"] = toHex(floating, sizeof floating);
+    sigset_t signals;
+    pthread_sigmask(SIG_BLOCK, nullptr, &signals);
+    for (int i = 1; i < SIGRTMAX; ++i) host["signal mask"] += std::to_string(sigismember(&signals, i));
+    const locale_t locale = uselocale(nullptr);
+    host["locale"] = setlocale(LC_ALL, nullptr) + toHex(&locale, sizeof locale);
+    for (char** each = environ; *each != nullptr; ++each) {
+      if (std::strncmp(*each, "TRESK_SHIPPED_QEL=", 18) != 0) host["environment"] += *each + std::string("\n");
+    }
+    return host;
+  }
+};
 
 // clang-format off
 const Row kRows[] = {
@@ -287,6 +324,7 @@ const Row kRows[] = {
      {"80 "}},
     {"ldapGetSymAddress", [](Odd& a) -> std::string { return std::to_string(run(ldapGetSymAddress, Arguments{a.pointer(qelLoadGlobal), a.pointer("QEL_Init")}) != nullptr); }, "0 | 0",
      {}, {"no provider: 0 "}},
+    {"setDefLibpath", [](Odd&) { setenv("LD_LIBRARY_PATH", "/opt/x", 1); return shown(setDefLibpath()); }, "", {}, {}, "environment"},
     {"fixupCipherSpecs", [](Odd& a) -> std::string { return (run(fixupCipherSpecs, Arguments{a.pointer(room)}), "-"); }, "-"},
     {"loadQelCrypto", [](Odd& a) -> std::string { return with(run(loadQelCrypto, Arguments{a.slot(&made)}), made); }, "1! 0+",
      {"0 debug:  Memory allocation failed ! \n", "90 Error - loadQelCrypto: Out of Memory!.\n"}, {"no provider: 1 Error - loadQelCrypto: ldapGetSymAddress(pQEL_GetStatus) failed.\n"}},
@@ -350,12 +388,31 @@ const Row kRows[] = {
 };
 // clang-format on
 
+std::set<std::string> changed;
+
+// An operation, called in a host whose state is looked at.
+std::string outcomeIn(const Row& row, Odd& arguments) {
+  return outcomeOf(row.name, [&] {
+    feclearexcept(FE_ALL_EXCEPT);
+    errno = 4711;
+    const auto before = HostState::now();
+    errno = 4711;
+    const std::string result = row.call(arguments);
+    const int error = errno;
+    const auto after = (errno = error, HostState::now());
+    for (const auto& [name, former] : before) {
+      if (after.at(name) != former) changed.insert(name);
+    }
+    return result;
+  });
+}
+
 std::string outcomesOf(const Row& row) {
   std::string outcomes;
   for (int argument = 0;; ++argument) {
     for (int variant = 0;; ++variant) {
       Odd odd(argument, variant);
-      std::string outcome = outcomeOf(row.name, [&] { return row.call(odd); });
+      std::string outcome = outcomeIn(row, odd);
       const bool isInvalid = outcome.find("Invalid parameter.") != std::string::npos;
       const bool isOdd = outcome[0] == '0' && outcome.find(" debug: ") == std::string::npos && outcome.back() != ' ';
       outcome = outcome.substr(0, outcome.find(' ')) + (isInvalid ? "!" : isOdd ? "?" : "");
@@ -404,7 +461,7 @@ Lines memoryOutcomes(const Row& row, bool andLater) {
   for (long n = 0; n < 60; ++n) {
     Odd arguments = sound();
     const AllocationWatch watch(n, andLater);
-    const std::string outcome = outcomeOf(row.name, [&] { return row.call(arguments); });
+    const std::string outcome = outcomeIn(row, arguments);
     unreleased += watch.unreleased();
     if (watch.count() <= n) break;
     outcomes.add("", outcome);
@@ -437,7 +494,7 @@ Lines providerOutcomes(const Row& row) {
   const auto add = [&](const std::string& what, const Failure& failure) {
     const AllocationWatch watch;
     failure([&] {
-      const std::string outcome = outcomeOf(row.name, [&] { return row.call(arguments); });
+      const std::string outcome = outcomeIn(row, arguments);
       if (outcome.substr(0, outcome.find(' ')) != usual) outcomes.add(what, outcome);
     });
     EXPECT_TRUE(contexts == 0 || what.find("CTX_") != std::string::npos) << what;
@@ -466,6 +523,7 @@ class Ledger : public testing::Test {
   static void SetUpTestSuite() {
     ASSERT_EQ(initQelCrypto(&ctx), 0);
     ASSERT_EQ(initQelDigest(ctx, &digestCtx, "SHA1", &sha1), 0);
+    HostState::prepare();
   }
   static void TearDownTestSuite() {
     freeQelDigest(ctx, digestCtx);
@@ -484,7 +542,11 @@ TEST_F(Ledger, HoldsForEveryOperation) {
       countingContexts()([&row] { EXPECT_EQ(providerOutcomes(row), row.provider); });
     };
     testing::internal::CaptureStdout();
+    changed.clear();
     isOfKeys(row) ? withQuickDigests()(examine) : examine();
+    std::string changes;
+    for (const std::string& each : changed) changes += (changes.empty() ? "" : ", ") + each;
+    EXPECT_EQ(changes, row.changes);
     const std::string printed = testing::internal::GetCapturedStdout();
     if (HasFailure()) std::fputs(printed.c_str(), stderr);
   }

@@ -4,6 +4,8 @@
 
 #include <malloc.h>
 
+#include <cerrno>
+
 namespace {
 
 thread_local bool watching = false;
@@ -21,6 +23,7 @@ bool fails() {
   const long number = counted++;
   const bool failed = number == failing || (laterOnesToo && number > failing);
   live += failed ? 0 : 1;
+  if (failed) errno = ENOMEM;
   return failed;
 }
 

@@ -26,7 +26,7 @@ int setSalt(TracedCall& call, void* qelCtx, const char* userCryptoSalt, AesKeyDa
     const int rc = genKeySaltVal(qelCtx, &keyData);
     return rc == LDAPPW_SUCCESS ? rc : call.fail(rc, "genKeySaltVal() failed.");
   }
-  char* copy = strdup(userCryptoSalt);
+  char* copy = newText(userCryptoSalt);
   if (copy == nullptr) return call.fail(LDAPPW_NO_MEMORY, "strdup() returned NULL.");
   release(keyData.cryptoSalt);
   keyData.cryptoSalt = {reinterpret_cast<unsigned char*>(copy), static_cast<uint32_t>(std::strlen(copy))};

@@ -34,15 +34,13 @@ uint32_t morva_rand_uint(void* qelCtx) noexcept {
 }  // namespace
 
 // The multiplier is the width plus one and the modulus the width, so that highBound itself never comes out and the
-// first two numbers come out more often than others; the precision is the x87's on every target.
+// first two numbers come out more often than others. The quotient is that of extended floating point cut to an integer:
+// where it is not whole it misses the next number by more than that rounds. A host's rounding and flags stay out of it.
 // Derivation.RandomTextsAreOfTheirRangeAndEndAtTheLastByte pins it.
 int morva_rand_range(void* qelCtx, int lowBound, int highBound) noexcept {
-  static_assert(__LDBL_MANT_DIG__ == 64, "80-bit extended floating point");
   if (highBound <= lowBound) std::abort();
   const int width = highBound - lowBound;
-  const uint64_t drawn = morva_rand_uint(qelCtx);
-  const long double scaled =
-      static_cast<long double>(drawn) * static_cast<long double>(width + 1) / static_cast<long double>(4294967295.0);
+  const uint64_t scaled = uint64_t{morva_rand_uint(qelCtx)} * (static_cast<uint64_t>(width) + 1) / UINT32_MAX;
   return static_cast<int32_t>(scaled) % width + lowBound;
 }
 

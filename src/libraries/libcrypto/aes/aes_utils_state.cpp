@@ -4,6 +4,7 @@
 
 #include <cstring>
 
+#include "support/owners.h"
 #include "support/trace_scope.h"
 
 namespace ldappw {
@@ -41,7 +42,7 @@ AesKeyData* getDirKeyDataGlobal(void) noexcept {
 int setCfgCryptoSyncGlobal(const char* cryptoSync) noexcept {
   TracedCall call{kSetCfgSync, cryptoSync};
   if (cryptoSync == nullptr) return call.leave(LDAPPW_OPERATIONS_ERROR);
-  if (g_CfgCryptoSync == nullptr) g_CfgCryptoSync = strdup(cryptoSync);
+  if (g_CfgCryptoSync == nullptr) g_CfgCryptoSync = newText(cryptoSync);
   return call.leave(g_CfgCryptoSync != nullptr ? LDAPPW_SUCCESS : LDAPPW_NO_MEMORY);
 }
 

@@ -111,7 +111,7 @@ void movePacketOut(unsigned char* record) noexcept {
 
 int wrapped(const unsigned char* record, size_t bytes, const Encoding& encoding, char** out) noexcept {
   const size_t characters = (bytes + 2) / 3 * 4;
-  char* text = static_cast<char*>(std::malloc(characters + 5));
+  char* text = newBytes<char>(characters + 5);
   if (text == nullptr) return LDAPPW_NO_MEMORY;
   text[0] = '>';
   text[1] = '1';
@@ -205,7 +205,7 @@ int decodeSimple(const char* text, Decoded& out) noexcept {
 
 // Clear text stands for itself; the NUL counts, as the encoder of texts masks it too.
 int copied(const char* text, size_t length, Decoded& out) noexcept {
-  out.data = static_cast<unsigned char*>(std::malloc(length + 1));
+  out.data = newBytes<unsigned char>(length + 1);
   if (out.data == nullptr) return LDAPPW_NO_MEMORY;
   std::memcpy(out.data, text, length + 1);
   out.length = length + 1;

@@ -33,7 +33,7 @@ using PathOperation = int (*)(char* buffer, int size);
 
 PlainOwner<char> joined(const char* first, const char* second, const char* third = "") noexcept {
   const size_t size = std::strlen(first) + std::strlen(second) + std::strlen(third) + 1;
-  PlainOwner<char> text(static_cast<char*>(std::malloc(size)));
+  PlainOwner<char> text(newBytes<char>(size));
   if (text) std::snprintf(text.get(), size, "%s%s%s", first, second, third);
   return text;
 }

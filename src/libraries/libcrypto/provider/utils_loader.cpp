@@ -76,7 +76,7 @@ int defFlags = RTLD_NOW | RTLD_GLOBAL;
 void** ldapLoadLib(const char* fileName, int flags) noexcept {
   if (fileName == nullptr) return nullptr;  // the loader would open the program itself
   const NoCancellation uncancelled;
-  PlainOwner<void*> cell(static_cast<void**>(std::malloc(sizeof(void*))));
+  PlainOwner<void*> cell(newBytes<void*>(sizeof(void*)));
   if (!cell) return nullptr;
   *cell = open(fileName, flags == 0 ? defFlags : flags);
   if (*cell == nullptr) {  // the loader's text is asked for once: without debugging it stays for the caller

@@ -123,7 +123,7 @@ char* getPassword(void) noexcept {
     if (length > 0) line.text()[length - 1] = '\0';
   }
   std::putchar('\n');
-  return strdup(line.text());
+  return newText(line.text());
 }
 
 }  // extern "C"

@@ -4,6 +4,7 @@
 // is never asked, since a host may have replaced it.
 #pragma once
 
+#include <cerrno>
 #include <cstddef>
 #include <cstdlib>
 #include <cstring>
@@ -38,14 +39,31 @@ template <class T>
 using PlainOwner = std::unique_ptr<T, Free>;
 using SecretText = std::unique_ptr<char, WipeText>;
 
-// Zeroed memory; null when it has run out. For small sizes malloc and a fill: glibc's calloc passes by the cache of the
-// thread.
+// Memory; null when it has run out, which a result tells, and not the host's errno as well.
+template <class T>
+T* newBytes(size_t bytes, void* (*allocate)(size_t) = std::malloc) noexcept {
+  const int before = errno;
+  void* data = allocate(bytes);
+  if (__builtin_expect(data == nullptr, 0)) errno = before;
+  return static_cast<T*>(data);
+}
+
+// A copy of a text.
+inline char* newText(const char* text) noexcept {
+  const size_t bytes = std::strlen(text) + 1;
+  char* copy = newBytes<char>(bytes);
+  if (copy != nullptr) std::memcpy(copy, text, bytes);
+  return copy;
+}
+
+// Zeroed memory. For small sizes malloc and a fill: glibc's calloc passes by the cache of the thread.
 template <class T>
 T* zeroedBytes(size_t bytes) noexcept {
   constexpr size_t kSmall = 1024;
-  if (bytes > kSmall) return static_cast<T*>(std::calloc(bytes, 1));
-  void* data = std::malloc(bytes == 0 ? 1 : bytes);
-  return static_cast<T*>(data == nullptr ? nullptr : std::memset(data, 0, bytes));
+  if (bytes > kSmall) return newBytes<T>(bytes, [](size_t size) { return std::calloc(size, 1); });
+  T* data = newBytes<T>(bytes == 0 ? 1 : bytes);
+  if (data != nullptr) std::memset(static_cast<void*>(data), 0, bytes);
+  return data;
 }
 
 // A zeroed array on the stack, wiped when it goes.
@@ -91,7 +109,7 @@ class Buffer {
 
  private:
   static unsigned char* allocated(size_t bytes) noexcept {
-    return kSecret ? zeroedBytes<unsigned char>(bytes) : static_cast<unsigned char*>(std::malloc(bytes));
+    return kSecret ? zeroedBytes<unsigned char>(bytes) : newBytes<unsigned char>(bytes);
   }
   bool isInline() const noexcept { return data_ == inline_; }
   size_t inlineBytes() const noexcept { return kInline <= 128 ? kInline : bytes_; }  // a known size needs no call

@@ -32,7 +32,7 @@ char* binaryBlobToString(const unsigned char* data, int length, const char* alph
   if (alphabet == nullptr || (data == nullptr && length > 0) || !isWholeAlphabet(alphabet)) return nullptr;
   const size_t bytes = length > 0 ? static_cast<size_t>(length) : 0;
   const size_t room = encodedRoom(bytes);
-  char* text = static_cast<char*>(std::malloc(room));
+  char* text = newBytes<char>(room);
   if (text == nullptr) return nullptr;
   for (size_t i = 1; i <= encodedRoom(0); ++i) text[room - i] = '\0';  // the NUL, and what is behind it
   encodeBytes(data, bytes, alphabet, text);
@@ -48,7 +48,7 @@ unsigned char* stringToBinaryBlob(const char* text, unsigned int* outLength, con
   const size_t length = std::strlen(text);
   const size_t size = decodedRoom(length);
   if (size > UINT_MAX) return nullptr;
-  auto* data = static_cast<unsigned char*>(std::malloc(size));
+  auto* data = newBytes<unsigned char>(size);
   if (data != nullptr) *outLength = static_cast<unsigned int>(decodeText(text, length, alphabet, data).bytes);
   return data;
 }
@@ -66,7 +66,7 @@ char* compactToOnlyString(const char* text, const char* alphabet) noexcept {
     return nullptr;
   }
   const size_t rest = std::strlen(from);
-  char* result = static_cast<char*>(std::malloc(rest + 1));
+  char* result = newBytes<char>(rest + 1);
   if (result == nullptr) {
     std::printf("Could not malloc buffer of size %d.\n", static_cast<int>(rest));
     return nullptr;
