@@ -314,6 +314,25 @@ void forks() {
 }
 #endif
 
+// Parent and child go on drawing, and never the same.
+void drawsAfterAFork() {
+  std::string values[2];
+  int ends[2];
+  const auto draw = [] {
+    char value[64] = "";
+    CHECK(format_password(FORMAT_SSHA, nullptr, nullptr, "secret", 6, value, sizeof value) == 62);
+    return std::string(value);
+  };
+  draw();
+  CHECK(pipe(ends) == 0);
+  const pid_t child = fork();
+  if (child == 0) _exit(write(ends[1], draw().c_str(), 62) == 62 ? 0 : 1);
+  values[0] = draw();
+  values[1].resize(62);
+  CHECK(read(ends[0], values[1].data(), 62) == 62 && waitpid(child, nullptr, 0) == child);
+  CHECK(values[0] != values[1]);
+}
+
 // The process exits while threads work. They may be refused, but nothing goes from under them.
 void exitsAmongThreads() {
   for (int round = 0; round < 30; ++round) {
@@ -388,6 +407,7 @@ constexpr Host kHosts[] = {
     {"forks", forks},
     {"forks with what its sink wants", forksWithWhatItsSinkWants},
 #endif
+    {"draws after a fork", drawsAfterAFork},
     {"exits among threads", exitsAmongThreads},
     {"asks too early", asksTooEarly},
     {"asks the loader", asksTheLoader},

@@ -11,8 +11,8 @@
 // memory allocates nothing.
 //
 // And what of the host's state is another after any of these calls: its environment, signal mask, locale, errno or
-// floating-point state. An operation that changes one names it. The variable in which the loading of
-// the provider says which copy it tries does not count.
+// floating-point state. An operation that changes one names it. The variable in which the loading of the provider says
+// which copy it tries does not count.
 #include <cerrno>
 #include <cfenv>
 #include <climits>

@@ -9,6 +9,15 @@
 
 typedef int (*Format)(int, char*, void*, const char*, int, char*, int);
 
+static int isMapped(const char* library) {
+  FILE* maps = fopen("/proc/self/maps", "r");
+  char line[4096];
+  int found = 0;
+  while (maps != NULL && fgets(line, sizeof line, maps) != NULL) found |= strstr(line, library) != NULL;
+  if (maps != NULL) fclose(maps);
+  return found;
+}
+
 int main(int argc, char** argv) {
   enum { kWithoutProvider = 2, kWithProvider = 9 }; /* {SHA} and {SSHA} */
   const int times = argc > 2 ? atoi(argv[2]) : 200;
@@ -44,6 +53,10 @@ int main(int argc, char** argv) {
     if (i == 20) before = mallinfo2().uordblks;
   }
   const size_t after = mallinfo2().uordblks;
+  if (argc > 1 && !(isMapped("libtresk7qels.so") && isMapped("libcrypto.so"))) {
+    fprintf(stderr, "the provider or OpenSSL is gone\n");
+    return 1;
+  }
   if (argc > 1 && after > before) fprintf(stderr, "%zu bytes became %zu\n", before, after);
   return argc > 1 && after <= before ? 0 : 2;
 }

@@ -215,6 +215,29 @@ TEST(ProviderContext, IsMadeOverOneLibraryAndReleasedOnceHoweverOftenThatIsUnloa
   EXPECT_EQ(log, kCreation + "Cleanup\nCleanup again\nclosed\n");
 }
 
+// A fork waits for a thread that sets the provider up, but not for ever, since that may wait for who forks.
+TEST(ProviderContext, IsMadeInAChildWhereTheParentsIsHalfDone) {
+  staged("complete", nullptr, [] {
+    setenv("STANDIN_WAITS", "goes_on", 1);
+    std::thread user([] {
+      void* context = nullptr;
+      EXPECT_EQ(initQelCrypto(&context), 0);
+    });
+    const auto log = [] { return test::fileContent(getenv("STANDIN_LOG")); };
+    while (log().empty()) usleep(100);  // of Init
+    const pid_t child = fork();
+    test::putFile("goes_on", "");
+    if (child == 0) {
+      void* context = nullptr;
+      alarm(20);
+      _exit(initQelCrypto(&context));
+    }
+    int status = -1;
+    EXPECT_TRUE(waitpid(child, &status, 0) == child && status == 0) << status;
+    user.join();
+  });
+}
+
 TEST(ProviderContext, UnloadingClosesANewLibraryInTheOldCell) {
   const std::string log = staged("complete", nullptr, [] {
     void* context = nullptr;

@@ -17,11 +17,19 @@
 #include "support.h"
 
 static bool noCopies = false;
+static int failingAttributes = 0;  // the number of the call that fails, from 1
 
 // In place of the utility library's.
 extern "C" char* ldap_getenv(const char* name) {
   const char* value = getenv(name);
   return value == nullptr || noCopies ? nullptr : strdup(value);
+}
+
+// In place of the C library's.
+extern "C" int tcsetattr(int descriptor, int actions, const termios* attributes) noexcept {
+  if (--failingAttributes == 0) return errno = EIO, -1;
+  static const auto real = reinterpret_cast<decltype(&tcsetattr)>(dlsym(RTLD_NEXT, "tcsetattr"));
+  return real(descriptor, actions, attributes);
 }
 
 namespace {
@@ -238,6 +246,21 @@ TEST_F(Terminal, DoesNotEchoWhileThePromptReads) {
   char echoed[8];
   fcntl(host, F_SETFL, O_NONBLOCK);
   EXPECT_EQ(read(host, echoed, sizeof echoed), -1) << "the terminal showed what was typed";
+}
+
+TEST_F(Terminal, EndsTheProcessWhereEchoCannotBeSwitchedOffAndSaysSoWhereItStaysOff) {
+  ASSERT_EQ(write(host, "secret\n", 7), 7);
+  for (const int failing : {1, 2}) {
+    const char* const says =
+        failing == 1 ? "^Internal error setting terminal attribute.\n$" : "^Unable to reset the display.\n$";
+    const auto run = [&] {
+      const Replaced<FILE*> standardInput(stdin, fdopen(terminal, "r"));
+      failingAttributes = failing;
+      std::exit(test::taken(getPassword()) == "secret" ? 99 : 98);
+    };
+    EXPECT_EXIT(run(), testing::ExitedWithCode(failing == 1 ? EIO : 99), says);
+    ASSERT_EQ(tcsetattr(terminal, TCSANOW, &before), 0);
+  }
 }
 
 // What a child that prompts on the terminal gets, with a signal in the middle; its exit status is the password's length.

@@ -1,14 +1,15 @@
 /* SPDX-License-Identifier: Apache-2.0 */
 /*
  * A provider for the tests of loading, which computes nothing. In the file STANDIN_LOG it reports every call and its
- * arguments while it is loaded; its directory is STANDIN_PATH, and it gives no context while STANDIN_FAILS is set.
- * STANDIN_NO_PATH and STANDIN_NO_SEED leave an entry out.
+ * arguments while it is loaded; its directory is STANDIN_PATH, and it gives no context while STANDIN_FAILS is set, nor
+ * before there is the file that STANDIN_WAITS may name. STANDIN_NO_PATH and STANDIN_NO_SEED leave an entry out.
  */
 #include <stdatomic.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
 #include <time.h>
+#include <unistd.h>
 
 #include "crypto_provider.h"
 
@@ -46,6 +47,8 @@ static int isContext(const void* ctx) {
 ENTRY void* QEL_Init(QelStatus* status, const char* path) {
   const struct timespec while_others_come = {0, 2000000};
   note(status, "Init ", path);
+  const char* until = getenv("STANDIN_WAITS");
+  while (until != NULL && access(until, F_OK) != 0) nanosleep(&while_others_come, NULL);
   nanosleep(&while_others_come, NULL);
   return getenv("STANDIN_FAILS") != NULL ? NULL : (void*)&isCleaned[atomic_fetch_add(&made, 1) % kContexts];
 }
