@@ -1,0 +1,142 @@
+// SPDX-License-Identifier: Apache-2.0
+// The command as a function in the test's process, and the tables of what it is to answer.
+#pragma once
+
+#include <gtest/gtest.h>
+#include <regex.h>
+#include <sys/mman.h>
+
+#include <algorithm>
+#include <map>
+
+#include "command_line.h"
+#include "support.h"
+
+namespace test {
+
+// Puts an anonymous file with the content in the place of a standard descriptor while it lives.
+class Redirected {
+ public:
+  explicit Redirected(int standard, const std::string& content = {})
+      : standard_(standard), before_(dup(standard)), file_(memfd_create("redirected", 0)) {
+    const auto size = static_cast<ssize_t>(content.size());
+    if (pwrite(file_, content.data(), content.size(), 0) != size || dup2(file_, standard) != standard) std::abort();
+  }
+  Redirected(const Redirected&) = delete;
+  Redirected& operator=(const Redirected&) = delete;
+  ~Redirected() {
+    dup2(before_, standard_);
+    close(before_);
+    close(file_);
+  }
+  std::string content() const { return fileContent("/proc/self/fd/" + std::to_string(file_)); }
+
+ private:
+  int standard_, before_, file_;
+};
+
+struct Ran {
+  int code;
+  std::string out, err;
+};
+
+// Runs the command. Each of its messages carries its name, and none holds what a terminal acts on, or "hunter2".
+inline Ran ran(std::vector<std::string> arguments, const std::string& input = {}) {
+  arguments.insert(arguments.begin(), "ldappw");
+  std::vector<char*> pointers;
+  for (std::string& argument : arguments) pointers.push_back(argument.data());
+  pointers.push_back(nullptr);
+  std::fflush(stdout);
+  const Redirected in(0, input);
+  const auto out = std::make_unique<Redirected>(1), err = std::make_unique<Redirected>(2);
+  const int code = tool::runCommand(static_cast<int>(arguments.size()), pointers.data());
+  Ran result{code, out->content(), err->content()};
+  std::istringstream lines(result.err);
+  for (std::string line; std::getline(lines, line);) {
+    EXPECT_TRUE(line.rfind("ldappw: ", 0) == 0 && line.find("hunter2") == std::string::npos) << line;
+    EXPECT_TRUE(std::none_of(line.begin(), line.end(), [](char c) { return iscntrl(static_cast<unsigned char>(c)); }));
+  }
+  return result;
+}
+
+// Of an extended regular expression, in which a dot is any character, newlines too.
+inline bool matches(const std::string& text, const std::string& pattern) {
+  regex_t compiled;
+  if (regcomp(&compiled, pattern.c_str(), REG_EXTENDED | REG_NOSUB) != 0) return ADD_FAILURE() << pattern, false;
+  const bool found = regexec(&compiled, text.c_str(), 0, nullptr, 0) == 0;
+  regfree(&compiled);
+  return found;
+}
+
+using Names = std::map<std::string, std::string>;
+
+// The escapes of C, and the texts of names in angle brackets.
+inline std::string expanded(const std::string& text, const Names& names) {
+  static const std::string escapes = "n\nt\tr\re\x1b\\\\";
+  std::string result;
+  for (size_t i = 0; i < text.size(); ++i) {
+    const auto name = text[i] == '<' ? names.find(text.substr(i + 1, text.find('>', i) - i - 1)) : names.end();
+    if (name != names.end()) {
+      result += name->second;
+      i += name->first.size() + 1;
+    } else if (text[i] != '\\') {
+      result += text[i];
+    } else if (text[++i] == 'x') {
+      result += fromHex(text.substr(i + 1, 2));
+      i += 2;
+    } else {
+      result += text[i] == '0' ? '\0' : escapes[escapes.find(text[i]) + 1];
+    }
+  }
+  return result;
+}
+
+// The words of a command line, split at blanks outside single quotes.
+inline std::vector<std::string> wordsOf(const std::string& line, const Names& names) {
+  std::vector<std::string> words;
+  bool within = false;
+  bool quoted = false;
+  for (const char c : line) {
+    if (c == '\'') quoted = !quoted;
+    const bool blank = c == ' ' && !quoted;
+    if (!blank && !within) words.emplace_back();
+    if (!blank && c != '\'') words.back() += c;
+    within = !blank;
+  }
+  for (std::string& word : words) word = expanded(word, names);
+  return words;
+}
+
+// A table in tests/data: a row a line, of cells between bars; those that a row leaves out are empty. A line that begins
+// with two blanks goes on with the one before; "#" begins a comment.
+using Row = std::vector<std::string>;
+inline std::vector<Row> rowsOf(const std::string& table) {
+  std::ifstream file(LDAPPW_TEST_DATA "/" + table);
+  std::vector<std::string> lines;
+  for (std::string line; std::getline(file, line);) {
+    if (line.rfind("  ", 0) == 0) {
+      lines.back() += line.substr(2);
+    } else if (line[0] != '#') {
+      lines.push_back(line);
+    }
+  }
+  std::vector<Row> rows;
+  for (const std::string& line : lines) {
+    Row cells;
+    std::istringstream rest(line);
+    for (std::string cell; std::getline(rest, cell, '|');) cells.push_back(cell);
+    cells.resize(8);
+    rows.push_back(cells);
+  }
+  return rows;
+}
+
+// For the names of parameterised tests.
+inline std::string nameOf(const testing::TestParamInfo<Row>& row) {
+  std::string name = row.param[0];
+  std::replace_if(
+      name.begin(), name.end(), [](char c) { return isalnum(static_cast<unsigned char>(c)) == 0; }, '_');
+  return name;
+}
+
+}  // namespace test
