@@ -32,10 +32,12 @@ if(LDAPPW_SANITIZE)
 endif()
 # Release files: guarded stacks, checked copies, marked jump targets, and no path of the machine that builds them. A target
 # with the property LDAPPW_GUARD_ARRAYS_ALONE has the guard in functions with arrays, not wherever an address is taken.
+# Builds of the type None are those of distributions, with flags of their own; Debian's leave the paths as they are when
+# one has a blank, and do not reach assembly.
 target_compile_options(ldappw_options INTERFACE
   $<$<CONFIG:Release>:-fstack-protector$<$<NOT:$<BOOL:$<TARGET_PROPERTY:LDAPPW_GUARD_ARRAYS_ALONE>>>:-strong>>
-  $<$<CONFIG:Release>:-fcf-protection>
-  $<$<CONFIG:Release>:-ffile-prefix-map=${PROJECT_SOURCE_DIR}=.>)
+  $<$<CONFIG:Release,None>:-fcf-protection>
+  "$<$<CONFIG:Release,None>:-ffile-prefix-map=${PROJECT_SOURCE_DIR}=.>")
 target_compile_definitions(ldappw_options INTERFACE $<$<CONFIG:Release>:_FORTIFY_SOURCE=3>)
 if(LDAPPW_COVERAGE)
   target_compile_options(ldappw_options INTERFACE --coverage -fprofile-update=atomic)
@@ -48,7 +50,7 @@ function(ldappw_compile_quickly target)
   if(LDAPPW_SANITIZE MATCHES undefined)
     target_compile_options(${target} PRIVATE -fno-sanitize=null,alignment,object-size,vptr)
   endif()
-  target_compile_options(${target} PRIVATE $<IF:$<CONFIG:Release>,-O1,-O0>)
+  target_compile_options(${target} PRIVATE $<IF:$<CONFIG:Release,None>,-O1,-O0>)
 endfunction()
 
 # The linker's part of a shared library: nothing undefined, tables read-only after start-up, and one list of exports.
