@@ -5,7 +5,9 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <climits>
 #include <csignal>
+#include <cstdlib>
 
 #include "command_line.h"
 
@@ -22,7 +24,22 @@ void occupyStandardDescriptors() {
   }
 }
 
-void prepareProcess() {
+// Starts the command again with everything bound. A shared C++ runtime looks its calls up as they come, and the loader
+// then saves the vector registers, with pieces of the secrets that were copied last, on the stack: `secrets` finds them.
+// Where the command cannot be started again it goes on as it is.
+[[maybe_unused]] void bindSharedRuntime(char** argv) {
+  char path[PATH_MAX];
+  if (getenv("LD_BIND_NOW") != nullptr) return;
+  const ssize_t length = readlink("/proc/self/exe", path, sizeof path - 1);
+  if (length < 0 || setenv("LD_BIND_NOW", "1", 1) != 0) return;
+  path[length] = '\0';
+  execv(path, argv);
+}
+
+void prepareProcess([[maybe_unused]] char** argv) {
+#ifdef LDAPPW_SHARED_RUNTIME
+  bindSharedRuntime(argv);
+#endif
   occupyStandardDescriptors();
   signal(SIGXFSZ, SIG_IGN);  // a file that grows too large is an error like a full disk
   const struct rlimit noCore {};
@@ -33,6 +50,6 @@ void prepareProcess() {
 }  // namespace tool
 
 int main(int argc, char** argv) {
-  tool::prepareProcess();
+  tool::prepareProcess(argv);
   return tool::runCommand(argc, argv);
 }
