@@ -35,6 +35,29 @@ own_temporary_folder() {
   trap 'rm -rf "$TMPDIR"' EXIT
 }
 
+# The names of the sources in a folder, each with a NUL behind it: those that are committed or will be, as they are now.
+# A tree that was unpacked from a release has no others than those and build.
+source_files() { # folder or pattern...
+  if [ -e .git ]; then
+    git ls-files -z --cached --others --exclude-standard -- "$@" | while IFS= read -r -d '' file; do
+      [ ! -e "$file" ] || printf '%s\0' "$file"
+    done
+  else
+    find "$@" -path ./build -prune -o -type f -printf '%p\0'
+  fi
+}
+
+# Writes the release file of the sources as they are: the same sources give the same file. debian/ is not in it, since
+# packages change without a release.
+write_source() { # file
+  local version
+  version=$(sed -n 's/^project(ldappw VERSION \([^ ]*\) .*/\1/p' CMakeLists.txt)
+  source_files . | grep -zv '^\(\./\)\?debian/' |
+    tar --null -T - --sort=name --format=gnu --owner=0 --group=0 --numeric-owner --mode=u=rwX,go=rX \
+      --mtime="@$(dpkg-parsechangelog -S Timestamp)" --transform="s,^\(\./\)\?,ldappw-$version/," -cf - |
+    xz -T1 -9 >"$1"
+}
+
 tests=ON # OFF in a script that neither builds tests nor has their packages
 
 # Configures a preset unless that is done: the build itself sees when a list of sources changes.
