@@ -25,14 +25,16 @@ version=$(field libldappw1 Version)
 [ "$(field libldappw-dev Depends)" = "libldappw1 (= $version)" ] || fail "the headers may meet another library"
 for package in slapd-ldappw:slapd 389-ds-ldappw:389-ds-base; do
   depends=", $(field ${package%:*} Depends)"
-  [[ "$depends" == *", libldappw1 (= $version), "* && "$depends" == *", ${package#*:} (>= "* ]] || fail "$package: $depends"
+  [[ "$depends" == *", libldappw1 (= $version), "* && "$depends" == *", ${package#*:} (>= "* ]] ||
+    fail "$package: $depends"
 done
 grep -qw libldappw1 <<<"$(field ldappw Depends)" || fail "the command does not ask for its library"
 grep -qw 'libldap[-.0-9]*' <<<"$(field ldappw Depends)" || fail "the command does not ask for what it opens"
 for package in zlib1g libzstd1; do
   grep -qw $package <<<"$(field ldappw Depends)" || fail "the command does not ask for $package"
 done
-grep -qE '\blibssl3(t64)?\b' <<<"$(field libldappw1 Depends)" || fail "the library does not ask for what its provider links"
+grep -qE '\blibssl3(t64)?\b' <<<"$(field libldappw1 Depends)" ||
+  fail "the library does not ask for what its provider links"
 for library in "$root"/usr/lib/*/*.so.*; do
   name=$(objdump -p "$library" | awk '$1 == "SONAME" { print $2 }')
   grep -q "^${name%.so.*} ${name##*.so.} libldappw1 " "$work/control/libldappw1/shlibs" ||

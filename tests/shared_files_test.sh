@@ -23,5 +23,5 @@ shared=$(comm -12 "${lists[@]}")
 while read -r file; do
   cmp "${lists[0]%.files}/$file" "${lists[1]%.files}/$file" || fail "$file differs"
 done <<<"$shared"
-[ -n "$(comm -23 "${lists[@]}")" ] && [ -n "$(comm -13 "${lists[@]}")" ] || fail "an architecture has no file of its own"
+[ -n "$(comm -23 "${lists[@]}")" ] && [ -n "$(comm -13 "${lists[@]}")" ] || fail "one of the two has none of its own"
 echo "shared_files_test: $(wc -l <<<"$shared") files are the same for both architectures"
