@@ -48,9 +48,7 @@ class Call {
     if (out_ != nullptr) *out_ = {};
     return 1;
   }
-  // The second one is for failures of OpenSSL, and adds its reason.
-  Refusal fail(QelReason why, const char* text) const noexcept { return record(owner_, out_, why, text, false); }
-  Refusal failOpenssl(QelReason why, const char* text) const noexcept { return record(owner_, out_, why, text, true); }
+  Refusal fail(QelReason why, const char* text) const noexcept { return record(owner_, out_, why, text); }
   Refusal failHandle(Handle handle) const noexcept {
     const bool isNull = owner_ == 0 || handle == 0;
     return fail(isNull ? QEL_REASON_NULL_ARGUMENT : QEL_REASON_FOREIGN_HANDLE,
@@ -61,8 +59,7 @@ class Call {
   Handle firstOf(Type type) const noexcept { return owner_ - kContextKind + kAlgorithmKind + type; }
 
   // Takes its parts one by one, so that a call that succeeds stays in registers.
-  [[gnu::cold]] static Refusal record(Handle owner, QelStatus* status, QelReason reason, const char* text,
-                                      bool isOpenssls) noexcept;
+  [[gnu::cold]] static Refusal record(Handle owner, QelStatus* status, QelReason reason, const char* text) noexcept;
 
   Handle owner_;
   QelStatus* out_;

@@ -1,7 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
 // Provider contexts, their values and failures, and their random bytes.
-#include <openssl/crypto.h>
-#include <openssl/err.h>
 #include <sched.h>
 #include <unistd.h>
 
@@ -14,14 +12,9 @@
 
 using namespace qel;
 
-Refusal Call::record(Handle owner, QelStatus* status, QelReason reason, const char* text, bool isOpenssls) noexcept {
+Refusal Call::record(Handle owner, QelStatus* status, QelReason reason, const char* text) noexcept {
   QelStatus failure{1, reason, ""};
-  // What was raised last. Earlier errors in the queue may be left from somebody else's work.
-  const unsigned long error = isOpenssls ? ERR_peek_last_error() : 0;
-  const char* why = error == 0 ? nullptr : ERR_reason_error_string(error);
-  if (ERR_GET_REASON(error) == ERR_R_MALLOC_FAILURE) failure.minRC = QEL_REASON_OUT_OF_MEMORY;
-  std::snprintf(failure.desc, sizeof failure.desc, why == nullptr ? "%s" : "%s: %s", text, why);
-  ERR_clear_error();
+  std::snprintf(failure.desc, sizeof failure.desc, "%s", text);
   if (Room* own = findContext(owner) == nullptr ? nullptr : ownRoom()) {
     own->failureOwner = owner;
     own->failure = failure;
@@ -64,22 +57,17 @@ int checkBytes(const Call& call, const void* bytes, int count) noexcept {
   return call.succeed();
 }
 
-// Fills from the system's generator, through OpenSSL's source of seeds. It keeps no state: a thread waits for no other,
-// and the child of a fork repeats nothing and finds no lock taken, as it would in OpenSSL's generators, which cost twice
-// the time. It must not be asked once the host has ended OpenSSL. A cancellation is held back: it would leave memory.
+// Straight from the kernel: there is nothing that a fork, the end of OpenSSL, a lack of memory or a cancellation could
+// break.
 int drawRandom(const Call& call, unsigned char* buffer, int count) noexcept {
+  constexpr std::size_t kMostBytes = 256;  // in one call
   if (checkBytes(call, buffer, count) == 0) return 0;
-  int cancellation = PTHREAD_CANCEL_ENABLE;
-  pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &cancellation);
   const auto bytes = static_cast<std::size_t>(count);
-  bool works = OPENSSL_init_crypto(0, nullptr) == 1;
-  for (std::size_t at = 0; works && at < bytes; at += SeedSource::kMostBytes) {
-    const std::size_t part = std::min(bytes - at, SeedSource::kMostBytes);
-    works = seedSource.generate(seedSource.state, buffer + at, part, 0, 0, nullptr, 0) == 1;
+  for (std::size_t at = 0; at < bytes; at += kMostBytes) {
+    if (getentropy(buffer + at, std::min(bytes - at, kMostBytes)) == 0) continue;
+    return call.fail(QEL_REASON_RANDOM_FAILURE, "the random generator failed");
   }
-  pthread_setcancelstate(cancellation, nullptr);
-  if (works) return 1;
-  return call.failOpenssl(QEL_REASON_RANDOM_FAILURE, "the random generator failed");
+  return 1;
 }
 
 }  // namespace
@@ -118,7 +106,7 @@ int QEL_GetValue(QEL_CTX* ctx, QelStatus* status, int id, char* buffer, int size
 QEL_CTX* QEL_Init(QelStatus* status, const char* path) noexcept {
   const Call call{nullptr, status};
   const Lock lock;
-  if (!startOpenssl()) return call.failOpenssl(QEL_REASON_NOT_AVAILABLE, "OpenSSL's default provider cannot be loaded");
+  if (!startOpenssl()) return call.fail(QEL_REASON_NOT_AVAILABLE, "OpenSSL's default provider cannot be loaded");
   Context* end = std::end(contexts);
   Context* context = std::find_if(contexts, end, [](const Context& each) { return each.isIdle(); });
   if (context == end) return call.fail(QEL_REASON_OUT_OF_MEMORY, "there are too many provider contexts");
@@ -142,7 +130,7 @@ int QEL_Cleanup(QEL_CTX* ctx, QelStatus* status) noexcept {
   Context* context = call.context();
   if (context == nullptr) return 0;
   context->retire();
-  freeOwn(false);
+  if (Room* own = ownRoom()) own->freeWorks(false);
   return call.succeed();
 }
 

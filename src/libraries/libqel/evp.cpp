@@ -4,6 +4,7 @@
 #include <openssl/evp.h>
 
 #include <climits>
+#include <cstring>
 #include <type_traits>
 #include <utility>
 
@@ -33,29 +34,25 @@ int sizeOf(const QEL_CTX* ctx, const T* handle, std::size_t Algorithm::*size) no
   return found == nullptr ? 0 : static_cast<int>(found->*size);
 }
 
-// Where the thread's own room is full, in one that no thread has.
+// Where the thread's own room is full, in a place that any thread may take.
 template <typename T>
 T* make(const QEL_CTX* ctx) noexcept {
   const Call call{ctx};
   if (call.context() == nullptr) return nullptr;
   Room* room = ownRoom();
-  const bool isFull = room != nullptr && room->idle(kTypeOf<T>) == nullptr;
-  if (isFull) room = takeRoom(kTypeOf<T>);
-  if (room == nullptr) return call.fail(QEL_REASON_OUT_OF_MEMORY, "no memory for a context");
-  Work& work = *room->idle(kTypeOf<T>);
-  work.owner.store(valueOf(ctx), std::memory_order_relaxed);
-  work.user.store(pthread_self(), std::memory_order_relaxed);
-  void* handle = work.publish();
-  if (isFull) room->leave();
-  return static_cast<T*>(handle);
+  Work* work = room == nullptr ? nullptr : room->idle(kTypeOf<T>);
+  if (room != nullptr && work == nullptr) work = room->takeShared(kTypeOf<T>);
+  if (work == nullptr) return call.fail(QEL_REASON_OUT_OF_MEMORY, "no memory for a context");
+  work->owner.store(valueOf(ctx), std::memory_order_relaxed);
+  work->user.store(pthread_self(), std::memory_order_relaxed);
+  return static_cast<T*>(work->publish());
 }
 
 template <typename T>
 int wipe(const QEL_CTX* ctx, const T* handle, bool isLast = false) noexcept {
   Work* work = Call{ctx}.work(kTypeOf<T>, handle);
   if (work == nullptr) return 0;
-  work->wipe();
-  if (isLast) work->retire();
+  isLast ? work->end() : work->wipe();
   return 1;
 }
 
@@ -65,17 +62,22 @@ Work* prepare(const Call& call, Type type, const void* handle, const void* algor
   const Algorithm* algorithm = work == nullptr ? nullptr : call.algorithm(type, algorithmHandle);
   if (algorithm == nullptr) return nullptr;
   work->phase = Phase::kFailed;
-  work->user.store(pthread_self(), std::memory_order_relaxed);
-  if (ownRoom() != nullptr && work->take(*algorithm)) return work;
+  work->held = 0;
+  Room* room = ownRoom();
+  if (room != nullptr && work->user.load(std::memory_order_relaxed) != pthread_self()) {
+    work->user.store(pthread_self(), std::memory_order_relaxed);
+    ++room->outside;
+  }
+  if (room != nullptr && work->take(*algorithm)) return work;
   return call.fail(QEL_REASON_OUT_OF_MEMORY, "no memory for the state of an algorithm");
 }
 
-// For a step: the context that an init has started, in this direction. What may follow the end of a cipher is OpenSSL's
-// to judge when the checks are not strict.
+// For a step: the context that an init has started, in this direction. When the checks are not strict, it may go on after
+// the end of a cipher that has nothing left.
 Work* running(const Call& call, Type type, const void* handle, bool encrypts = false) noexcept {
   Work* work = call.work(type, handle);
   if (work == nullptr || (work->phase == Phase::kRunning && work->encrypts == encrypts)) return work;
-  const bool isEnded = type == kCipher && work->phase == Phase::kEnded && work->encrypts == encrypts;
+  const bool isEnded = type == kCipher && work->phase == Phase::kEnded && work->held == 0 && work->encrypts == encrypts;
   const Context* context = isEnded ? call.context() : nullptr;
   if (context != nullptr && context->isLenient.load(std::memory_order_relaxed)) return work;
   return call.fail(QEL_REASON_WRONG_STATE, "the context needs an init for this step");
@@ -95,7 +97,7 @@ int start(const QEL_CTX* ctx, const void* handle, const void* algorithm, const u
   const int id = encrypts ? OSSL_FUNC_CIPHER_ENCRYPT_INIT : OSSL_FUNC_CIPHER_DECRYPT_INIT;
   auto* init = work->function<OSSL_FUNC_cipher_encrypt_init_fn>(id);
   if (init(work->state, key, cipher.keyLength, iv, cipher.ivLength, nullptr) != 1) {
-    return call.failOpenssl(QEL_REASON_CIPHER_FAILURE, "the cipher cannot be started");
+    return call.fail(QEL_REASON_CIPHER_FAILURE, "the cipher cannot be started");
   }
   work->phase = Phase::kRunning;
   work->encrypts = encrypts;
@@ -114,14 +116,37 @@ int update(const QEL_CTX* ctx, const void* handle, bool encrypts, unsigned char*
   if (inLength < 0 || room > INT_MAX) return call.fail(QEL_REASON_BAD_LENGTH, "the input length cannot be served");
   if (inLength == 0) return 1;
   if (in == nullptr) return call.fail(QEL_REASON_NULL_ARGUMENT, "the input is null");
+  const Handle ahead = valueOf(out) - valueOf(in);
+  const bool overlaps = ahead < inBytes || -ahead < inBytes + work->held;
+  if (overlaps && (ahead != 0 || work->held != 0)) {
+    return call.fail(QEL_REASON_OVERLAP, "the output would overwrite input that is still to be read");
+  }
   std::size_t written = 0;
   auto* take = work->function<OSSL_FUNC_cipher_update_fn>(OSSL_FUNC_CIPHER_UPDATE);
   if (take(work->state, out, &written, room, in, inBytes) != 1) {
     work->phase = Phase::kFailed;
-    return call.failOpenssl(QEL_REASON_CIPHER_FAILURE, "the cipher cannot take the data");
+    return call.fail(QEL_REASON_CIPHER_FAILURE, "the cipher cannot take the data");
   }
+  work->held += inBytes - written;
   *outLength = static_cast<int>(written);
   return 1;
+}
+
+// The last block of a padded text is held back until another one comes. Its padding is judged here, in the same time
+// wherever it is wrong: OpenSSL would raise an error for a wrong key.
+bool endPadded(Work& work, unsigned char* out, std::size_t* written) noexcept {
+  static constexpr unsigned char kNext[EVP_MAX_BLOCK_LENGTH] = {};
+  unsigned char last[2 * EVP_MAX_BLOCK_LENGTH] = {};
+  const std::size_t size = work.algorithm->blockSize;
+  auto* take = work.function<OSSL_FUNC_cipher_update_fn>(OSSL_FUNC_CIPHER_UPDATE);
+  if (take(work.state, last, written, sizeof last, kNext, size) != 1) return false;
+  const std::size_t padding = last[size - 1];
+  bool isWrong = padding == 0 || padding > size;
+  for (std::size_t i = 0; i < size; ++i) isWrong |= i + padding >= size && last[i] != padding;
+  *written = isWrong ? 0 : size - padding;
+  std::memcpy(out, last, *written);
+  explicit_bzero(last, sizeof last);
+  return !isWrong;
 }
 
 // The functions that end a digest and a cipher are alike.
@@ -136,9 +161,15 @@ int finish(const QEL_CTX* ctx, const T* handle, bool encrypts, unsigned char* ou
   if (!hasOutput) return call.fail(QEL_REASON_NULL_ARGUMENT, "there is no output");
   work->phase = Phase::kEnded;
   std::size_t written = 0;
-  auto* end = work->function<OSSL_FUNC_digest_final_fn>(kIsCipher ? OSSL_FUNC_CIPHER_FINAL : OSSL_FUNC_DIGEST_FINAL);
-  if (end(work->state, out, &written, work->algorithm->endSize) != 1) {
-    return call.failOpenssl(kIsCipher ? QEL_REASON_CIPHER_FAILURE : QEL_REASON_DIGEST_FAILURE, "the end failed");
+  if (kIsCipher && !work->isWhole()) return call.fail(QEL_REASON_CIPHER_FAILURE, "the last block is not whole");
+  if (kIsCipher && work->isPadded() && !encrypts) {
+    if (!endPadded(*work, out, &written)) return call.fail(QEL_REASON_CIPHER_FAILURE, "the padding is wrong");
+  } else {
+    auto* end = work->function<OSSL_FUNC_digest_final_fn>(kIsCipher ? OSSL_FUNC_CIPHER_FINAL : OSSL_FUNC_DIGEST_FINAL);
+    if (end(work->state, out, &written, work->algorithm->endSize) != 1) {
+      return call.fail(kIsCipher ? QEL_REASON_CIPHER_FAILURE : QEL_REASON_DIGEST_FAILURE, "the end failed");
+    }
+    work->held = 0;
   }
   if (outLength != nullptr) *outLength = static_cast<Length>(written);
   return 1;
@@ -173,7 +204,7 @@ int QEL_EVP_DigestInit(QEL_CTX* ctx, QEL_MD_CTX* digestCtx, const QEL_DIGEST* di
   auto* init = work->function<OSSL_FUNC_digest_init_fn>(OSSL_FUNC_DIGEST_INIT);
   const bool isStarted = std::exchange(work->isStarted, false);
   if (!isStarted && init(work->state, nullptr) != 1) {
-    return call.failOpenssl(QEL_REASON_DIGEST_FAILURE, "it cannot be started");
+    return call.fail(QEL_REASON_DIGEST_FAILURE, "it cannot be started");
   }
   work->phase = Phase::kRunning;
   return 1;
@@ -188,7 +219,7 @@ int QEL_EVP_DigestUpdate(QEL_CTX* ctx, QEL_MD_CTX* digestCtx, const void* data, 
   auto* take = work->function<OSSL_FUNC_digest_update_fn>(OSSL_FUNC_DIGEST_UPDATE);
   if (take(work->state, static_cast<const unsigned char*>(data), length) == 1) return 1;
   work->phase = Phase::kFailed;
-  return call.failOpenssl(QEL_REASON_DIGEST_FAILURE, "the digest cannot take the data");
+  return call.fail(QEL_REASON_DIGEST_FAILURE, "the digest cannot take the data");
 }
 
 int QEL_EVP_DigestFinal(QEL_CTX* ctx, QEL_MD_CTX* digestCtx, unsigned char* out, unsigned int* outLength) noexcept {
@@ -211,7 +242,7 @@ int QEL_EVP_CIPHER_CTX_set_padding(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, int 
   Work* work = call.work(kCipher, cipherCtx);
   if (work == nullptr) return 0;
   if (work->padding == (padding != 0) || work->setPadding(padding != 0)) return 1;
-  return call.failOpenssl(QEL_REASON_CIPHER_FAILURE, "the padding cannot be set");
+  return call.fail(QEL_REASON_CIPHER_FAILURE, "the padding cannot be set");
 }
 
 int QEL_EVP_EncryptInit(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, const QEL_CIPHER* cipher, const unsigned char* key,

@@ -7,15 +7,51 @@
 #include <openssl/evp.h>
 #include <openssl/params.h>
 
+#include <algorithm>
 #include <iterator>
 #include <new>
 
 namespace qel {
+namespace {
+
+// Numbers that are free, the one that came last on top. What stands on top also counts its changes, so that a thread
+// notices a number that went and came back while it looked below.
+class FreeNumbers {
+ public:
+  void push(std::size_t number) noexcept {
+    std::uint64_t top = top_.load(std::memory_order_relaxed);
+    do below_[number].store(static_cast<std::uint32_t>(top), std::memory_order_relaxed);
+    while (!replace(top, static_cast<std::uint32_t>(number + 1)));
+  }
+  bool pop(std::size_t& number) noexcept {
+    std::uint64_t top = top_.load(std::memory_order_acquire);
+    do {
+      if (static_cast<std::uint32_t>(top) == 0) return false;
+      number = static_cast<std::uint32_t>(top) - 1;
+    } while (!replace(top, below_[number].load(std::memory_order_relaxed)));
+    return true;
+  }
+
+ private:
+  bool replace(std::uint64_t& top, std::uint32_t value) noexcept {
+    const std::uint64_t next = ((top >> 32) + 1) << 32 | value;
+    return top_.compare_exchange_weak(top, next, std::memory_order_acq_rel, std::memory_order_acquire);
+  }
+
+  std::atomic<std::uint64_t> top_{0};
+  std::atomic<std::uint32_t> below_[kPlaces] = {};
+};
+
+FreeNumbers freeRooms, freePlaces[2];  // rooms that threads have left; places that any thread may take, by type
+std::atomic<std::size_t> roomCount{0};
+
+}  // namespace
 
 // The functions that make a state are alike for both types, and so are those that release one.
 bool Work::take(const Algorithm& wanted) noexcept {
   if (algorithm == &wanted) return true;
   release();
+  const ErrorMark mark;
   algorithm = &wanted;
   state = function<OSSL_FUNC_digest_newctx_fn>(OSSL_FUNC_DIGEST_NEWCTX)(providerContext);
   if (state == nullptr) algorithm = nullptr;
@@ -46,6 +82,13 @@ void Work::wipe() noexcept {
   phase = Phase::kFresh;
   padding = true;
   keyLength = 0;
+  held = 0;
+}
+
+void Work::end() noexcept {
+  wipe();
+  retire();
+  if (isShared) freePlaces[type()].push(place());
 }
 
 // With padding on, the last block of a ciphertext is held back, and so lies where all held blocks did.
@@ -68,12 +111,12 @@ namespace {
 
 void endThread(void* value) noexcept {
   auto* room = static_cast<Room*>(value);
-  freeOwn(true);
+  room->freeWorks(true);
   for (Work& work : room->works) {
     if (work.isIdle()) work.release();
   }
   room->failureOwner = 0;
-  room->leave();
+  freeRooms.push(room->number());
 }
 
 // Reads as never set when there are no keys left: then no thread has a room.
@@ -82,18 +125,37 @@ const pthread_key_t roomKey = [] {
   return pthread_key_create(&key, endThread) == 0 ? key : static_cast<pthread_key_t>(-1);
 }();
 
-// The room with this number, which is made when it is not there; null when memory has run out.
-Room* roomAt(std::size_t number) noexcept {
-  Room* room = rooms[number].load(std::memory_order_acquire);
-  void* memory = room == nullptr ? OPENSSL_zalloc(sizeof(Room)) : nullptr;
-  if (memory == nullptr) return room;
-  Room* made = new (memory) Room;
-  for (std::size_t i = 0; i < std::size(made->works); ++i) {
-    made->works[i].next = firstHandle(kWorkKind + i / Room::kWorks, number * Room::kWorks + i % Room::kWorks);
+// Null when memory or the places have run out.
+Room* addRoom() noexcept {
+  const ErrorMark mark;
+  void* memory = roomCount.load() < std::size(rooms) ? OPENSSL_zalloc(sizeof(Room)) : nullptr;
+  if (memory == nullptr) return nullptr;
+  const std::size_t number = roomCount.fetch_add(1);
+  if (number >= std::size(rooms)) return OPENSSL_free(memory), nullptr;
+  Room* room = new (memory) Room;
+  for (std::size_t i = 0; i < std::size(room->works); ++i) {
+    room->works[i].next = firstHandle(kWorkKind + i / Room::kWorks, number * Room::kWorks + i % Room::kWorks);
   }
-  if (rooms[number].compare_exchange_strong(room, made, std::memory_order_acq_rel)) return made;
-  OPENSSL_free(made);
+  rooms[number].store(room, std::memory_order_release);
   return room;
+}
+
+bool shareRoom() noexcept {
+  Room* room = addRoom();
+  if (room == nullptr) return false;
+  for (Work& work : room->works) {
+    work.isShared = true;
+    freePlaces[work.type()].push(work.place());
+  }
+  return true;
+}
+
+void freeWorksIn(Room& room, bool all) noexcept {
+  for (Work& work : room.works) {
+    const bool isOwn = !work.isIdle() && work.user.load(std::memory_order_relaxed) == pthread_self();
+    if (!isOwn || (!all && findContext(work.owner.load(std::memory_order_relaxed)) != nullptr)) continue;
+    work.end();
+  }
 }
 
 }  // namespace
@@ -105,36 +167,36 @@ Work* Room::idle(Type type) noexcept {
   return nullptr;
 }
 
-Room* takeRoom(Type type) noexcept {
-  freeOwn(false);
-  for (std::size_t number = 0; number < std::size(rooms); ++number) {
-    Room* room = roomAt(number);
-    if (room == nullptr) return nullptr;
-    if (room->isTaken.exchange(true, std::memory_order_acq_rel)) continue;
-    if (room->idle(type) != nullptr) return room;
-    room->leave();
+// Looking through all rooms takes the longer the more there are, and is done the less often.
+Work* Room::takeShared(Type type) noexcept {
+  freeWorksIn(*this, false);
+  if (Work* work = idle(type)) return work;
+  if (++outside > roomCount.load(std::memory_order_relaxed)) freeWorks(false);
+  std::size_t place = 0;
+  while (!freePlaces[type].pop(place)) {
+    if (!shareRoom()) return nullptr;
   }
-  return nullptr;
+  return &rooms[place / kWorks].load(std::memory_order_acquire)->works[type * kWorks + place % kWorks];
 }
 
 Room* ownRoom() noexcept {
   auto* room = static_cast<Room*>(pthread_getspecific(roomKey));
-  if (room != nullptr || (room = takeRoom(kDigest)) == nullptr || pthread_setspecific(roomKey, room) == 0) return room;
-  room->leave();
+  if (room != nullptr) return room;
+  std::size_t number = 0;
+  room = freeRooms.pop(number) ? rooms[number].load(std::memory_order_acquire) : addRoom();
+  if (room == nullptr || pthread_setspecific(roomKey, room) == 0) return room;
+  freeRooms.push(room->number());
   return nullptr;
 }
 
-void freeOwn(bool all) noexcept {
-  for (const std::atomic<Room*>& each : rooms) {
-    Room* room = each.load(std::memory_order_acquire);
-    if (room == nullptr) return;
-    for (Work& work : room->works) {
-      const bool isOwn = !work.isIdle() && work.user.load(std::memory_order_relaxed) == pthread_self();
-      if (!isOwn || (!all && findContext(work.owner.load(std::memory_order_relaxed)) != nullptr)) continue;
-      work.wipe();
-      work.retire();
-    }
+void Room::freeWorks(bool all) noexcept {
+  freeWorksIn(*this, all);
+  if (outside == 0) return;
+  for (std::size_t number = 0; number < std::min(roomCount.load(), std::size(rooms)); ++number) {
+    Room* room = rooms[number].load(std::memory_order_acquire);
+    if (room != nullptr) freeWorksIn(*room, all);
   }
+  outside = all ? 0 : 1;
 }
 
 }  // namespace qel

@@ -5,6 +5,7 @@
 #pragma once
 
 #include <openssl/core_dispatch.h>
+#include <openssl/err.h>
 #include <openssl/types.h>
 #include <pthread.h>
 
@@ -75,13 +76,13 @@ inline Algorithm algorithms[2][255];  // by type; twice as many as there are
 inline std::size_t algorithmCounts[2];
 inline void* providerContext;  // for the making of states
 
-// OpenSSL's source of seeds, as its provider serves it. Fills so many bytes at the most.
-struct SeedSource {
-  static constexpr std::size_t kMostBytes = 128;
-  void* state;
-  OSSL_FUNC_rand_generate_fn* generate;
+// Takes what OpenSSL raises while it lives out of the thread's queue again, in which the host may have something. It costs
+// a quarter of an AES value, and so stands where memory is asked for; the steps of a digest or cipher have checked before
+// they call what OpenSSL would refuse.
+struct ErrorMark {
+  ErrorMark() noexcept { ERR_set_mark(); }
+  ~ErrorMark() { ERR_pop_to_mark(); }
 };
-inline SeedSource seedSource;
 
 // Starts OpenSSL and reads the algorithms, unless that is done. One thread at a time; may be tried again.
 bool startOpenssl() noexcept;
@@ -100,6 +101,15 @@ struct Work : Entry {
   bool overwrite() noexcept;
   void release() noexcept;
   void wipe() noexcept;
+  void end() noexcept;  // with a wipe
+
+  // Of a cipher. At the end of a text that is one, a padded decryption has a block left, and others have none.
+  bool isPadded() const noexcept { return padding && algorithm->blockSize > 1; }
+  bool isWhole() const noexcept {
+    return (isPadded() && encrypts) || (held % algorithm->blockSize == 0 && (held != 0 || !isPadded()));
+  }
+  Type type() const noexcept { return static_cast<Type>(next % (Handle{1} << kKindBits) - kWorkKind); }
+  std::size_t place() const noexcept { return (next >> kKindBits) % kPlaces; }
 
   template <typename Signature>
   Signature* function(int id) const noexcept {
@@ -114,18 +124,26 @@ struct Work : Entry {
   bool encrypts = false;
   bool isStarted = false;  // a digest's state, by the wipe: the next digest has that start, a twentieth of its time
   bool padding = true;
-  int keyLength = 0;  // what the caller stated, or 0
+  bool isShared = false;  // its place is any thread's to take
+  int keyLength = 0;      // what the caller stated, or 0
+  std::size_t held = 0;   // bytes that a cipher has taken and not given out
 };
 
-// What a thread has here: places for contexts, and its last failure. A room passes on to a later thread.
+// What a thread has here: places for contexts, and its last failure. A room passes on to a later thread. Where a thread
+// wants more places, it takes some of rooms that no thread has.
 struct Room {
   static constexpr std::size_t kWorks = 8;
 
   Work* idle(Type type) noexcept;  // null when all are live
-  void leave() noexcept { isTaken.store(false, std::memory_order_release); }
+  [[gnu::cold]] Work* takeShared(Type type) noexcept;
+  std::size_t number() const noexcept { return works[0].place() / kWorks; }
+
+  // Frees the contexts of the calling thread, whose own room this is: those whose provider context is gone, or all.
+  void freeWorks(bool all) noexcept;
 
   Work works[2 * kWorks];  // digest contexts, then cipher contexts
-  std::atomic<bool> isTaken{false};
+  std::size_t outside =
+      0;  // how often the thread has taken a place, or another one's context, since it last saw to them
   Handle failureOwner = 0;
   QelStatus failure = {};
 };
@@ -133,12 +151,8 @@ struct Room {
 inline Context contexts[kPlaces >> kIndexBits];
 inline std::atomic<Room*> rooms[kPlaces / Room::kWorks];
 
-// The calling thread's room, and one with an idle place that no thread has. Null when memory has run out.
+// The calling thread's room; null when memory has run out.
 Room* ownRoom() noexcept;
-[[gnu::cold]] Room* takeRoom(Type type) noexcept;
-
-// Frees the contexts of the calling thread whose provider context is gone, or all of them.
-void freeOwn(bool all) noexcept;
 
 // What a live handle leads to; null for any other number.
 inline Context* findContext(Handle handle) noexcept {

@@ -7,6 +7,7 @@
 #include <openssl/params.h>
 #include <openssl/provider.h>
 
+#include <algorithm>
 #include <cstring>
 #include <iterator>
 
@@ -20,33 +21,35 @@ struct Usual {
 } usual[] = {{kDigest, "SHA1"},        {kDigest, "md5"},         {kDigest, "SHA256"},
              {kCipher, "AES-256-ECB"}, {kCipher, "AES-192-ECB"}, {kCipher, "AES-128-ECB"}};
 
-// As OpenSSL compares names.
+// As OpenSSL compares names, whose function for it the first releases do not have, and the host's language changes nothing.
+bool isSame(char a, char b) noexcept {
+  const auto lower = [](char c) { return c >= 'A' && c <= 'Z' ? c - 'A' + 'a' : c; };
+  return lower(a) == lower(b);
+}
+
 bool isAmong(const char* names, const char* name) noexcept {
-  const std::size_t length = std::strlen(name);
+  const char* const nameEnd = name + std::strlen(name);
   for (const char* end;; names = end + 1) {
     end = strchrnul(names, ':');
-    if (static_cast<std::size_t>(end - names) == length && OPENSSL_strncasecmp(names, name, length) == 0) return true;
+    if (std::equal(names, end, name, nameEnd, isSame)) return true;
     if (*end == '\0') return false;
   }
 }
 
-void readFunctions(const OSSL_DISPATCH* dispatch, Algorithm& algorithm) noexcept {
-  for (; dispatch->function_id != 0; ++dispatch) {
-    if (dispatch->function_id < kFunctions) algorithm.functions[dispatch->function_id] = dispatch->function;
-  }
-}
-
-// False for one that is not served. A cipher is when it gives back what it took, through a start, updates of any size
+// False for one that is not served. A digest is when it has one size. A cipher is when it gives back what it took, through a start, updates of any size
 // and an end: authenticated ones do not, nor those that wrap keys or take their data at once.
 bool read(const OSSL_ALGORITHM& source, Type type, Algorithm& algorithm) noexcept {
   algorithm = {};
   algorithm.type = type;
   algorithm.names = source.algorithm_names;
-  readFunctions(source.implementation, algorithm);
+  for (const OSSL_DISPATCH* each = source.implementation; each->function_id != 0; ++each) {
+    if (each->function_id < kFunctions) algorithm.functions[each->function_id] = each->function;
+  }
   unsigned mode = EVP_CIPH_STREAM_CIPHER;
-  int isAuthenticated = 0, takesAllAtOnce = 0;
+  int hasAnySize = 0, isAuthenticated = 0, takesAllAtOnce = 0;
   OSSL_PARAM wanted[] = {OSSL_PARAM_construct_size_t(OSSL_DIGEST_PARAM_SIZE, &algorithm.size),
                          OSSL_PARAM_construct_size_t(OSSL_DIGEST_PARAM_BLOCK_SIZE, &algorithm.blockSize),
+                         OSSL_PARAM_construct_int(OSSL_DIGEST_PARAM_XOF, &hasAnySize),
                          OSSL_PARAM_construct_size_t(OSSL_CIPHER_PARAM_KEYLEN, &algorithm.keyLength),
                          OSSL_PARAM_construct_size_t(OSSL_CIPHER_PARAM_IVLEN, &algorithm.ivLength),
                          OSSL_PARAM_construct_uint(OSSL_CIPHER_PARAM_MODE, &mode),
@@ -60,9 +63,11 @@ bool read(const OSSL_ALGORITHM& source, Type type, Algorithm& algorithm) noexcep
   // larger ones leave the data where it was.
   algorithm.isOverwritten = type == kCipher ? algorithm.blockSize > 1 : algorithm.blockSize == 64;
   algorithm.endSize = type == kCipher && algorithm.blockSize > 1 ? algorithm.blockSize : algorithm.size;
+  if (type == kDigest) return algorithm.size != 0 && hasAnySize == 0;
   return mode <= EVP_CIPH_CTR_MODE && isAuthenticated == 0 && takesAllAtOnce == 0;
 }
 
+// The list is not given back: names and functions are used as long as the process lives.
 void readAll(OSSL_PROVIDER* provider, Type type, int operation) noexcept {
   int mustNotBeKept = 0;
   Algorithm* next = algorithms[type];
@@ -70,33 +75,7 @@ void readAll(OSSL_PROVIDER* provider, Type type, int operation) noexcept {
   for (const OSSL_ALGORITHM* each = all; each != nullptr && each->algorithm_names != nullptr; ++each) {
     if (next != std::end(algorithms[type]) && read(*each, type, *next)) ++next;
   }
-  OSSL_PROVIDER_unquery_operation(provider, operation, all);
   algorithmCounts[type] = static_cast<std::size_t>(next - algorithms[type]);
-}
-
-template <typename Function>
-Function* function(const Algorithm& algorithm, int id) noexcept {
-  return reinterpret_cast<Function*>(algorithm.functions[id]);
-}
-
-// Asking the provider spares the fetch by name, for which OpenSSL lists all names that it knows: half of its start.
-bool startSeedSource(OSSL_PROVIDER* provider) noexcept {
-  int mustNotBeKept = 0;
-  Algorithm source{};
-  const OSSL_ALGORITHM* all = OSSL_PROVIDER_query_operation(provider, OSSL_OP_RAND, &mustNotBeKept);
-  for (const OSSL_ALGORITHM* each = all; each != nullptr && each->algorithm_names != nullptr; ++each) {
-    if (isAmong(each->algorithm_names, "SEED-SRC")) readFunctions(each->implementation, source);
-  }
-  OSSL_PROVIDER_unquery_operation(provider, OSSL_OP_RAND, all);
-  auto* make = function<OSSL_FUNC_rand_newctx_fn>(source, OSSL_FUNC_RAND_NEWCTX);
-  auto* start = function<OSSL_FUNC_rand_instantiate_fn>(source, OSSL_FUNC_RAND_INSTANTIATE);
-  seedSource.generate = function<OSSL_FUNC_rand_generate_fn>(source, OSSL_FUNC_RAND_GENERATE);
-  if (make == nullptr || start == nullptr || seedSource.generate == nullptr) return false;
-  seedSource.state = make(OSSL_PROVIDER_get0_provider_ctx(provider), nullptr, nullptr);
-  if (seedSource.state == nullptr) return false;
-  if (start(seedSource.state, 0, 0, nullptr, 0, nullptr) == 1) return true;
-  function<OSSL_FUNC_rand_freectx_fn>(source, OSSL_FUNC_RAND_FREECTX)(seedSource.state);
-  return false;
 }
 
 }  // namespace
@@ -106,9 +85,10 @@ bool startSeedSource(OSSL_PROVIDER* provider) noexcept {
 bool startOpenssl() noexcept {
   if (providerContext != nullptr) return true;
   if (OPENSSL_init_crypto(OPENSSL_INIT_NO_ATEXIT, nullptr) != 1) return false;
+  const ErrorMark mark;
   OSSL_LIB_CTX* library = OSSL_LIB_CTX_new();
   OSSL_PROVIDER* provider = library == nullptr ? nullptr : OSSL_PROVIDER_load(library, "default");
-  if (provider == nullptr || !startSeedSource(provider)) return OSSL_LIB_CTX_free(library), false;
+  if (provider == nullptr) return OSSL_LIB_CTX_free(library), false;
   readAll(provider, kDigest, OSSL_OP_DIGEST);
   readAll(provider, kCipher, OSSL_OP_CIPHER);
   for (Usual& each : usual) each.algorithm = findAlgorithm(each.type, each.spelling);

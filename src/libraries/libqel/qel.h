@@ -10,18 +10,17 @@
  *     token does not come back to life when its place is used again (with 32-bit pointers: not before 4096 uses).
  *  3. A thread remembers its last failure, unless the provider context was not valid; a success leaves it as it is. An
  *     entry with a QelStatus argument also fills that record, which may be null: with the failure, or with zeros.
- *     OpenSSL's error queue of the thread is empty after a failure.
+ *     OpenSSL's error queue of the thread is as it was before, with what the host has in it.
  *  4. A provider context and its algorithms may be used from many threads at once. A digest or cipher context belongs
  *     to one thread at a time, the one that made or started it last, and is released with a wipe when that ends.
  *  5. Lengths and sizes are in bytes; a negative one is a failure. A null buffer with a length of 0 is fine unless the
  *     entry says otherwise. Texts are NUL-terminated.
  *  6. The library stays in the process once it is loaded, as libcrypto does. So a thread that is inside when the host
  *     closes it or exits comes to its end there, and one that comes after QEL_Cleanup is refused. Where this library
- *     started OpenSSL, OpenSSL works until the process ends. Where the host did, its exit handler may end OpenSSL:
- *     random bytes are refused from then on, and a thread that is drawing some is the host's to see to; digests and
- *     ciphers go on.
+ *     started OpenSSL, OpenSSL works until the process ends. Where the host did, its exit handler may end OpenSSL; what
+ *     there is in a provider context goes on.
  *  7. Memory that runs out is a failure, and the call may be tried again. But OpenSSL starts once in a process: where
- *     memory ran out in that, QEL_Init or the entries for random bytes fail for good.
+ *     memory ran out in that, QEL_Init fails for good.
  *  8. The child of a fork may go on with what the thread had that forked.
  */
 #pragma once
@@ -46,7 +45,7 @@ typedef struct QelDigestContextHandle QEL_MD_CTX;
 typedef struct QelStatus {
   int32_t majRC;  /* 0 is success, 1 is failure */
   int32_t minRC;  /* a QelReason; 0 after a success */
-  char desc[260]; /* the failure in words, with OpenSSL's reason where there is one; empty after a success */
+  char desc[260]; /* the failure in words; empty after a success */
 } QelStatus;
 static_assert(sizeof(QelStatus) == 268, "the layout is exchanged with callers");
 
@@ -65,13 +64,14 @@ enum QelReason {
   QEL_REASON_CIPHER_FAILURE = 11, /* wrong padding and incomplete blocks among them */
   QEL_REASON_RANDOM_FAILURE = 12,
   QEL_REASON_NOT_AVAILABLE = 13, /* OpenSSL or its default provider cannot be used */
+  QEL_REASON_OVERLAP = 14,       /* of an output with input that is still to be read */
   QEL_REASON_OUT_OF_MEMORY = 15  /* also: 512 provider contexts, or 131072 digest or cipher contexts, are live */
 };
 
 /* The ids of QEL_SetValue and QEL_GetValue. */
 enum QelValueId {
   QEL_VALUE_STRICT = 0,   /* "on" (at first) or "off": whether a cipher context needs a new init after its final step.
-                             With "off" OpenSSL decides. Every other order check always holds. */
+                             With "off" one that has nothing left goes on. Every other order check always holds. */
   QEL_VALUE_LOAD_PATH = 1 /* the path given to QEL_Init or set since; up to 4095 bytes */
 };
 
@@ -110,7 +110,7 @@ int QEL_Cleanup(QEL_CTX* ctx, QelStatus* status) QEL_NOEXCEPT;
 
 /* Find an algorithm by any name that OpenSSL's default provider has for it, in either case ("SHA1", "sha-1",
  * "AES-128-ECB"). Every name of it gives the same handle, which is valid until QEL_Cleanup and never released by
- * itself. Ciphers are those that work in pieces of any size and give everything back with padding on; the others are
+ * itself. Digests are those of one size, so SHAKE and KECCAK-KMAC are not found. Ciphers are those that work in pieces of any size and give everything back with padding on; the others are
  * not found: authenticated ones (GCM, CCM, OCB, SIV, Poly1305, CBC with HMAC), key wraps, XTS, and CBC-CTS. */
 const QEL_CIPHER* QEL_EVP_get_cipherbyname(QEL_CTX* ctx, const char* name) QEL_NOEXCEPT;
 const QEL_DIGEST* QEL_EVP_get_digestbyname(QEL_CTX* ctx, const char* name) QEL_NOEXCEPT;
@@ -173,7 +173,9 @@ int QEL_EVP_DecryptInit(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, const QEL_CIPHE
 /*
  * Work on inLength more bytes, in the direction of the last init only.
  *
- *   out        out  room for inLength bytes and one block; not null; may be equal to in
+ *   out        out  room for inLength bytes and one block; not null. It may be equal to in while the context holds
+ *                   nothing back, which it does of a block that is not whole, and of the last block of a padded
+ *                   decryption; any other overlap is refused.
  *   outLength  out  the number of bytes written, 0 after a failure; not null
  */
 int QEL_EVP_EncryptUpdate(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char* out, int* outLength,
