@@ -63,12 +63,8 @@ Work* prepare(const Call& call, Type type, const void* handle, const void* algor
   if (algorithm == nullptr) return nullptr;
   work->phase = Phase::kFailed;
   work->held = 0;
-  Room* room = ownRoom();
-  if (room != nullptr && work->user.load(std::memory_order_relaxed) != pthread_self()) {
-    work->user.store(pthread_self(), std::memory_order_relaxed);
-    ++room->outside;
-  }
-  if (room != nullptr && work->take(*algorithm)) return work;
+  const bool isOwn = work->user.load(std::memory_order_relaxed) == pthread_self() || work->takeOver();
+  if (isOwn && work->take(*algorithm)) return work;
   return call.fail(QEL_REASON_OUT_OF_MEMORY, "no memory for the state of an algorithm");
 }
 
@@ -132,20 +128,18 @@ int update(const QEL_CTX* ctx, const void* handle, bool encrypts, unsigned char*
   return 1;
 }
 
-// The last block of a padded text is held back until another one comes. Its padding is judged here, in the same time
-// wherever it is wrong: OpenSSL would raise an error for a wrong key.
+// The last block of a padded text is held back until another one comes. Its padding is judged here, since OpenSSL would
+// raise an error for a wrong key.
 bool endPadded(Work& work, unsigned char* out, std::size_t* written) noexcept {
   static constexpr unsigned char kNext[EVP_MAX_BLOCK_LENGTH] = {};
-  unsigned char last[2 * EVP_MAX_BLOCK_LENGTH] = {};
   const std::size_t size = work.algorithm->blockSize;
   auto* take = work.function<OSSL_FUNC_cipher_update_fn>(OSSL_FUNC_CIPHER_UPDATE);
-  if (take(work.state, last, written, sizeof last, kNext, size) != 1) return false;
-  const std::size_t padding = last[size - 1];
+  if (take(work.state, out, written, size, kNext, size) != 1) return false;
+  const std::size_t padding = out[size - 1];
   bool isWrong = padding == 0 || padding > size;
-  for (std::size_t i = 0; i < size; ++i) isWrong |= i + padding >= size && last[i] != padding;
   *written = isWrong ? 0 : size - padding;
-  std::memcpy(out, last, *written);
-  explicit_bzero(last, sizeof last);
+  for (std::size_t i = *written; i < size; ++i) isWrong |= std::exchange(out[i], '\0') != padding;
+  if (isWrong) std::memset(out, 0, size);
   return !isWrong;
 }
 
@@ -169,7 +163,7 @@ int finish(const QEL_CTX* ctx, const T* handle, bool encrypts, unsigned char* ou
     if (end(work->state, out, &written, work->algorithm->endSize) != 1) {
       return call.fail(kIsCipher ? QEL_REASON_CIPHER_FAILURE : QEL_REASON_DIGEST_FAILURE, "the end failed");
     }
-    work->held = 0;
+    if (kIsCipher) work->held = 0;
   }
   if (outLength != nullptr) *outLength = static_cast<Length>(written);
   return 1;

@@ -58,6 +58,14 @@ bool Work::take(const Algorithm& wanted) noexcept {
   return state != nullptr && (padding || setPadding(false));
 }
 
+bool Work::takeOver() noexcept {
+  Room* room = ownRoom();
+  if (room == nullptr) return false;
+  user.store(pthread_self(), std::memory_order_relaxed);
+  ++room->outside;
+  return true;
+}
+
 void Work::release() noexcept {
   if (state == nullptr) return;
   const int id = algorithm->type == kDigest ? OSSL_FUNC_DIGEST_FREECTX : OSSL_FUNC_CIPHER_FREECTX;

@@ -97,6 +97,7 @@ enum class Phase { kFresh, kFailed, kEnded, kRunning };  // the first two need a
 // zeros; or it is released, which the algorithms do with a wipe.
 struct Work : Entry {
   bool take(const Algorithm& wanted) noexcept;  // a state; false when memory has run out
+  [[gnu::cold]] bool takeOver() noexcept;       // by the calling thread; likewise
   bool setPadding(bool on) noexcept;
   bool overwrite() noexcept;
   void release() noexcept;
@@ -105,9 +106,7 @@ struct Work : Entry {
 
   // Of a cipher. At the end of a text that is one, a padded decryption has a block left, and others have none.
   bool isPadded() const noexcept { return padding && algorithm->blockSize > 1; }
-  bool isWhole() const noexcept {
-    return (isPadded() && encrypts) || (held % algorithm->blockSize == 0 && (held != 0 || !isPadded()));
-  }
+  bool isWhole() const noexcept { return held == algorithm->blockSize || (isPadded() ? encrypts : held == 0); }
   Type type() const noexcept { return static_cast<Type>(next % (Handle{1} << kKindBits) - kWorkKind); }
   std::size_t place() const noexcept { return (next >> kKindBits) % kPlaces; }
 

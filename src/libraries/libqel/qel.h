@@ -183,7 +183,7 @@ int QEL_EVP_EncryptUpdate(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char
 int QEL_EVP_DecryptUpdate(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char* out, int* outLength,
                           const unsigned char* in, int inLength) QEL_NOEXCEPT;
 
-/* Write the last block: at most one, outLength as above. Wrong padding and an incomplete block are failures. */
+/* Write the last block into room for one, outLength as above. Wrong padding and an incomplete block are failures. */
 int QEL_EVP_EncryptFinal(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char* out, int* outLength) QEL_NOEXCEPT;
 int QEL_EVP_DecryptFinal(QEL_CTX* ctx, QEL_CIPHER_CTX* cipherCtx, unsigned char* out, int* outLength) QEL_NOEXCEPT;
 
