@@ -105,6 +105,15 @@ int restoreWithoutMemory(const char* path, long number, int andLater) {
   return isEnd ? 77 : 0;
 }
 
+// In a child: stash files are made while memory runs out. The process ends where there are no random bytes.
+int makeKeysWithoutMemory(long number, int andLater) {
+  alarm(20);
+  char* text = nullptr;
+  bump_refuse(number, andLater);
+  createKeyStashFiles("/dev/null", "/dev/null", "a-seed-of-characters", &text, nullptr);
+  return bump_refuse(-1, 0) != 0 ? 77 : 0;
+}
+
 // In a child: a value is made while memory runs out at that request, and another one afterwards. 77: nothing was refused.
 int useWithoutMemory(int scheme, long number, int andLater) {
   alarm(20);
@@ -130,20 +139,23 @@ void startOpenssl() {
 #endif
 }
 
+constexpr int kRebuilding = -1, kMaking = -2;  // no schemes, but a stash file
+
 // Memory runs out somewhere in the first use: a refusal or a sound result, and no crash then or later.
 void runsOutOfMemory() {
   if (bump_refuse == nullptr) return;
   startOpenssl();
   char path[] = "/tmp/ldappw-hosts-XXXXXX";
   CHECK(close(mkstemp(path)) == 0);
-  for (const int scheme : {int{FORMAT_SSHA}, int{FORMAT_AES256}, 0}) {  // 0: no scheme, but a stash file
+  for (const int scheme : {int{FORMAT_SSHA}, int{FORMAT_AES256}, kRebuilding, kMaking}) {
     for (const int andLater : {0, 1}) {
       int status = 0;
       for (long number = 0; status == 0; number += 1 + number / 50) {
         const pid_t child = fork();
         if (child == 0) {
-          _exit(scheme == 0 ? restoreWithoutMemory(path, number, andLater)
-                            : useWithoutMemory(scheme, number, andLater));
+          _exit(scheme == kMaking       ? makeKeysWithoutMemory(number, andLater)
+                : scheme == kRebuilding ? restoreWithoutMemory(path, number, andLater)
+                                        : useWithoutMemory(scheme, number, andLater));
         }
         CHECK(waitpid(child, &status, 0) == child);
         if (status != 0 && status != 77 << 8U) {
@@ -333,17 +345,17 @@ void drawsAfterAFork() {
   CHECK(values[0] != values[1]);
 }
 
-// The process exits while threads work. They may be refused, but nothing goes from under them.
+// The process exits while threads work: every value stays what it is, and nothing goes from under them.
 void exitsAmongThreads() {
   for (int round = 0; round < 30; ++round) {
     const pid_t child = fork();
     if (child == 0) {
       alarm(20);
       std::atomic<int> started{0};
+      std::atexit([] { usleep(2000); });  // comes after the library's own handler
       for (int i = 0; i < 8; ++i) {
         std::thread([&started] {
-          char value[64];
-          for (++started;;) format_password(FORMAT_SSHA, nullptr, nullptr, "secret", 6, value, sizeof value);
+          for (++started;;) useEachScheme();
         }).detach();
       }
       while (started < 8) usleep(100);

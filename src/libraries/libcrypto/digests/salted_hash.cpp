@@ -40,12 +40,6 @@ int digestSalted(TracedCall& call, const Digest& digest, const Bytes& clear, con
   return LDAPPW_SUCCESS;
 }
 
-// The bytes of a digest; none is made for a digest without any, against which every password would verify.
-size_t digestBytes(const Digest& digest) noexcept {
-  const int size = digest.size();
-  return size > 0 ? static_cast<size_t>(size) : 0;
-}
-
 }  // namespace
 
 int saltedHashTo(TextTarget& target, const char* clear, size_t clearBytes, const char* digestName) noexcept {
@@ -57,9 +51,10 @@ int saltedHashTo(TextTarget& target, const char* clear, size_t clearBytes, const
   DigestOwner digest(qelCtx);
   if (const int rc = digest.open(digestName); rc != 0) return call.fail(rc, "initQelDigest() failed.");
 
-  const size_t size = digestBytes(digest);
+  const size_t size = digest.size();
+  if (size == 0) return call.fail(LDAPPW_OPERATIONS_ERROR, "QEL_EVP_MD_size() failed.");
   SecretBytes<2 * kUsualDigest> raw(2 * size);
-  if (size == 0 || !raw) return call.fail(LDAPPW_NO_MEMORY, "calloc() returned NULL.");
+  if (!raw) return call.fail(LDAPPW_NO_MEMORY, "calloc() returned NULL.");
   unsigned char* salt = raw.get() + size;
   if (randomBytes(qelCtx, salt, static_cast<int>(size)) != 1) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "QEL_RAND_bytes() failed.");
@@ -86,9 +81,10 @@ int saltedHashCheck(const char* clear, size_t clearBytes, const char* stored, si
   DigestOwner digest(qelCtx);
   if (const int rc = digest.open(digestName); rc != 0) return call.fail(rc, "initQelDigest() failed.");
 
-  const size_t size = digestBytes(digest);
+  const size_t size = digest.size();
+  if (size == 0) return call.fail(LDAPPW_OPERATIONS_ERROR, "QEL_EVP_MD_size() failed.");
   SecretBytes<kUsualDigest> fresh(size);
-  if (size == 0 || !fresh) return call.fail(LDAPPW_NO_MEMORY, "calloc() returned NULL.");
+  if (!fresh) return call.fail(LDAPPW_NO_MEMORY, "calloc() returned NULL.");
   if (given.bytes < size) return call.fail(LDAPPW_OPERATIONS_ERROR, "Stored value shorter than the digest.");
   const Bytes salt{decoded.get() + size, given.bytes - size};
   if (const int rc = digestSalted(call, digest, {clear, clearBytes}, salt, fresh.get()); rc != 0) return rc;

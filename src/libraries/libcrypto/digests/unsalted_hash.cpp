@@ -38,10 +38,11 @@ int unsaltedHashTo(TextTarget& target, const char* digestName, const char* clear
     return call.failText(LDAPPW_OPERATIONS_ERROR, "Error - unsaltedHashEncrypt: QEL_EVP_DigestInit() failed");
   }
   OutGuard<char> result(target.slot);
-  const int size = digest.size();
-  const size_t bytes = size > 0 ? static_cast<size_t>(size) : 0;
+  const size_t bytes = digest.size();
+  if (bytes == 0)
+    return call.failText(LDAPPW_OPERATIONS_ERROR, "Error - unsaltedHashEncrypt: QEL_EVP_MD_size() failed");
   SecretBytes<kUsualDigest> raw(bytes);
-  if (bytes == 0 || !raw) return call.failText(LDAPPW_NO_MEMORY, "Error - unsaltedHashEncrypt : calloc() failed\n");
+  if (!raw) return call.failText(LDAPPW_NO_MEMORY, "Error - unsaltedHashEncrypt : calloc() failed\n");
   if (digest.update(clear, static_cast<uint32_t>(clearBytes)) == 0) {
     return call.failText(LDAPPW_OPERATIONS_ERROR, "Error - unsaltedHashEncrypt: QEL_EVP_DigestUpdate() failed");
   }

@@ -28,7 +28,11 @@ struct Digest {
   void* algorithm = nullptr;
 
   bool isComplete() const noexcept { return qelCtx != nullptr && context != nullptr && algorithm != nullptr; }
-  int size() const noexcept { return callEntry(pQEL_EVP_MD_size, qelCtx, algorithm); }
+  // 0 when the provider states none: no value is made for such a digest, against which every password would verify.
+  size_t size() const noexcept {
+    const int bytes = callEntry(pQEL_EVP_MD_size, qelCtx, algorithm);
+    return bytes > 0 ? static_cast<size_t>(bytes) : 0;
+  }
   int init() const noexcept { return callEntry(pQEL_EVP_DigestInit, qelCtx, context, algorithm); }
   int update(const void* data, uint32_t bytes) const noexcept {
     return callEntry(pQEL_EVP_DigestUpdate, qelCtx, context, data, bytes);
