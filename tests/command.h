@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 #include <regex.h>
 #include <sys/mman.h>
+#include <sys/stat.h>
 
 #include <algorithm>
 #include <map>
@@ -108,9 +109,9 @@ inline std::vector<std::string> wordsOf(const std::string& line, const Names& na
 }
 
 // A table in tests/data: a row a line, of cells between bars; those that a row leaves out are empty. A line that begins
-// with two blanks goes on with the one before; "#" begins a comment.
+// with two blanks goes on with the one before; "#" begins a comment, and "=|" a name for others.
 using Row = std::vector<std::string>;
-inline std::vector<Row> rowsOf(const std::string& table) {
+inline std::vector<Row> rowsOf(const std::string& table, char kind = '\0') {
   std::ifstream file(LDAPPW_TEST_DATA "/" + table);
   std::vector<std::string> lines;
   for (std::string line; std::getline(file, line);) {
@@ -126,7 +127,7 @@ inline std::vector<Row> rowsOf(const std::string& table) {
     std::istringstream rest(line);
     for (std::string cell; std::getline(rest, cell, '|');) cells.push_back(cell);
     cells.resize(8);
-    rows.push_back(cells);
+    if ((cells[0] == "=") == (kind == '=')) rows.push_back(cells);
   }
   return rows;
 }
@@ -138,5 +139,84 @@ inline std::string nameOf(const testing::TestParamInfo<Row>& row) {
       name.begin(), name.end(), [](char c) { return isalnum(static_cast<unsigned char>(c)) == 0; }, '_');
   return name;
 }
+
+inline const std::string kSsha = "{SSHA}gVK8WC9YyFT1gMsQHTGCgT3sSv5zYWx0";  // of "secret" with the salt "salt"
+inline const std::string kAes = "{AES256}t8vqW3q3u4CC9qxS6LUu2Q==";         // of "secret" under the keys of fixedFile()
+
+inline std::string joined(const std::vector<std::string>& parts, char end) {
+  std::string text;
+  for (const std::string& part : parts) text += part + end;
+  return text;
+}
+
+inline const Names& names() {
+  const auto masked = [](const std::string& password) {
+    const std::string line = ran({"format", "--scheme", "qveil"}, password).out;
+    return line.substr(0, line.find('\n'));
+  };
+  static const std::string bare = masked("secret").substr(std::strlen("{qVEIL}"));
+  static const Names fixed{{"ssha", kSsha},
+                           {"aes", kAes},
+                           {"masked", "{qVEIL}" + bare},
+                           {"bare", bare},
+                           {"veiled", masked("\xff")},
+                           {"zeros", std::string(800, '0')},
+                           {"seed", "correct-horse-battery"},
+                           {"nothing", ""},
+                           {"long", std::string(1017, '0')},
+                           {"a43", std::string(43, 'a')}};
+  static const Names all = [] {
+    Names with = fixed;
+    for (const Row& row : rowsOf("ldif.vec", '=')) with[row[1]] = expanded(row[2], with);
+    return with;
+  }();
+  return all;
+}
+
+// A folder with what the rows name; none of the tests changes it.
+class Folder : public testing::Test {
+ public:
+  Folder() {
+    std::filesystem::current_path(folder_.file("."));
+    const std::string dir = fixedFile();
+    const std::vector<std::string> pairs{kSsha + "\tsecret", kAes + "\tsecret", kSsha + "\tse\tcret", "{X}y\ta",
+                                         "secret\tsecret"};
+    for (const auto& [name, content] :
+         Names{{"dir", dir},
+               {"d2", dir.substr(0, 24) + std::string(72, 'n')},
+               {"d3", dir.substr(0, 23) + "T" + std::string(72, 'm')},
+               {"d\x1b[1m", dir},
+               {"short", dir.substr(0, 90)},
+               {"zeros", std::string(200, '\0')},
+               {"seed", "correct-horse-battery\n"},
+               {"salt", "saltsaltsalt\n"},
+               {"value", kSsha + "\nother\n"},
+               {"password", "secret\nother\n"},
+               {"empty", ""},
+               {"entries", "UID=A,dc = x\tsecret\nuid=a,dc=x\told\nuid=b,dc=x\tb\nc\tc\nd\td\n"},
+               {"pairs", joined(pairs, '\n') + "tabless\n"},
+               {"pairs0", joined(pairs, '\0')}}) {
+      putFile(name, content);
+      chmod(name.c_str(), 0600);
+    }
+    std::filesystem::create_symlink("dir", "link");
+    std::filesystem::create_symlink("nowhere", "loose");
+    before_ = content();
+  }
+  ~Folder() override {
+    EXPECT_EQ(content(), before_);
+    std::filesystem::current_path("/");
+  }
+
+ private:
+  static Names content() {
+    Names all;
+    for (const auto& entry : std::filesystem::directory_iterator(".")) all[entry.path()] = fileContent(entry.path());
+    return all;
+  }
+
+  TempFolder folder_;
+  Names before_;
+};
 
 }  // namespace test

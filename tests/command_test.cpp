@@ -1,8 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // The verbs that work on values and key stash files: what they answer, what they refuse, and that a refusal changes
 // nothing. Digests and AES values were made by openssl, foreign values by the programs that their table names.
-#include <sys/stat.h>
-
 #include <set>
 
 #include "command.h"
@@ -11,73 +9,6 @@ using namespace test;
 using namespace std::string_literals;
 
 namespace {
-
-const std::string kSsha = "{SSHA}gVK8WC9YyFT1gMsQHTGCgT3sSv5zYWx0";  // of "secret" with the salt "salt"
-const std::string kAes = "{AES256}t8vqW3q3u4CC9qxS6LUu2Q==";         // of "secret" under the keys of fixedFile()
-
-const Names& names() {
-  static const std::string masked = ran({"format", "--scheme", "qveil"}, "secret\n").out;
-  static const std::string bare = masked.substr(0, masked.find('\n')).substr(masked.find('}') + 1);
-  static const Names all{{"ssha", kSsha},
-                         {"aes", kAes},
-                         {"masked", "{qVEIL}" + bare},
-                         {"bare", bare},
-                         {"seed", "correct-horse-battery"},
-                         {"nothing", ""},
-                         {"long", std::string(1017, '0')},
-                         {"a43", std::string(43, 'a')}};
-  return all;
-}
-
-std::string joined(const std::vector<std::string>& parts, char end) {
-  std::string text;
-  for (const std::string& part : parts) text += part + end;
-  return text;
-}
-
-// A folder with what the rows name; none of the tests changes it.
-class Folder : public testing::Test {
- public:
-  Folder() {
-    std::filesystem::current_path(folder_.file("."));
-    const std::string dir = fixedFile();
-    const std::vector<std::string> pairs{kSsha + "\tsecret", kAes + "\tsecret", kSsha + "\tse\tcret", "{X}y\ta",
-                                         "secret\tsecret"};
-    for (const auto& [name, content] : Names{{"dir", dir},
-                                             {"d2", dir.substr(0, 24) + std::string(72, 'n')},
-                                             {"d3", dir.substr(0, 23) + "T" + dir.substr(24)},
-                                             {"d\x1b[1m", dir},
-                                             {"short", dir.substr(0, 90)},
-                                             {"zeros", std::string(200, '\0')},
-                                             {"seed", "correct-horse-battery\n"},
-                                             {"salt", "saltsaltsalt\n"},
-                                             {"value", kSsha + "\nother\n"},
-                                             {"password", "secret\nother\n"},
-                                             {"empty", ""},
-                                             {"pairs", joined(pairs, '\n') + "tabless\n"},
-                                             {"pairs0", joined(pairs, '\0')}}) {
-      putFile(name, content);
-      chmod(name.c_str(), 0600);
-    }
-    std::filesystem::create_symlink("dir", "link");
-    std::filesystem::create_symlink("nowhere", "loose");
-    before_ = content();
-  }
-  ~Folder() override {
-    EXPECT_EQ(content(), before_);
-    std::filesystem::current_path("/");
-  }
-
- private:
-  static Names content() {
-    Names all;
-    for (const auto& entry : std::filesystem::directory_iterator(".")) all[entry.path()] = fileContent(entry.path());
-    return all;
-  }
-
-  TempFolder folder_;
-  Names before_;
-};
 
 class Command : public Folder, public testing::WithParamInterface<Row> {};
 
