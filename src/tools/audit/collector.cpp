@@ -94,10 +94,10 @@ std::vector<std::string> auditedNames() {
 }
 
 void AuditRules::loadKnownBad(const std::string& path) {
-  LineReader lines{Input(path)};
+  LineReader passwords{Input(path)};
   Sha256 sha256;
   Secret line;
-  while (lines.next(line)) {
+  while (passwords.next(line)) {
     if (!line.empty() && line.view().back() == '\r') line.resize(line.size() - 1);
     if (line.empty()) continue;
     knownBad.push_back(markKey.of(sha256, MarkKind::kPassword, line.view()));
@@ -126,22 +126,24 @@ void Collector::takeLine(const RecordWalker& walker) {
   const std::string_view description = line.description;
   const std::string_view type = trimSpaces(description.substr(0, description.find(';')));
   const bool isName = isOneOf(type, kNames);
-  if (!isName && !isOneOf(type, kClassNames)) return takePassword(line, type);
+  if (!isName && !isOneOf(type, kClassNames)) return takePassword(walker, type);
   if (line.form != ValueForm::kBytes) return;
   if (isName) entry_.names.emplace_back(line.value.view());
   const bool account = sameName(type, "uid") || (!isName && isOneOf(line.value.view(), kAccountClasses));
   entry_.account = entry_.account || (account && !walker.modifies());
 }
 
-void Collector::takePassword(const PasswordLine& line, std::string_view type) {
+void Collector::takePassword(const RecordWalker& walker, std::string_view type) {
+  const PasswordLine& line = walker.password();
   ++facts_->values;
   facts_->urls += line.form == ValueForm::kUrl ? 1 : 0;
   facts_->deleted += line.form == ValueForm::kDeleted ? 1 : 0;
   facts_->authPasswords += line.form == ValueForm::kAuthPassword ? 1 : 0;
   if (line.form == ValueForm::kBroken) found(Finding::kBroken);
-  if (line.form == ValueForm::kBytes)
-    (isHistory(type) ? entry_.history : entry_.passwords).emplace_back(line.value.view());
-  entry_.hasPassword = entry_.hasPassword || (line.form != ValueForm::kDeleted && !isHistory(type));
+  const bool current = !isHistory(type);
+  entry_.lines.push_back({walker.lineNumber(), line.description, line.form, line.problem, Secret(), current});
+  if (line.form == ValueForm::kBytes) entry_.lines.back().value.append(line.value.view());
+  entry_.hasPassword = entry_.hasPassword || (line.form != ValueForm::kDeleted && current);
 }
 
 void Collector::finishEntry() {
@@ -150,8 +152,11 @@ void Collector::finishEntry() {
   subtree.entries = 1;
   const std::string name = nameInDn(entry_.dn);
   if (!name.empty()) entry_.names.emplace_back(name);
-  for (const Secret& value : entry_.passwords) judge(value, true, subtree);
-  for (const Secret& value : entry_.history) judge(value, false, subtree);
+  for (const StoredLine& line : entry_.lines) {
+    const Verdict verdict = judgeLine(line, subtree);
+    keepFirst(firstProblem_, textOf(verdict.condition).code);
+    appendLine(rules_.lines, entry_.dn, line, verdict, out_);
+  }
   if (entry_.account && !entry_.hasPassword) found(Finding::kNoPassword);
   if (entry_.account || entry_.hasPassword) {
     ++facts_->accounts;
@@ -165,16 +170,24 @@ void Collector::finishEntry() {
   inEntry_ = holds_ = false;
 }
 
+Verdict Collector::judgeLine(const StoredLine& line, Subtree& subtree) {
+  constexpr const char* kElsewhere[] = {"", "url", "deleted", "authPassword"};
+  if (line.form == ValueForm::kBytes) return judge(line.value, line.current, subtree);
+  if (line.form == ValueForm::kBroken) return {"unknown", Condition::kBroken, line.problem};
+  return {kElsewhere[static_cast<size_t>(line.form)], Condition::kFine, ""};
+}
+
 // current: a value to log in with.
-void Collector::judge(const Secret& value, bool current, Subtree& subtree) {
+Verdict Collector::judge(const Secret& value, bool current, Subtree& subtree) {
   const Examined examined = examine(value);
-  const Wrapping wrapping = examined.wrapping;
-  if (wrapping == Wrapping::kPadded || wrapping == Wrapping::kEncoded) {
+  const bool malformed = examined.condition == Condition::kMalformed && examined.problem != nullptr;
+  Verdict verdict{examined.scheme().name, examined.condition, malformed ? examined.problem : ""};
+  if (examined.wrapping == Wrapping::kPadded || examined.wrapping == Wrapping::kEncoded) {
     found(Finding::kWrapped);
-    return judge(unwrapped(value, wrapping), false, subtree);
+    judge(unwrapped(value, examined.wrapping), false, subtree);
+    return verdict;
   }
-  const Condition condition = examined.condition;
-  const Scheme& scheme = wrapping == Wrapping::kLocked ? *findScheme("locked") : examined.scheme();
+  const Scheme& scheme = examined.wrapping == Wrapping::kLocked ? *findScheme("locked") : examined.scheme();
   const bool locked = scheme.strength == Strength::kLocked;
   const auto strength = static_cast<size_t>(scheme.strength);
   ++facts_->schemes[rowOf(scheme)];
@@ -182,21 +195,39 @@ void Collector::judge(const Secret& value, bool current, Subtree& subtree) {
   ++subtree.values;
   ++subtree.strengths[strength];
   if (isFinding(scheme.strength)) found(findingOf(scheme.strength));
-  if (condition == Condition::kMalformed || condition == Condition::kForeign) found(Finding::kMalformed);
+  if (verdict.condition == Condition::kMalformed || verdict.condition == Condition::kForeign) {
+    found(Finding::kMalformed);
+  }
   if (!locked && !rules_.accepted.empty() && !rules_.accepted[rowOf(scheme)]) found(Finding::kNotAccepted);
-  if (current && !locked && examined.problem == nullptr) judgeValue(examined);
+  Condition opened = Condition::kFine;
+  Secret earlier;
+  if (!locked && examined.problem == nullptr) {
+    if (current) opened = judgeCurrent(examined);
+    if (!current && rules_.valuesAreProblems) opened = open(examined, earlier);
+  }
+  if (verdict.condition == Condition::kFine) verdict.condition = opened;
+  return verdict;
 }
 
-void Collector::judgeValue(const Examined& value) {
+// kFine also for a value that is not to be opened: password is empty then.
+Condition Collector::open(const Examined& value, Secret& password) const {
   const Scheme& scheme = value.scheme();
-  if (scheme.open != nullptr && (!scheme.needsKey() || rules_.keys)) {
-    Secret password;
-    const bool opened = openValue(value, rules_.keys, password).ok();
-    if (opened && (scheme.strength == Strength::kClear || rules_.allowBinary || looksLikeText(password.view()))) {
-      return judgePassword(password.view());
-    }
-    found(Finding::kUnopened);
+  if (scheme.open == nullptr || (scheme.needsKey() && rules_.keys.empty())) return Condition::kFine;
+  const KeyRing::Opened opened = rules_.keys.open(value, 0, password);
+  if (opened.status(rules_.allowBinary).ok()) return Condition::kFine;
+  return opened.result == KeyRing::Opened::Result::kRefused ? Condition::kUnopened : Condition::kNotText;
+}
+
+Condition Collector::judgeCurrent(const Examined& value) {
+  const Scheme& scheme = value.scheme();
+  const bool opens = scheme.open != nullptr && (!scheme.needsKey() || !rules_.keys.empty());
+  Secret password;
+  const Condition opened = open(value, password);
+  if (opens && opened == Condition::kFine) {
+    judgePassword(password.view());
+    return opened;
   }
+  if (opens) found(Finding::kUnopened);
   // Without a salt, equal values are equal passwords.
   if (scheme.reversible() || scheme.strength == Strength::kUnsalted) {
     std::string name = scheme.name;
@@ -206,6 +237,7 @@ void Collector::judgeValue(const Examined& value) {
     sight(rules_.markKey.of(sha256_, MarkKind::kValue, bytes.view()));
   }
   if (rules_.checkHashes && scheme.kind == Kind::kOneWay && scheme.check != nullptr) tryNames(value);
+  return opened;
 }
 
 void Collector::judgePassword(std::string_view password) {
@@ -218,7 +250,8 @@ void Collector::judgePassword(std::string_view password) {
 }
 
 void Collector::tryNames(const Examined& value) {
-  const auto matches = [&](const Secret& password) { return checkValue(value, rules_.keys, password).ok(); };
+  const KeyRecord none;  // one-way values need no keys
+  const auto matches = [&](const Secret& password) { return checkValue(value, none, password).ok(); };
   if (std::any_of(entry_.names.begin(), entry_.names.end(), matches)) found(Finding::kName);
   if (std::any_of(rules_.tried.begin(), rules_.tried.end(), matches)) found(Finding::kKnownBad);
 }

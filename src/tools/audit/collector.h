@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Judges the entries of a batch: schemes, and what is wrong with passwords and their values.
+// Judges the entries of a batch: their schemes, and what is wrong with their passwords and values.
 #pragma once
 
 #include <bitset>
@@ -8,17 +8,20 @@
 #include <vector>
 
 #include "audit/facts.h"
+#include "audit/lines.h"
 #include "audit/marks.h"
+#include "ldif/key_ring.h"
 #include "ldif/record.h"
 #include "schemes/examine.h"
-#include "schemes/key_record.h"
 
 namespace tool {
 
 // What an audit is to look for. Used by many threads at once.
 struct AuditRules {
-  KeyRecord keys;
+  KeyRing keys;
   bool allowBinary = false;
+  Lines lines = Lines::kNone;
+  bool valuesAreProblems = false;  // a value that is not fine counts for the exit code, earlier passwords included
   MarkKey markKey;
   std::vector<Mark> knownBad;  // sorted
   std::vector<Secret> tried;   // the same passwords, where they are to be tried on one-way values
@@ -36,35 +39,41 @@ std::vector<std::string> auditedNames();
 
 class Collector {
  public:
-  explicit Collector(const AuditRules& rules) : rules_(rules), facts_(std::make_unique<Facts>()) {}
+  // The lines that the rules ask for are appended to out.
+  Collector(const AuditRules& rules, Secret& out) : rules_(rules), out_(out), facts_(std::make_unique<Facts>()) {}
 
   std::unique_ptr<Facts> collect(RecordWalker& walker);
+  // The code of the first value that is not fine.
+  ExitCode firstProblem() const noexcept { return firstProblem_; }
 
  private:
   struct Entry {
     std::string dn;
-    std::vector<Secret> names;      // uid and cn
-    std::vector<Secret> passwords;  // stored values that can be logged in with
-    std::vector<Secret> history;    // earlier ones
+    std::vector<Secret> names;  // uid and cn
+    std::vector<StoredLine> lines;
     bool account = false;
     bool hasPassword = false;  // some are not at hand: behind a URL, or on a line that is not well formed
     std::bitset<kFindingCount> findings;
   };
 
   void takeLine(const RecordWalker& walker);
-  void takePassword(const PasswordLine& line, std::string_view type);
+  void takePassword(const RecordWalker& walker, std::string_view type);
   void finishEntry();
-  void judge(const Secret& value, bool current, Subtree& subtree);
-  void judgeValue(const Examined& value);
+  Verdict judgeLine(const StoredLine& line, Subtree& subtree);
+  Verdict judge(const Secret& value, bool current, Subtree& subtree);
+  Condition judgeCurrent(const Examined& value);
+  Condition open(const Examined& value, Secret& password) const;
   void judgePassword(std::string_view password);
   void tryNames(const Examined& value);
   void found(Finding finding) { entry_.findings.set(static_cast<size_t>(finding)); }
   void sight(const Mark& mark);
 
   const AuditRules& rules_;
+  Secret& out_;
   std::unique_ptr<Facts> facts_;
   Sha256 sha256_;
   Entry entry_;
+  ExitCode firstProblem_ = kSuccess;
   bool inEntry_ = false;
   bool holds_ = false;  // the entry is the last one of the holders
 };

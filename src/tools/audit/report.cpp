@@ -38,11 +38,22 @@ void writeSubtree(const std::string& name, const Subtree& subtree, Results& resu
   results.line(line);
 }
 
+void addSubtrees(const AuditReport& report, Json& json) {
+  json.openList("subtrees");
+  for (const auto& [name, subtree] : report.subtrees()) {
+    json.open("").text("dn", name).number("accounts", subtree.entries).number("values", subtree.values);
+    addStrengths(json, subtree.strengths);
+    json.close();
+  }
+  json.closeList();
+}
+
 void writeFinding(const AuditReport& report, size_t i, Results& results) {
   const DnList& list = report.facts.findings[i];
   if (list.count == 0) return;
   const char* mark = report.fails(i) ? " (against the policy)" : "";
   results.line(std::string("finding: ") + kFindings[i].name + ": " + std::to_string(list.count) + mark);
+  if (report.brief) return;
   if (i != static_cast<size_t>(Finding::kReused)) return writeDns(list.dns, list.count, results);
   results.line("  groups: " + std::to_string(report.reuseGroups));
   for (const ReuseGroup& group : report.reused) {
@@ -54,6 +65,10 @@ void writeFinding(const AuditReport& report, size_t i, Results& results) {
 void addFinding(const AuditReport& report, size_t i, Json& json) {
   const DnList& list = report.facts.findings[i];
   json.open("").text("name", kFindings[i].name).number("entries", list.count);
+  if (report.brief) {
+    json.close();
+    return;
+  }
   json.flag("forbidden", report.forbidden.test(i));
   addDns(json, list.dns);
   if (i == static_cast<size_t>(Finding::kReused)) {
@@ -121,7 +136,9 @@ void writeText(const AuditReport& report, Results& results) {
       results.line(std::string("strength ") + kStrengthNames[i] + ": " + std::to_string(facts.strengths[i]));
     }
   }
-  for (const auto& [name, subtree] : report.subtrees()) writeSubtree(name, subtree, results);
+  if (!report.brief) {
+    for (const auto& [name, subtree] : report.subtrees()) writeSubtree(name, subtree, results);
+  }
   for (size_t i = 0; i < kFindingCount; ++i) writeFinding(report, i, results);
   if (report.policy) results.line(report.met() ? "policy: met" : "policy: not met");
 }
@@ -129,9 +146,12 @@ void writeText(const AuditReport& report, Results& results) {
 void writeObject(const AuditReport& report, Results& results) {
   const Facts& facts = report.facts;
   Json json;
-  json.text("time", report.time).openList("exports");
-  for (const std::string& name : report.exports) json.text("", name);
-  json.closeList().number("entries", facts.entries).number("accounts", facts.accounts).number("values", facts.values);
+  if (!report.brief) {
+    json.text("time", report.time).openList("exports");
+    for (const std::string& name : report.exports) json.text("", name);
+    json.closeList();
+  }
+  json.number("entries", facts.entries).number("accounts", facts.accounts).number("values", facts.values);
   json.number("urls", facts.urls).number("deleted", facts.deleted);
   json.number("authPasswords", facts.authPasswords).openList("schemes");
   for (const AuditReport::SchemeRow& row : report.schemes()) {
@@ -139,18 +159,13 @@ void writeObject(const AuditReport& report, Results& results) {
   }
   json.closeList();
   addStrengths(json, facts.strengths);
-  json.openList("subtrees");
-  for (const auto& [name, subtree] : report.subtrees()) {
-    json.open("").text("dn", name).number("accounts", subtree.entries).number("values", subtree.values);
-    addStrengths(json, subtree.strengths);
-    json.close();
-  }
-  json.closeList().openList("findings");
+  if (!report.brief) addSubtrees(report, json);
+  json.openList("findings");
   for (size_t i = 0; i < kFindingCount; ++i) {
     if (facts.findings[i].count > 0) addFinding(report, i, json);
   }
   json.closeList();
-  report.policy ? json.flag("policyMet", report.met()) : json.null("policyMet");
+  if (!report.brief) report.policy ? json.flag("policyMet", report.met()) : json.null("policyMet");
   results.line(json.end());
 }
 

@@ -20,6 +20,7 @@ struct AuditReport {
   std::vector<std::string> exports;
   std::string time;  // UTC
   bool policy = false;
+  bool brief = false;                    // counts alone: no subtrees, no DNs
   std::bitset<kFindingCount> forbidden;  // by the policy
 
   // The name, strength and number of the values of a scheme.

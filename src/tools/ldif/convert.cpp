@@ -131,11 +131,11 @@ Outcome convertValue(const Examined& value, const Conversion& conversion, Secret
   }
   if (source.isClear() && conversion.target.isClear()) return {kAsTheyAre, {}};
   Secret clear;
-  size_t used = KeyRing::kNoKey;
   // The new keys are for values that this run or an earlier one has made: those of another scheme are none of them.
   const size_t first = conversion.newKeys && &source != &conversion.target ? 1 : 0;
-  Status status = conversion.keys.open(value, first, conversion.options.allowBinary, clear, used);
-  const bool underNew = !source.needsKey() || (conversion.newKeys && used == 0);
+  const KeyRing::Opened opened = conversion.keys.open(value, first, clear);
+  Status status = opened.status(conversion.options.allowBinary);
+  const bool underNew = !source.needsKey() || (conversion.newKeys && opened.key == 0);
   if (status.ok() && &source == &conversion.target && underNew && !value.value.tag().empty()) return {kDone, {}};
   if (status.ok()) status = makeTarget(clear, conversion, made);
   if (!status.ok()) return {kFailed, status};

@@ -16,44 +16,48 @@ constexpr Status kAmbiguous{kBadKey, "opens into bytes that are not text with mo
 
 }  // namespace
 
-KeyRing::KeyRing(const std::vector<std::string>& paths) {
-  for (const std::string& path : paths) {
-    if (!path.empty()) keys_.push_back(KeyRecord::load(path));
-  }
+void KeyRing::add(const std::string& path) {
+  if (!path.empty()) keys_.push_back(KeyRecord::load(path));
 }
 
-Status KeyRing::open(const Examined& value, size_t first, bool allowBinary, Secret& clear, size_t& used) const {
-  used = kNoKey;
-  Status refused;
-  Secret bytes;
-  bool opened = false;
-  bool tied = false;
+Status KeyRing::Opened::status(bool allowBinary) const noexcept {
+  switch (result) {
+    case Result::kRefused:
+      return refusal;
+    case Result::kText:
+      return {};
+    case Result::kBytes:
+      return allowBinary ? Status{} : kNotText;
+    case Result::kAmbiguous:
+      break;
+  }
+  return allowBinary ? kAmbiguous : kNotText;
+}
+
+KeyRing::Opened KeyRing::open(const Examined& value, size_t first, Secret& clear) const {
   const bool keyless = !value.scheme().needsKey() || first >= keys_.size();
   const KeyRecord none;
   const size_t count = keyless ? 1 : keys_.size() - first;
   const size_t latest = std::max(latest_.load(std::memory_order_relaxed), first) - first;
+  Opened best;
   for (size_t n = 0; n < count; ++n) {
-    const size_t i = first + (latest + n) % count;
-    const Status status = openValue(value, keyless ? none : keys_[i], clear);
+    const size_t key = keyless ? kNoKey : first + (latest + n) % count;
+    Secret found;
+    const Status status = openValue(value, keyless ? none : keys_[key], found);
     if (!status.ok()) {
-      refused = status;
-      continue;
+      best.refusal = status;
+    } else if (value.scheme().strength == Strength::kClear || looksLikeText(found.view())) {
+      if (!keyless) latest_.store(key, std::memory_order_relaxed);
+      clear = std::move(found);
+      return {Opened::Result::kText, key, {}};
+    } else if (best.result == Opened::Result::kRefused || found.size() < clear.size()) {
+      clear = std::move(found);
+      best = {Opened::Result::kBytes, key, {}};
+    } else if (found.size() == clear.size()) {
+      best.result = Opened::Result::kAmbiguous;
     }
-    const bool text = looksLikeText(clear.view()) || value.scheme().strength == Strength::kClear;
-    const bool better = text || !opened || clear.size() < bytes.size();
-    if (better && !keyless) used = i;
-    if (text) {
-      if (!keyless) latest_.store(i, std::memory_order_relaxed);
-      return {};
-    }
-    tied = opened && clear.size() == bytes.size();
-    if (better) bytes = Secret(clear.view());
-    opened = true;
   }
-  if (!opened) return refused;
-  if (!allowBinary) return kNotText;
-  clear = std::move(bytes);
-  return tied ? kAmbiguous : Status{};
+  return best;
 }
 
 }  // namespace tool

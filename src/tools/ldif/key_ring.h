@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Several key records, tried one after the other: an export in which a rotation has stopped holds values of two.
+// Several key records, tried in turn: an export in which a rotation has stopped holds values under two keys.
 #pragma once
 
 #include <atomic>
@@ -14,21 +14,37 @@ class KeyRing {
  public:
   static constexpr size_t kNoKey = static_cast<size_t>(-1);
 
-  // The stash files; empty paths are left out. Throws Failure.
-  explicit KeyRing(const std::vector<std::string>& paths);
+  // What came of opening a value.
+  struct Opened {
+    // kAmbiguous: the two best keys give bytes of the same length, so either can be the wrong one.
+    enum class Result { kRefused, kText, kBytes, kAmbiguous };
+
+    Result result = Result::kRefused;
+    size_t key = kNoKey;  // the place of the key
+    Status refusal;       // of kRefused
+
+    // Bytes are an error unless they are allowed.
+    Status status(bool allowBinary) const noexcept;
+  };
+
+  KeyRing() = default;
+  explicit KeyRing(const std::vector<std::string>& paths) {
+    for (const std::string& path : paths) add(path);
+  }
+
+  // Loads a stash file; an empty path is left out. Throws Failure.
+  void add(const std::string& path);
 
   bool empty() const noexcept { return keys_.empty(); }
   const std::vector<KeyRecord>& keys() const noexcept { return keys_; }
 
-  // Opens a reversible value. A key that opens it into text is the right one. Bytes count with allowBinary when no key
-  // gives text: of two keys the one that finds more padding, which a wrong one hardly ever does; with equal padding
-  // neither. Keys before first are left out; used is the place of the key, or kNoKey. The key that opened the last value
-  // is tried first, as it mostly opens the next one, and another takes longer to fail.
-  Status open(const Examined& value, size_t first, bool allowBinary, Secret& clear, size_t& used) const;
+  // Opens a reversible value with the keys from first on. A key that opens it into text is the right one. If none does,
+  // the shortest bytes count: the right key finds all of the padding, a wrong one hardly ever more than a byte.
+  Opened open(const Examined& value, size_t first, Secret& clear) const;
 
  private:
   std::vector<KeyRecord> keys_;
-  mutable std::atomic<size_t> latest_{0};  // that opened a value
+  mutable std::atomic<size_t> latest_{0};  // opened the last value, so it is tried first
 };
 
 }  // namespace tool

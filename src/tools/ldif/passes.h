@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The two passes of ldappw ldif.
+// The conversion of ldappw ldif.
 #pragma once
 
 #include <string>
@@ -19,20 +19,15 @@ struct LdifOptions {
   Costs costs;
   bool changes = false;  // write change records in place of the export
   bool dryRun = false;
-  bool audit = false;
   bool fix = false;  // values that are padded or encoded once more are unwrapped
   bool force = false;
   bool allowClear = false;
   bool allowBinary = false;  // what opens into bytes that are not text is taken for right
-  bool verbose = false;
   bool json = false;
   bool quiet = false;  // no counts
 };
 
 // Converts the password values to another scheme or other keys, and leaves every other byte alone.
 ExitCode convertExport(const LdifOptions& options);
-
-// Counts which schemes the password values use, and what is wrong with them.
-ExitCode auditExport(const LdifOptions& options);
 
 }  // namespace tool

@@ -1,7 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw audit: what a security officer wants to know of directory exports every night, and a policy as exit code.
-#include "audit/collector.h"
-#include "audit/report.h"
+#include "audit/pass.h"
 #include "base/messages.h"
 #include "base/output_file.h"
 #include "base/text.h"
@@ -106,29 +105,13 @@ void checkOptions(const Options& options) {
 }
 
 void setRules(const Options& options, AuditRules& rules) {
-  rules.keys = KeyRecord::load(options.keys);
+  rules.keys.add(options.keys);
   rules.allowBinary = options.allowBinary;
   rules.checkHashes = options.checkHashes;
   rules.accepted = acceptedBy(options);
   rules.subtreeDepth = options.subtreeDepth;
   rules.listed = options.listed;
   if (!options.knownBad.empty()) rules.loadKnownBad(options.knownBad);
-}
-
-// Adds an export to the facts; the sightings go to reuse. Returns the code of what was reported on the way.
-ExitCode readExport(const std::string& path, const Options& options, const AuditRules& rules, Facts& facts,
-                    Reuse& reuse) {
-  ExportOptions source = options.source;
-  source.in = path;
-  source.others = auditedNames();
-  Input input = openExport(source);
-  const auto work = [&](RecordWalker& walker, Part& part) { part.gathered = Collector(rules).collect(walker); };
-  const auto deliver = [&](const Part& part) {
-    auto& batch = static_cast<Facts&>(*part.gathered);
-    reuse.add(batch);
-    facts.add(std::move(batch), options.listed);
-  };
-  return runExport(input, source, work, deliver).exitCode;
 }
 
 ExitCode exitCodeOf(const AuditReport& report, ExitCode reading, bool keysGiven) {
@@ -155,12 +138,14 @@ ExitCode run(const Options& options) {
   std::optional<OutputFile> page;
   if (!options.html.empty() && options.html != "-") page.emplace(options.html, kPageMode, options.force);
   Reuse reuse;
+  Results results;
   ExitCode reading = kSuccess;
   for (const std::string& path : options.exports) {
-    keepFirst(reading, readExport(path, options, rules, report.facts, reuse));
+    ExportOptions source = options.source;
+    source.in = path;
+    keepFirst(reading, auditExport(source, rules, report.facts, reuse, results));
   }
   report.reused = reuse.finish(report.facts, options.listed, report.reuseGroups);
-  Results results;
   if (page) {
     page->write(pageOf(report));
     page->commit();

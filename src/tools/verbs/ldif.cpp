@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // ldappw ldif: the command line of the conversion and the audit of a directory export.
+#include "audit/pass.h"
 #include "ldif/passes.h"
-
 #include "verbs/options.h"
 
 namespace tool {
@@ -17,10 +17,37 @@ because they name what is stored.
 What cannot be carried over unharmed is kept as it was and listed by DN on standard error, and the exit code is not 0:
 3 for an unknown tag, a malformed, locked, padded or doubly encoded value or a password that the scheme cannot hold,
 4 for a value that the old keys do not open; 5 when a file cannot be read or written, and then --out has not changed.
-An audit (--audit) exits with 0 when it has no finding, else with the code of the first one. With --json it writes one
-object; with --verbose a line (with --json an object) for each value comes before it.)";
+An audit (--audit) shows the counts of "ldappw audit". It exits with 0 when every value is well formed and the keys
+open it, else with the code of the first one that is not. With --json it writes one object; with --verbose a line
+(with --json an object) for each value comes before it.)";
 
-ExitCode run(const LdifOptions& options) {
+struct Options : LdifOptions {
+  bool audit = false;
+  bool verbose = false;
+};
+
+ExitCode audit(const Options& options) {
+  requireProvider();
+  AuditRules rules;
+  for (const std::string& path : options.keys) rules.keys.add(path);
+  rules.allowBinary = options.allowBinary;
+  rules.valuesAreProblems = true;
+  rules.listed = 0;
+  if (options.verbose) rules.lines = options.json ? Lines::kJson : Lines::kText;
+  ExportOptions source = options.source;
+  source.resultsOnStdout = options.verbose;
+  AuditReport report;
+  report.brief = true;
+  Reuse reuse;
+  Results results;
+  const ExitCode exitCode = auditExport(source, rules, report.facts, reuse, results);
+  report.reused = reuse.finish(report.facts, rules.listed, report.reuseGroups);
+  (options.json ? writeObject : writeText)(report, results);
+  results.flush();
+  return exitCode;
+}
+
+ExitCode run(const Options& options) {
   if (options.audit == !options.to.empty()) throw Failure(kUsage, "give either --to or --audit");
   if (options.audit && (!options.newKeys.empty() || options.changes || options.dryRun || !options.resume.empty() ||
                         options.fix || options.out != "-")) {
@@ -29,15 +56,15 @@ ExitCode run(const LdifOptions& options) {
   if (!options.audit && options.json && options.out == "-" && !options.dryRun) {
     throw Failure(kUsage, "--json needs --out: the export goes to standard output");
   }
-  return options.audit ? auditExport(options) : convertExport(options);
+  return options.audit ? audit(options) : convertExport(options);
 }
 
 }  // namespace
 
 void setUpLdif(CLI::App& verb, ExitCode& exitCode) {
-  const auto options = std::make_shared<LdifOptions>();
+  const auto options = std::make_shared<Options>();
   verb.add_option("--to", options->to, "scheme to convert the values to");
-  verb.add_flag("--audit", options->audit, "count schemes and findings instead");
+  verb.add_flag("--audit", options->audit, "count schemes and findings instead, as \"ldappw audit\" does");
   addKeys(verb, "--keys", options->keys, "key stash file that opens the AES values of the export; may be repeated");
   addPath(verb, "--new-keys", options->newKeys, "key stash file for the new values");
   verb.add_option("--attribute", options->source.attributes,
