@@ -36,14 +36,14 @@ own_temporary_folder() {
 }
 
 # The names of the sources in a folder, each with a NUL behind it: those that are committed or will be, as they are now.
-# A tree that was unpacked from a release has no others than those and build.
+# A tree without git's records has no others than those and build.
 source_files() { # folder or pattern...
-  if [ -e .git ]; then
+  if [ -e .git ] && git rev-parse --git-dir >/dev/null 2>&1; then
     git ls-files -z --cached --others --exclude-standard -- "$@" | while IFS= read -r -d '' file; do
       [ ! -e "$file" ] || printf '%s\0' "$file"
     done
   else
-    find "$@" -path ./build -prune -o -type f -printf '%p\0'
+    find "$@" \( -path ./build -o -path ./.git \) -prune -o -type f -printf '%p\0'
   fi
 }
 
