@@ -21,7 +21,7 @@ mapfile -t lists < <(ls "$work"/*.files)
 [ ${#lists[@]} -eq 2 ] || fail "these are not two architectures: ${lists[*]}"
 shared=$(comm -12 "${lists[@]}")
 while read -r file; do
-  cmp "${lists[0]%.files}/$file" "${lists[1]%.files}/$file" || fail "$file differs"
+  diff -q --no-dereference "${lists[0]%.files}/$file" "${lists[1]%.files}/$file" || fail "$file differs"
 done <<<"$shared"
 [ -n "$(comm -23 "${lists[@]}")" ] && [ -n "$(comm -13 "${lists[@]}")" ] || fail "one of the two has none of its own"
 echo "shared_files_test: $(wc -l <<<"$shared") files are the same for both architectures"
