@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Verification on one thread and on several. {crypt} has its one lock and does not scale.
+// Verification on one thread and on several.
 #include "bench_support.h"
 
 namespace {
