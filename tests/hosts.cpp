@@ -84,8 +84,27 @@ void startsManyThreads() {
   inThreads(32, [](unsigned number) { useEachScheme(number); });
 }
 
+// Keys and encodings.
+void useTheOthers() {
+  AesKeyData *made = nullptr, *loaded = nullptr;
+  unsigned char block[8] = {};
+  unsigned length = 0;
+  uint32_t schedule[32];
+  CHECK(restoreKeyStashFile("/dev/null", "a-seed-of-characters", "saltsaltsalt") == 0);
+  CHECK(genTmpKeyDataVal("a-seed-of-characters", "saltsaltsalt", &made) == 0);
+  CHECK(setAESKeyData("/dev/zero", &loaded) == 0 && freeAesKeyData(made) + freeAesKeyData(loaded) == 0);
+  deskey(schedule, block, 0);
+  des(schedule, block);
+  char* text = binaryBlobToBase64(block, 8);
+  unsigned char* back = base64ToBinaryBlob(text, &length);
+  CHECK(back != nullptr && length == 8 && std::memcmp(back, block, 8) == 0);
+  std::free(text);
+  std::free(back);
+}
+
 void worksInThreads() {
   inThreads(16, [](unsigned number) {
+    useTheOthers();
     for (unsigned round = 0; round < 200; ++round) useEachScheme(number + round);
   });
 }
