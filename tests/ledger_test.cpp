@@ -10,9 +10,11 @@
 // the host has taken the base64 alphabet away. What a row does not name there has to go well, and one without such
 // memory allocates nothing.
 //
-// And what of the host's state is another after any of these calls: its environment, signal mask, locale, errno or
-// floating-point state. An operation that changes one names it. The variable in which the loading of the provider says
-// which copy it tries does not count.
+// And what of the host's state is another after any of these calls: its environment, signal mask, locale, errno, error
+// queue of OpenSSL or floating-point state. An operation that changes one names it. The variable in which the loading of
+// the provider says which copy it tries does not count.
+#include <openssl/err.h>
+
 #include <cerrno>
 #include <cfenv>
 #include <climits>
@@ -223,6 +225,8 @@ class HostState {
     sigaddset(&signals, SIGUSR2);
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
     uselocale(newlocale(LC_NUMERIC_MASK, "C.UTF-8", nullptr));
+    ERR_clear_error();
+    ERR_raise(ERR_LIB_USER, 77);
     fesetround(FE_UPWARD);
   }
   static std::map<std::string, std::string> now() {
@@ -234,6 +238,8 @@ class HostState {
     for (int i = 1; i < SIGRTMAX; ++i) host["signal mask"] += std::to_string(sigismember(&signals, i));
     const locale_t locale = uselocale(nullptr);
     host["locale"] = setlocale(LC_ALL, nullptr) + toHex(&locale, sizeof locale);
+    const unsigned long errors[] = {ERR_peek_error(), ERR_peek_last_error()};
+    host["error queue"] = toHex(errors, sizeof errors);
     for (char** each = environ; *each != nullptr; ++each) {
       if (std::strncmp(*each, "TRESK_SHIPPED_QEL=", 18) != 0) host["environment"] += *each + std::string("\n");
     }
