@@ -131,7 +131,7 @@ void publishContext(void* context) noexcept {
 
 [[gnu::cold]] int firstContext(TracedCall& call) noexcept {
   const NoCancellation uncancelled;
-  if (__atomic_load_n(&isExiting, __ATOMIC_RELAXED)) {
+  if (__atomic_load_n(&isExiting, __ATOMIC_ACQUIRE) && currentContext() == nullptr) {
     return call.fail(LDAPPW_OPERATIONS_ERROR, "the process is exiting.");
   }
   char* loadedPath = nullptr;
