@@ -5,6 +5,7 @@
 #include <dlfcn.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <climits>
 #include <cstdio>
 #include <cstring>
@@ -13,7 +14,9 @@
 
 namespace {
 
-char folder[PATH_MAX];  // that holds qellib/; empty when it is not known
+char folder[PATH_MAX];  // that holds qellib/
+std::atomic<std::size_t> folderBytes{
+    0};  // with the NUL; 0 when it is not known. Other threads may load at the same time
 
 // Cuts the last component off an absolute path, and the slashes and components "." before it.
 void toParent(char* path) noexcept {
@@ -28,11 +31,13 @@ void toParent(char* path) noexcept {
   if (dladdr(reinterpret_cast<void*>(&treskqels_path), &info) == 0) return;
   if (*info.dli_fname != '/' && getcwd(here, sizeof here) == nullptr) return;
   const int length = std::snprintf(folder, sizeof folder, "%s%s%s", here, *here == '\0' ? "" : "/", info.dli_fname);
-  if (length < 0 || static_cast<std::size_t>(length) + sizeof "/.." > sizeof folder) return void(*folder = '\0');
+  if (length < 0 || static_cast<std::size_t>(length) + sizeof "/.." > sizeof folder) return;
   toParent(folder);
   char* end = folder + std::strlen(folder);
-  if (end - folder < 3 || std::strcmp(end - 3, "/..") != 0) return toParent(folder);
-  std::memcpy(end, "/..", sizeof "/..");  // the name of its parent is not in the text
+  const bool isNamed = end - folder < 3 || std::strcmp(end - 3, "/..") != 0;
+  isNamed ? toParent(folder)
+          : void(std::memcpy(end, "/..", sizeof "/.."));  // else its parent's name is not in the text
+  folderBytes.store(std::strlen(folder) + 1, std::memory_order_release);
 }
 
 }  // namespace
@@ -40,8 +45,8 @@ void toParent(char* path) noexcept {
 extern "C" {
 
 int treskqels_path(char* buffer, int size) noexcept {
-  const std::size_t bytes = std::strlen(folder) + 1;
-  if (buffer == nullptr || bytes == 1 || size < 0 || static_cast<std::size_t>(size) < bytes) return 0;
+  const std::size_t bytes = folderBytes.load(std::memory_order_acquire);
+  if (buffer == nullptr || bytes == 0 || size < 0 || static_cast<std::size_t>(size) < bytes) return 0;
   std::memcpy(buffer, folder, bytes);
   return 1;
 }
