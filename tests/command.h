@@ -15,49 +15,39 @@
 
 namespace test {
 
-// Puts an anonymous file with the content in the place of a standard descriptor while it lives.
-class Redirected {
- public:
-  explicit Redirected(int standard, const std::string& content = {})
-      : standard_(standard), before_(dup(standard)), file_(memfd_create("redirected", 0)) {
-    const auto size = static_cast<ssize_t>(content.size());
-    if (pwrite(file_, content.data(), content.size(), 0) != size || dup2(file_, standard) != standard) std::abort();
-  }
-  Redirected(const Redirected&) = delete;
-  Redirected& operator=(const Redirected&) = delete;
-  ~Redirected() {
-    dup2(before_, standard_);
-    close(before_);
-    close(file_);
-  }
-  std::string content() const { return fileContent("/proc/self/fd/" + std::to_string(file_)); }
-
- private:
-  int standard_, before_, file_;
-};
-
 struct Ran {
   int code;
   std::string out, err;
 };
 
-// Runs the command. Each of its messages carries its name, and none holds what a terminal acts on, or "hunter2".
+// Runs the command, with files in the place of the standard descriptors. Each of its messages carries its name, and none
+// holds what a terminal acts on, or "hunter2".
 inline Ran ran(std::vector<std::string> arguments, const std::string& input = {}) {
   arguments.insert(arguments.begin(), "ldappw");
   std::vector<char*> pointers;
   for (std::string& argument : arguments) pointers.push_back(argument.data());
   pointers.push_back(nullptr);
   std::fflush(stdout);
-  const Redirected in(0, input);
-  const auto out = std::make_unique<Redirected>(1), err = std::make_unique<Redirected>(2);
+  int before[3];
+  std::string contents[3];
+  for (const int i : {0, 1, 2}) {
+    const int file = memfd_create("standard", 0);
+    before[i] = dup(i);
+    if (pwrite(file, input.data(), i == 0 ? input.size() : 0, 0) < 0 || dup2(file, i) != i) std::abort();
+    close(file);
+  }
   const int code = tool::runCommand(static_cast<int>(arguments.size()), pointers.data());
-  Ran result{code, out->content(), err->content()};
-  std::istringstream lines(result.err);
+  for (const int i : {0, 1, 2}) {
+    contents[i] = fileContent("/proc/self/fd/" + std::to_string(i));
+    dup2(before[i], i);
+    close(before[i]);
+  }
+  std::istringstream lines(contents[2]);
   for (std::string line; std::getline(lines, line);) {
     EXPECT_TRUE(line.rfind("ldappw: ", 0) == 0 && line.find("hunter2") == std::string::npos) << line;
     EXPECT_TRUE(std::none_of(line.begin(), line.end(), [](char c) { return iscntrl(static_cast<unsigned char>(c)); }));
   }
-  return result;
+  return {code, contents[1], contents[2]};
 }
 
 // Of an extended regular expression, in which a dot is any character, newlines too.
@@ -92,19 +82,11 @@ inline std::string expanded(const std::string& text, const Names& names) {
   return result;
 }
 
-// The words of a command line, split at blanks outside single quotes.
+// The words of a command line.
 inline std::vector<std::string> wordsOf(const std::string& line, const Names& names) {
   std::vector<std::string> words;
-  bool within = false;
-  bool quoted = false;
-  for (const char c : line) {
-    if (c == '\'') quoted = !quoted;
-    const bool blank = c == ' ' && !quoted;
-    if (!blank && !within) words.emplace_back();
-    if (!blank && c != '\'') words.back() += c;
-    within = !blank;
-  }
-  for (std::string& word : words) word = expanded(word, names);
+  std::istringstream rest(line);
+  for (std::string word; rest >> word;) words.push_back(expanded(word, names));
   return words;
 }
 
@@ -193,6 +175,7 @@ class Folder : public testing::Test {
                {"value", kSsha + "\nother\n"},
                {"password", "secret\nother\n"},
                {"empty", ""},
+               {"bad", "letmein77\r\nhunter2xyz\n\n"},
                {"entries", "UID=A,dc = x\tsecret\nuid=a,dc=x\told\nuid=b,dc=x\tb\nc\tc\nd\td\n"},
                {"pairs", joined(pairs, '\n') + "tabless\n"},
                {"pairs0", joined(pairs, '\0')}}) {

@@ -67,42 +67,34 @@ std::string zstd(const std::string& bytes) {
   return packed;
 }
 
-// The content of a file as it is read in pieces of so many bytes, or what is wrong with it.
-std::string readAs(const std::string& path, size_t pieces) {
+// The content of a file as it is read, or what is wrong with it.
+std::string readFrom(const std::string& content) {
+  const TempFolder folder;
+  putFile(folder.file("in"), content);
   try {
-    tool::Input input(path);
+    tool::Input input(folder.file("in"));
     input.requireText();
-    Secret content;
-    while (input.more(content, pieces)) {
+    Secret text;
+    while (input.more(text, 65536)) {
     }
-    return std::string(content.view());
+    return std::string(text.view());
   } catch (const Failure& failure) {
-    return failure.what();
+    return std::string(failure.what()).substr(folder.file("in").size());
   }
 }
 
-// Two pieces, as log rotation appends them.
+// In two pieces, as log rotation appends them.
 TEST(Decompression, AnyLengthAndAnyCut) {
-  const TempFolder folder;
-  const std::string path = folder.file("packed");
-  std::string text = "dn: a\n" + std::string(300000, 'x') + "\n";
+  std::string text = "dn: a\n" + kLong + "\n";
   for (int i = 0; i < 30000; ++i) text += std::to_string(i * 7919) + "\n";
-  for (const auto& [pack, name] : {std::pair{gzip, "gzip"}, std::pair{zstd, "zstd"}}) {
-    const std::string packed = pack(text.substr(0, 200000)) + pack(text.substr(200000));
-    putFile(path, packed);
-    for (const size_t pieces : {4096, 65536, 262144}) EXPECT_TRUE(readAs(path, pieces) == text) << name << pieces;
-    if (pack == gzip) {
-      putFile(path, packed + std::string(512, '\0'));
-      EXPECT_TRUE(readAs(path, 65536) == text) << "zeros behind the last member";
-    }
-    putFile(path, packed + "rubbish");
-    EXPECT_EQ(readAs(path, 65536), path + ": the " + name + " data is damaged");
-    putFile(path, pack(packed));
-    EXPECT_EQ(readAs(path, 65536), path + " is no LDIF: it seems to be compressed twice");
+  for (const auto& [pack, name, zeros] : {std::tuple{&gzip, "gzip", 512}, std::tuple{&zstd, "zstd", 0}}) {
+    const std::string packed = pack(text.substr(0, 150000)) + pack(text.substr(150000));
+    EXPECT_TRUE(readFrom(packed + std::string(static_cast<size_t>(zeros), '\0')) == text) << name;
+    EXPECT_EQ(readFrom(packed + "rubbish"), ": the "s + name + " data is damaged");
+    EXPECT_EQ(readFrom(pack(packed)), " is no LDIF: it seems to be compressed twice");
     const std::string small = pack("dn: a\nuserPassword: secret\n");
     for (size_t bytes = 4; bytes < small.size(); ++bytes) {
-      putFile(path, small.substr(0, bytes));
-      EXPECT_EQ(readAs(path, 65536), path + ": the compressed data ends too early") << name << bytes;
+      EXPECT_EQ(readFrom(small.substr(0, bytes)), ": the compressed data ends too early") << name << bytes;
     }
   }
 }
