@@ -111,9 +111,9 @@ class Library {
 void storeEntry(const Entry& entry, void* address) noexcept {
   using Slot [[gnu::may_alias]] = void*;
   auto* slot = static_cast<Slot*>(entry.slot);
-  void* before = __atomic_load_n(slot, __ATOMIC_RELAXED);
+  void* before = __atomic_load_n(slot, __ATOMIC_ACQUIRE);
   if (before == address) return;
-  __atomic_compare_exchange_n(slot, &before, address, false, __ATOMIC_RELEASE, __ATOMIC_RELAXED);
+  __atomic_compare_exchange_n(slot, &before, address, false, __ATOMIC_RELEASE, __ATOMIC_ACQUIRE);
 }
 
 int resolveEntries(TracedCall& call, void** library) noexcept {
