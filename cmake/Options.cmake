@@ -2,6 +2,7 @@
 # Compiler and linker settings that every target of the build shares.
 set(LDAPPW_SANITIZE "" CACHE STRING "Sanitizers to build with, as -fsanitize= takes them")
 option(LDAPPW_COVERAGE "Instrument for gcov" OFF)
+option(LDAPPW_WERROR "Take warnings for errors; on in the presets" OFF)
 
 set(CMAKE_CXX_STANDARD 17)
 set(CMAKE_CXX_STANDARD_REQUIRED ON)
@@ -22,7 +23,8 @@ set(CMAKE_C_FLAGS_SANITIZE "-O1 -g1")
 add_library(ldappw_options INTERFACE)
 # Files and times of any size on 32-bit targets too.
 target_compile_definitions(ldappw_options INTERFACE _FILE_OFFSET_BITS=64 _TIME_BITS=64)
-target_compile_options(ldappw_options INTERFACE -fno-plt -Wall -Wextra -Wpedantic -Wconversion -Wshadow -Werror)
+target_compile_options(ldappw_options INTERFACE -fno-plt -Wall -Wextra -Wpedantic -Wconversion -Wshadow
+                                                $<$<BOOL:${LDAPPW_WERROR}>:-Werror>)
 if(LDAPPW_SANITIZE)
   target_compile_options(ldappw_options INTERFACE -fsanitize=${LDAPPW_SANITIZE} -fno-sanitize-recover=all
                                                   -fno-omit-frame-pointer)
@@ -30,13 +32,15 @@ if(LDAPPW_SANITIZE)
   # The provider's entries have handle types that the product, which knows them by name alone, calls with void*.
   target_compile_options(ldappw_options INTERFACE $<$<CXX_COMPILER_ID:Clang>:-fno-sanitize=function>)
 endif()
+include(CheckCXXCompilerFlag)
+check_cxx_compiler_flag(-fcf-protection LDAPPW_CF_PROTECTION)
 # Release files: guarded stacks, checked copies, marked jump targets, and no path of the machine that builds them. A target
 # with the property LDAPPW_GUARD_ARRAYS_ALONE has the guard in functions with arrays, not wherever an address is taken.
 # Builds of the type None are those of distributions, with flags of their own; Debian's leave the paths as they are when
 # one has a blank, and do not reach assembly.
 target_compile_options(ldappw_options INTERFACE
   $<$<CONFIG:Release>:-fstack-protector$<$<NOT:$<BOOL:$<TARGET_PROPERTY:LDAPPW_GUARD_ARRAYS_ALONE>>>:-strong>>
-  $<$<CONFIG:Release,None>:-fcf-protection>
+  $<$<AND:$<CONFIG:Release,None>,$<BOOL:${LDAPPW_CF_PROTECTION}>>:-fcf-protection>
   "$<$<CONFIG:Release,None>:-ffile-prefix-map=${PROJECT_SOURCE_DIR}=.>")
 target_compile_definitions(ldappw_options INTERFACE $<$<CONFIG:Release>:_FORTIFY_SOURCE=3>)
 if(LDAPPW_COVERAGE)
