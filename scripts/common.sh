@@ -87,16 +87,17 @@ build() { # preset, target...
 
 # Turns a builder's "[done/all]" lines into one line that changes, or into a line each quarter where none can.
 progress() { # what
-  local terminal=0
+  local line terminal=0 quarter last=-1
   [ ! -t 2 ] || terminal=1
-  awk -v what="$name: $1" -v terminal="$terminal" '
-    match($0, /^\[[0-9]+\/[0-9]+\]/) {
-      split(substr($0, 2, RLENGTH - 2), count, "/")
-      quarter = int(4 * count[1] / count[2])
-      if (terminal) printf "\r%s: %d of %d ", what, count[1], count[2]
-      else if (!shown++ || quarter > last) printf "%s: %d of %d\n", what, count[1], count[2]
-      last = quarter
-      fflush()
-    }
-    END { if (terminal && NR && last != "") print "" }' >&2
+  while IFS= read -r line; do
+    [[ $line =~ ^\[([0-9]+)/([0-9]+)\] ]] || continue
+    quarter=$((4 * BASH_REMATCH[1] / BASH_REMATCH[2]))
+    if [ $terminal = 1 ]; then
+      printf '\r%s: %s: %d of %d ' "$name" "$1" "${BASH_REMATCH[@]:1}"
+    elif ((quarter > last)); then
+      say "$1: ${BASH_REMATCH[1]} of ${BASH_REMATCH[2]}"
+    fi
+    last=$quarter
+  done >&2
+  if [ $terminal = 1 ] && ((last >= 0)); then echo >&2; fi
 }
