@@ -9,6 +9,7 @@ import base64
 import hashlib
 import pathlib
 import random
+import re
 import sys
 
 
@@ -40,7 +41,8 @@ def main():
         sync = base64.b64encode(derive(seed.encode(), salt.encode(), 3, len(seed))).decode()
         lines.append(f"record {seed} {salt} {sync} {derive(seed.encode(), salt.encode(), 10000, 32).hex()}")
     target = pathlib.Path(__file__).parent.parent / "tests" / "data" / "derivation.vec"
-    target.write_text("\n".join(lines) + "\n")
+    # A line of more than 120 columns goes on in lines that begin with two blanks.
+    target.write_text("".join("\n  ".join(re.findall("^.{1,120}|.{1,118}", line)) + "\n" for line in lines))
 
 
 if __name__ == "__main__":

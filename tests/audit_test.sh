@@ -51,9 +51,9 @@ test_counts() {
   json 'groups' "[f for f in d[0]['findings'] if f['name'] == 'reused'][0]['largestGroups'] == [{'entries': 2, 'dns':
     ['uid=%s,ou=%s,dc=example,dc=org' % name for name in pair]} for pair in ((('ben', 'People'), ('cem', 'People')),
     (('gus', 'Ops'), ('guy', 'OPS')), (('hal', 'Ops'), ('kim', 'Ops')))]"
-  json 'counts' "[d[0][name] for name in ('entries', 'accounts', 'values', 'urls', 'policyMet')] == [15, 13, 19, 1, None]
-    and {s['name']: s['values'] for s in d[0]['strengths']} == {'clear': 5, 'reversible': 3, 'unsalted': 5,
-    'salted-fast': 1, 'strong': 1, 'locked': 1, 'unknown': 1} and
+  json 'counts' "[d[0][name] for name in ('entries', 'accounts', 'values', 'urls', 'policyMet')] ==
+    [15, 13, 19, 1, None] and {s['name']: s['values'] for s in d[0]['strengths']} == {'clear': 5,
+    'reversible': 3, 'unsalted': 5, 'salted-fast': 1, 'strong': 1, 'locked': 1, 'unknown': 1} and
     {'name': 'sha512-crypt', 'strength': 'strong', 'values': 1} in d[0]['schemes']"
   json 'subtrees' "[(s['dn'], s['accounts'], s['values']) for s in d[0]['subtrees']] == [
     ('ou=ops,dc=example,dc=org', 8, 10), ('ou=people,dc=example,dc=org', 4, 5), ('ou=</td>,dc=example,dc=org', 1, 2)]"

@@ -20,8 +20,8 @@ struct Ran {
   std::string out, err;
 };
 
-// Runs the command, with files in the place of the standard descriptors. Each of its messages carries its name, and none
-// holds what a terminal acts on, or "hunter2".
+// Runs the command, with files in the place of the standard descriptors. Each of its messages carries its name, and
+// none holds what a terminal acts on, or "hunter2".
 inline Ran ran(std::vector<std::string> arguments, const std::string& input = {}) {
   arguments.insert(arguments.begin(), "ldappw");
   std::vector<char*> pointers;

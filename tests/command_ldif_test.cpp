@@ -88,8 +88,8 @@ TEST(LogicalLines, FoldAt76) {
   }
 }
 
-// A second run has nothing to do, and what an earlier one has made is not made again, but for the record that it had not
-// finished.
+// A second run has nothing to do, and what an earlier one has made is not made again, but for the record that it had
+// not finished.
 TEST_F(Folder, ResumesWhatWasStopped) {
   const TempFolder folder;
   const std::string in = folder.file("in"), made = folder.file("made");

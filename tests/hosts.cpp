@@ -132,7 +132,8 @@ int makeKeysWithoutMemory(long number, int andLater) {
   return bump_refuse(-1, 0) != 0 ? 77 : 0;
 }
 
-// In a child: a value is made while memory runs out at that request, and another one afterwards. 77: nothing was refused.
+// In a child: a value is made while memory runs out at that request, and another one afterwards. 77: nothing was
+// refused.
 int useWithoutMemory(int scheme, long number, int andLater) {
   alarm(20);
   char value[2][64];
@@ -147,8 +148,8 @@ int useWithoutMemory(int scheme, long number, int andLater) {
   return isEnd ? 77 : 0;
 }
 
-// The provider's part of the first use. Where memory is refused in its own start, an OpenSSL newer than 3.0 may wait for
-// itself or release a block twice.
+// The provider's part of the first use. Where memory is refused in its own start, an OpenSSL newer than 3.0 may wait
+// for itself or release a block twice.
 void startOpenssl() {
 #if OPENSSL_VERSION_PREREQ(3, 1)
   void* const provider = dlopen(LDAPPW_PROVIDER_PATH, RTLD_NOW);
@@ -201,7 +202,8 @@ void runsOutOfMemory() {
   std::free(text);
 }
 
-// A thread with a cancellation pending makes the first use, writes and reads files and prints; nothing of it is cut off.
+// A thread with a cancellation pending makes the first use, writes and reads files and prints; nothing of it is cut
+// off.
 void isCancelled() {
   std::atomic<bool> done{false};
   pthread_t thread;

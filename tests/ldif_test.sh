@@ -1,7 +1,7 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# The verbs that read directory exports, as a process and on whole exports: ldif_test.sh LDAPPW. What becomes of a line is
-# in command_ldif_test.cpp.
+# The verbs that read directory exports, as a process and on whole exports: ldif_test.sh LDAPPW. What becomes of a line
+# is in command_ldif_test.cpp.
 . "$(dirname "$0")/command_frame.sh"
 S={SHA}5en6G6MezRroT3XKqkdPOmY/BfQ=  # of "secret"
 for set in A B C; do

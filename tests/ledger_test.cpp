@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // A ledger of the exported operations. A row has what an operation gives when one of its arguments is odd while the
-// others are sound: an outcome for a pointer that is null; for a number that is the least, -1, 0 and the greatest; for a
-// count of bytes the same without the greatest, since that much memory is not there; for a slot that is null, and for
+// others are sound: an outcome for a pointer that is null; for a number that is the least, -1, 0 and the greatest; for
+// a count of bytes the same without the greatest, since that much memory is not there; for a slot that is null, and for
 // one that holds what no operation may release. "+" is a new result in the slot, "!" the line about invalid parameters.
 // Rows called "same" give one memory twice.
 //
@@ -11,8 +11,8 @@
 // memory allocates nothing.
 //
 // And what of the host's state is another after any of these calls: its environment, signal mask, locale, errno, error
-// queue of OpenSSL or floating-point state. An operation that changes one names it. The variable in which the loading of
-// the provider says which copy it tries does not count.
+// queue of OpenSSL or floating-point state. An operation that changes one names it. The variable in which the loading
+// of the provider says which copy it tries does not count.
 #include <openssl/err.h>
 
 #include <cerrno>
@@ -558,7 +558,8 @@ TEST_F(Ledger, HoldsForEveryOperation) {
   }
 }
 
-// What log readers find operations by: the scope's number, level and mask, and the line on entering, where there is one.
+// What log readers find operations by: the scope's number, level and mask, and the line on entering, where there is
+// one.
 constexpr char kScopes[] = R"(
 04090100 43 10000
 04090200 43 10000

@@ -263,7 +263,8 @@ TEST_F(Terminal, EndsTheProcessWhereEchoCannotBeSwitchedOffAndSaysSoWhereItStays
   }
 }
 
-// What a child that prompts on the terminal gets, with a signal in the middle; its exit status is the password's length.
+// What a child that prompts on the terminal gets, with a signal in the middle; its exit status is the password's
+// length.
 TEST_F(Terminal, EchoesAgainBeforeASignalActs) {
   static const struct {
     int signal;

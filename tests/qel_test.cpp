@@ -1,8 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// The crypto provider: OpenSSL's answers for every algorithm, misuse of every entry, wiping, refused memory, threads, and
-// the built library as the loader sees it. OpenSSL's allocator is replaced, so that blocks can be searched and refused,
-// and so is its giving of lists.
-// Hosts that fork, exit and cancel threads stand in hosts.cpp.
+// The crypto provider: OpenSSL's answers for every algorithm, misuse of every entry, wiping, refused memory, threads,
+// and the built library as the loader sees it. OpenSSL's allocator is replaced, so that blocks can be searched and
+// refused, and so is its giving of lists. Hosts that fork, exit and cancel threads stand in hosts.cpp.
 #include "qel.h"
 
 #include <dlfcn.h>
@@ -472,7 +471,8 @@ void expectNoSecret(const std::string& where) {
   EXPECT_EQ(secretsReleased.exchange(0), 0) << where;
 }
 
-// Uses an algorithm with a word, and ends its contexts in the middle of the work and after it, one by one and all at once.
+// Uses an algorithm with a word, and ends its contexts in the middle of the work and after it, one by one and all at
+// once.
 void useWith(const char* word, const char* name, bool isDigest) {
   for (size_t i = 0; i < sizeof secret; ++i) secret[i] = static_cast<unsigned char>(word[i % 8]);
   QEL_CTX* ctx = QEL_Init(nullptr, nullptr);
@@ -504,8 +504,8 @@ long placeThatDependsOnTheWord(const char* name, bool isDigest) {
   return useWith(kWord, name, isDigest), -1;
 }
 #else
-// All that this process can write, as it is at four moments, but for these copies and the stack, where OpenSSL's functions
-// leave words of theirs.
+// All that this process can write, as it is at four moments, but for these copies and the stack, where OpenSSL's
+// functions leave words of theirs.
 class Memory {
  public:
   static constexpr size_t kMost = size_t{1} << 26U;

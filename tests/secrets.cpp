@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a process has left in its memory when it exits: nothing of a password, a seed or a key. Each case is a program of
-// its own, either the command or this one with the case's name, which gets its secrets through a pipe and is stopped as
-// it exits; then all memory that it could write is searched, and so is what it has logged with everything traced.
+// What a process has left in its memory when it exits: nothing of a password, a seed or a key. Each case is a program
+// of its own, either the command or this one with the case's name, which gets its secrets through a pipe and is stopped
+// as it exits; then all memory that it could write is searched, and so is what it has logged with everything traced.
 #include <fcntl.h>
 #include <sys/ptrace.h>
 #include <sys/wait.h>

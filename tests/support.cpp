@@ -27,8 +27,8 @@ bool fails() {
   return failed;
 }
 
-// New memory is full of junk, which goes on behind its end up to a mark with the size: nothing may be taken for zero, and
-// nothing written there, without being noticed.
+// New memory is full of junk, which goes on behind its end up to a mark with the size: nothing may be taken for zero,
+// and nothing written there, without being noticed.
 constexpr unsigned char kJunk = 0xa5;
 struct Mark {
   static constexpr uint64_t kSign = 0x6c64617070770a5aU;

@@ -73,8 +73,8 @@ class TraceCapture {
 };
 
 // Counts the product's allocations on this thread and fails the one with the given number (from 0; -1 for none), or all
-// from that one on. Calls of malloc, calloc, strdup and free in the product's objects are routed here by the linker, and
-// a write behind the end of what they give ends the suite.
+// from that one on. Calls of malloc, calloc, strdup and free in the product's objects are routed here by the linker,
+// and a write behind the end of what they give ends the suite.
 class AllocationWatch {
  public:
   explicit AllocationWatch(long failing = -1, bool andLater = false);
