@@ -107,7 +107,7 @@ void AuditRules::loadKnownBad(const std::string& path) {
   std::sort(knownBad.begin(), knownBad.end());
 }
 
-std::unique_ptr<Facts> Collector::collect(RecordWalker& walker) {
+Facts Collector::collect(RecordWalker& walker) {
   std::uint64_t record = 0;
   while (walker.next()) {
     if (walker.line().blank() || walker.entries() != record) finishEntry();
@@ -115,7 +115,7 @@ std::unique_ptr<Facts> Collector::collect(RecordWalker& walker) {
     if (walker.atPassword()) takeLine(walker);
   }
   finishEntry();
-  facts_->entries = walker.entries();
+  facts_.entries = walker.entries();
   return std::move(facts_);
 }
 
@@ -135,10 +135,10 @@ void Collector::takeLine(const RecordWalker& walker) {
 
 void Collector::takePassword(const RecordWalker& walker, std::string_view type) {
   const PasswordLine& line = walker.password();
-  ++facts_->values;
-  facts_->urls += line.form == ValueForm::kUrl ? 1 : 0;
-  facts_->deleted += line.form == ValueForm::kDeleted ? 1 : 0;
-  facts_->authPasswords += line.form == ValueForm::kAuthPassword ? 1 : 0;
+  ++facts_.values;
+  facts_.urls += line.form == ValueForm::kUrl ? 1 : 0;
+  facts_.deleted += line.form == ValueForm::kDeleted ? 1 : 0;
+  facts_.authPasswords += line.form == ValueForm::kAuthPassword ? 1 : 0;
   if (line.form == ValueForm::kBroken) found(Finding::kBroken);
   const bool current = !isHistory(type);
   entry_.lines.push_back({walker.lineNumber(), line.description, line.form, line.problem, Secret(), current});
@@ -159,12 +159,12 @@ void Collector::finishEntry() {
   }
   if (entry_.account && !entry_.hasPassword) found(Finding::kNoPassword);
   if (entry_.account || entry_.hasPassword) {
-    ++facts_->accounts;
-    facts_->subtrees[subtreeOf(entry_.dn, rules_.subtreeDepth)].add(subtree);
+    ++facts_.accounts;
+    facts_.subtrees[subtreeOf(entry_.dn, rules_.subtreeDepth)].add(subtree);
   }
   const std::string dn = entry_.findings.any() ? keptDn(entry_.dn) : "";
   for (size_t i = 0; i < kFindingCount; ++i) {
-    if (entry_.findings.test(i)) facts_->findings[i].note(dn, rules_.listed);
+    if (entry_.findings.test(i)) facts_.findings[i].note(dn, rules_.listed);
   }
   entry_ = {};
   inEntry_ = holds_ = false;
@@ -190,8 +190,8 @@ Verdict Collector::judge(const Secret& value, bool current, Subtree& subtree) {
   const Scheme& scheme = examined.wrapping == Wrapping::kLocked ? *findScheme("locked") : examined.scheme();
   const bool locked = scheme.strength == Strength::kLocked;
   const auto strength = static_cast<size_t>(scheme.strength);
-  ++facts_->schemes[rowOf(scheme)];
-  ++facts_->strengths[strength];
+  ++facts_.schemes[rowOf(scheme)];
+  ++facts_.strengths[strength];
   ++subtree.values;
   ++subtree.strengths[strength];
   if (isFinding(scheme.strength)) found(findingOf(scheme.strength));
@@ -257,9 +257,9 @@ void Collector::tryNames(const Examined& value) {
 }
 
 void Collector::sight(const Mark& mark) {
-  if (!holds_) facts_->holders.push_back(keptDn(entry_.dn));
+  if (!holds_) facts_.holders.push_back(keptDn(entry_.dn));
   holds_ = true;
-  facts_->sightings.push_back({mark, facts_->holders.size() - 1});
+  facts_.sightings.push_back({mark, facts_.holders.size() - 1});
 }
 
 }  // namespace tool

@@ -3,7 +3,6 @@
 #pragma once
 
 #include <bitset>
-#include <memory>
 #include <string>
 #include <vector>
 
@@ -40,9 +39,9 @@ std::vector<std::string> auditedNames();
 class Collector {
  public:
   // The lines that the rules ask for are appended to out.
-  Collector(const AuditRules& rules, Secret& out) : rules_(rules), out_(out), facts_(std::make_unique<Facts>()) {}
+  Collector(const AuditRules& rules, Secret& out) : rules_(rules), out_(out) {}
 
-  std::unique_ptr<Facts> collect(RecordWalker& walker);
+  Facts collect(RecordWalker& walker);
   // The code of the first value that is not fine.
   ExitCode firstProblem() const noexcept { return firstProblem_; }
 
@@ -70,7 +69,7 @@ class Collector {
 
   const AuditRules& rules_;
   Secret& out_;
-  std::unique_ptr<Facts> facts_;
+  Facts facts_;
   Sha256 sha256_;
   Entry entry_;
   ExitCode firstProblem_ = kSuccess;

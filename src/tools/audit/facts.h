@@ -9,7 +9,6 @@
 #include <vector>
 
 #include "audit/mark.h"
-#include "ldif/export_run.h"
 #include "schemes/schemes.h"
 
 namespace tool {
@@ -62,7 +61,7 @@ struct Subtree {
   void add(const Subtree& other) noexcept;
 };
 
-struct Facts : Gathered {
+struct Facts {
   std::uint64_t entries = 0;
   std::uint64_t accounts = 0;  // entries that have a password or are expected to
   std::uint64_t values = 0;

@@ -4,24 +4,30 @@
 #include <utility>
 
 namespace tool {
+namespace {
+
+struct AuditPart : ExportPart {
+  Facts facts;
+};
+
+}  // namespace
 
 ExitCode auditExport(const ExportOptions& source, const AuditRules& rules, Facts& facts, Reuse& reuse,
                      Results& results) {
   ExportOptions audited = source;
   audited.others = auditedNames();
   Input input = openExport(audited);
-  const auto work = [&](RecordWalker& walker, Part& part) {
+  const auto work = [&](RecordWalker& walker, AuditPart& part) {
     Collector collector(rules, part.out);
-    part.gathered = collector.collect(walker);
+    part.facts = collector.collect(walker);
     if (rules.valuesAreProblems) keepFirst(part.exitCode, collector.firstProblem());
   };
-  const auto deliver = [&](const Part& part) {
-    auto& batch = static_cast<Facts&>(*part.gathered);
+  const auto deliver = [&](AuditPart& part) {
     results.write(part.out.view());
-    reuse.add(batch);
-    facts.add(std::move(batch), rules.listed);
+    reuse.add(part.facts);
+    facts.add(std::move(part.facts), rules.listed);
   };
-  return runExport(input, audited, work, deliver).exitCode;
+  return runExport<AuditPart>(input, audited, work, deliver).exitCode;
 }
 
 }  // namespace tool

@@ -5,6 +5,7 @@
 #include <algorithm>
 
 #include "base/text.h"
+#include "ldif/counts.h"
 #include "schemes/schemes.h"
 
 namespace tool {

@@ -17,6 +17,7 @@
 #include "base/signals.h"
 #include "base/text.h"
 #include "ldif/change_records.h"
+#include "ldif/counts.h"
 #include "ldif/key_ring.h"
 #include "password_schemes.h"
 #include "schemes/schemes.h"
@@ -25,51 +26,62 @@
 namespace tool {
 namespace {
 
-// Totals. What becomes of a value is one of those from kMade on.
-enum Total : size_t {
-  kValues,
-  kMade,
-  kCut,
-  kResumed,
-  kDone,
-  kAsTheyAre,
-  kOneWay,
-  kUrls,
-  kDeleted,
-  kAuthPasswords,
-  kFixed,
-  kDropped,
-  kLocked,
-  kWrapped,
-  kUnknownTags,
-  kMalformed,
-  kFailed
+struct Counts {
+  std::uint64_t values = 0;
+  std::uint64_t made = 0;
+  std::uint64_t cut = 0;
+  std::uint64_t resumed = 0;
+  std::uint64_t done = 0;
+  std::uint64_t asTheyAre = 0;
+  std::uint64_t oneWay = 0;
+  std::uint64_t urls = 0;
+  std::uint64_t deleted = 0;
+  std::uint64_t authPasswords = 0;
+  std::uint64_t fixed = 0;
+  std::uint64_t dropped = 0;
+  std::uint64_t locked = 0;
+  std::uint64_t wrapped = 0;
+  std::uint64_t unknownTags = 0;
+  std::uint64_t malformed = 0;
+  std::uint64_t failed = 0;
+};
+constexpr CountName<Counts> kNames[] = {
+    {&Counts::values, "values", "password values"},
+    {&Counts::made, "made", "converted"},
+    {&Counts::cut, "cut", "of these cut by the scheme"},
+    {&Counts::resumed, "resumed", "of these taken from the earlier run"},
+    {&Counts::done, "done", "done already, kept"},
+    {&Counts::asTheyAre, "asTheyAre", "clear already, kept"},
+    {&Counts::oneWay, "oneWay", "one-way, kept"},
+    {&Counts::urls, "urls", "behind a URL, kept"},
+    {&Counts::deleted, "deleted", "to be deleted, kept"},
+    {&Counts::authPasswords, "authPasswords", "of authPassword, kept"},
+    {&Counts::fixed, "fixed", "unwrapped and one-way"},
+    {&Counts::dropped, "dropped", "equal to another value of the entry, dropped"},
+    {&Counts::locked, "locked", "locked, kept"},
+    {&Counts::wrapped, "wrapped", "padded or encoded, kept"},
+    {&Counts::unknownTags, "unknownTags", "with an unknown tag, kept"},
+    {&Counts::malformed, "malformed", "malformed, kept"},
+    {&Counts::failed, "failed", "failed, kept"},
 };
 
-constexpr CountName kNames[] = {
-    {"values", "password values"},
-    {"made", "converted"},
-    {"cut", "of these cut by the scheme"},
-    {"resumed", "of these taken from the earlier run"},
-    {"done", "done already, kept"},
-    {"asTheyAre", "clear already, kept"},
-    {"oneWay", "one-way, kept"},
-    {"urls", "behind a URL, kept"},
-    {"deleted", "to be deleted, kept"},
-    {"authPasswords", "of authPassword, kept"},
-    {"fixed", "unwrapped and one-way"},
-    {"dropped", "equal to another value of the entry, dropped"},
-    {"locked", "locked, kept"},
-    {"wrapped", "padded or encoded, kept"},
-    {"unknownTags", "with an unknown tag, kept"},
-    {"malformed", "malformed, kept"},
-    {"failed", "failed, kept"},
-};
+// What becomes of a value is one of the counters.
+using Counter = std::uint64_t Counts::*;
 
 constexpr mode_t kNewFileMode = 0600;
 
-// Columns by scheme: what becomes of its values.
-enum Column : size_t { kNow, kLater };
+// What becomes of the values of a scheme.
+struct Plan {
+  std::uint64_t now = 0;
+  std::uint64_t later = 0;  // one-way, and weaker than the target: only their owners can present the passwords
+};
+constexpr CountName<Plan> kPlanNames[] = {{&Plan::now, "now", "now"},
+                                          {&Plan::later, "atNextLogin", "at the next login"}};
+
+struct ConversionPart : ExportPart {
+  Counts counts;
+  ByScheme<Plan> plan;
+};
 
 struct Conversion {
   const Scheme& target;
@@ -81,7 +93,7 @@ struct Conversion {
 
 // What became of one value, and the problem if there is one.
 struct Outcome {
-  Total total;
+  Counter counter;
   Status status;
 };
 
@@ -121,25 +133,26 @@ void proveTarget(const Conversion& conversion) {
 Outcome convertValue(const Examined& value, const Conversion& conversion, Secret& made) {
   const Scheme& source = value.scheme();
   const ConditionText& condition = textOf(value.condition);
-  if (source.kind == Kind::kUnknown) return {kUnknownTags, {kBadValue, "unknown tag; the value is kept"}};
+  if (source.kind == Kind::kUnknown) return {&Counts::unknownTags, {kBadValue, "unknown tag; the value is kept"}};
   if (value.wrapping != Wrapping::kNone) {
-    return {value.wrapping == Wrapping::kLocked ? kLocked : kWrapped, {condition.code, condition.text}};
+    return {value.wrapping == Wrapping::kLocked ? &Counts::locked : &Counts::wrapped, {condition.code, condition.text}};
   }
   if (source.kind == Kind::kOneWay) {
-    if (&source == &conversion.target && condition.code == kSuccess) return {kDone, {}};
-    return {condition.code == kSuccess ? kOneWay : kMalformed, {condition.code, condition.text}};
+    if (&source == &conversion.target && condition.code == kSuccess) return {&Counts::done, {}};
+    return {condition.code == kSuccess ? &Counts::oneWay : &Counts::malformed, {condition.code, condition.text}};
   }
-  if (source.isClear() && conversion.target.isClear()) return {kAsTheyAre, {}};
+  if (source.isClear() && conversion.target.isClear()) return {&Counts::asTheyAre, {}};
   Secret clear;
   // The new keys are for values that this run or an earlier one has made: those of another scheme are none of them.
   const size_t first = conversion.newKeys && &source != &conversion.target ? 1 : 0;
   const KeyRing::Opened opened = conversion.keys.open(value, first, clear);
   Status status = opened.status(conversion.options.allowBinary);
   const bool underNew = !source.needsKey() || (conversion.newKeys && opened.key == 0);
-  if (status.ok() && &source == &conversion.target && underNew && !value.value.tag().empty()) return {kDone, {}};
+  if (status.ok() && &source == &conversion.target && underNew && !value.value.tag().empty())
+    return {&Counts::done, {}};
   if (status.ok()) status = makeTarget(clear, conversion, made);
-  if (!status.ok()) return {kFailed, status};
-  return {conversion.target.cuts(clear.size()) ? kCut : kMade, {}};
+  if (!status.ok()) return {&Counts::failed, status};
+  return {conversion.target.cuts(clear.size()) ? &Counts::cut : &Counts::made, {}};
 }
 
 // What is within a padded or encoded value takes its place, converted where it can be.
@@ -150,28 +163,29 @@ Outcome fixValue(const Examined& value, const Conversion& conversion, Secret& ma
   }
   Secret inner = unwrapped(value.value.whole(), wrapping);
   const Outcome outcome = convertValue(examine(inner), conversion, made);
-  if (outcome.total != kOneWay && outcome.total != kAsTheyAre && outcome.total != kDone) return outcome;
+  if (outcome.counter != &Counts::oneWay && outcome.counter != &Counts::asTheyAre && outcome.counter != &Counts::done)
+    return outcome;
   made = std::move(inner);
-  return {kFixed, {}};
+  return {&Counts::fixed, {}};
 }
 
 // Of a line that holds no value to convert.
 Outcome outcomeWithout(const PasswordLine& password) {
-  constexpr Total kKept[] = {kMade, kUrls, kDeleted, kAuthPasswords};
-  if (password.form == ValueForm::kBroken) return {kFailed, {kBadValue, password.problem}};
+  constexpr Counter kKept[] = {&Counts::made, &Counts::urls, &Counts::deleted, &Counts::authPasswords};
+  if (password.form == ValueForm::kBroken) return {&Counts::failed, {kBadValue, password.problem}};
   return {kKept[static_cast<size_t>(password.form)], {}};
 }
 
 Outcome outcomeOf(const RecordWalker& walker, const Examined& value, const Conversion& conversion, Secret& made) {
   const PasswordLine& password = walker.password();
   if (conversion.options.changes && (walker.inChange() || walker.dn().empty() || walker.dn().front() == ':')) {
-    return {kFailed, {kBadValue, "no change can be written for a change record, or without a well-formed dn"}};
+    return {&Counts::failed, {kBadValue, "no change can be written for a change record, or without a well-formed dn"}};
   }
   if (const Secret* earlier = conversion.earlier.find(walker, password.whole(password.value))) {
     made = Secret(earlier->view().substr(password.history.size()));
     if (!password.history.empty()) made = Secret(made.view().substr(made.view().find('#') + 1));
     const StoredValue taken(made);
-    if (&taken.scheme() == &conversion.target && taken.problem() == nullptr) return {kResumed, {}};
+    if (&taken.scheme() == &conversion.target && taken.problem() == nullptr) return {&Counts::resumed, {}};
   }
   return fixValue(value, conversion, made);
 }
@@ -204,23 +218,22 @@ class EntryValues {
   std::uint64_t group_ = 0;
 };
 
-constexpr bool isChanged(Total total) {
-  return total == kMade || total == kCut || total == kResumed || total == kFixed;
+constexpr bool isChanged(Counter counter) {
+  return counter == &Counts::made || counter == &Counts::cut || counter == &Counts::resumed ||
+         counter == &Counts::fixed;
 }
 
-// What the scheme's values come to, for the plan. A one-way value that is weaker than the new ones has to wait until its
-// owner presents the password.
-void countForPlan(const Scheme& source, Total total, const Conversion& conversion, Tally& tally) {
+void countForPlan(const Scheme& source, Counter counter, const Scheme& target, ByScheme<Plan>& plan) {
   if (source.kind == Kind::kUnknown) return;
-  const bool later = total == kOneWay && source.strength < conversion.target.strength;
-  if (isChanged(total)) ++tally.of(source)[kNow];
-  if (later && conversion.target.kind == Kind::kOneWay) ++tally.of(source)[kLater];
+  const bool later = counter == &Counts::oneWay && source.strength < target.strength;
+  if (isChanged(counter)) ++plan.of(source).now;
+  if (later && target.kind == Kind::kOneWay) ++plan.of(source).later;
 }
 
-// One after the other the lines of a batch.
+// Converts the lines of a batch, one after the other.
 class Converter {
  public:
-  Converter(const Conversion& conversion, Part& part) : conversion_(conversion), part_(part) {}
+  Converter(const Conversion& conversion, ConversionPart& part) : conversion_(conversion), part_(part) {}
 
   void all(RecordWalker& walker) {
     while (walker.next()) walker.atPassword() ? convert(walker) : keep(walker);
@@ -239,15 +252,15 @@ class Converter {
     std::optional<Examined> value;
     if (password.form == ValueForm::kBytes) value = examine(password.value);
     const Outcome outcome = value ? outcomeOf(walker, *value, conversion_, made) : outcomeWithout(password);
-    const bool changed = isChanged(outcome.total);
-    auto& totals = part_.tally.totals;
-    ++totals[kValues];
+    const bool changed = isChanged(outcome.counter);
+    Counts& counts = part_.counts;
+    ++counts.values;
     if (!outcome.status.ok()) part_.report(walker.lineNumber(), walker.dn(), outcome.status.code, outcome.status.text);
     const Secret whole = password.whole(changed ? made : password.value);
     const bool repeated = value && values_.repeats(walker, whole, changed);
-    ++totals[repeated ? kDropped : outcome.total];
-    if (!repeated && (outcome.total == kCut || outcome.total == kResumed)) ++totals[kMade];
-    if (value) countForPlan(value->scheme(), outcome.total, conversion_, part_.tally);
+    ++(counts.*(repeated ? &Counts::dropped : outcome.counter));
+    if (!repeated && (outcome.counter == &Counts::cut || outcome.counter == &Counts::resumed)) ++counts.made;
+    if (value) countForPlan(value->scheme(), outcome.counter, conversion_.target, part_.plan);
     write(walker, whole, changed, repeated);
   }
 
@@ -264,7 +277,7 @@ class Converter {
   }
 
   const Conversion& conversion_;
-  Part& part_;
+  ConversionPart& part_;
   EntryValues values_;
   ChangeWriter changes_;
 };
@@ -281,44 +294,53 @@ const Scheme& targetOf(const LdifOptions& options) {
   return *scheme;
 }
 
-// The number of a column by scheme, "clear 3, aes256 2".
-std::string listed(const Tally& tally, Column column) {
+// The schemes of which a counter of the plan is not 0.
+template <typename Work>
+void forEachPlanned(const ByScheme<Plan>& plan, std::uint64_t Plan::*counter, const Work& work) {
+  for (const Scheme& scheme : kSchemes) {
+    const std::uint64_t count = plan.of(scheme).*counter;
+    if (count > 0) work(scheme.name, count);
+  }
+}
+
+// "clear 3, aes256 2"
+std::string listed(const ByScheme<Plan>& plan, std::uint64_t Plan::*counter) {
   std::string list;
-  forEachScheme(tally, column, [&](const Scheme& scheme, std::uint64_t count) {
-    list += (list.empty() ? "" : ", ") + std::string(scheme.name) + " " + std::to_string(count);
+  forEachPlanned(plan, counter, [&](const char* scheme, std::uint64_t count) {
+    list += (list.empty() ? "" : ", ") + std::string(scheme) + " " + std::to_string(count);
   });
   return list;
 }
 
-void addListed(Json& json, const char* name, const Tally& tally, Column column) {
-  json.open(name);
-  forEachScheme(tally, column, [&](const Scheme& scheme, std::uint64_t count) { json.number(scheme.name, count); });
-  json.close();
+void writeObject(std::uint64_t entries, const ConversionPart& sum) {
+  Results results;
+  Json json;
+  json.number("entries", entries);
+  addFields(json, sum.counts, kNames);
+  for (const CountName<Plan>& row : kPlanNames) {
+    json.open(row.name);
+    forEachPlanned(sum.plan, row.counter, [&](const char* scheme, std::uint64_t count) { json.number(scheme, count); });
+    json.close();
+  }
+  results.line(json.end());
+  results.flush();
 }
 
-void showSummary(const Tally& tally, const Conversion& conversion) {
+void showSummary(std::uint64_t entries, const ConversionPart& sum, const Conversion& conversion) {
   const Scheme& target = conversion.target;
-  if (tally.totals[kCut] > 0) {
-    warning(std::to_string(tally.totals[kCut]) + " passwords are longer than the " + std::to_string(target.cutBytes) +
+  if (sum.counts.cut > 0) {
+    warning(std::to_string(sum.counts.cut) + " passwords are longer than the " + std::to_string(target.cutBytes) +
             " bytes that " + target.name + " uses: only their beginnings will be checked");
   }
-  if (conversion.options.json) {
-    Results results;
-    Json object;
-    object.number("entries", tally.entries);
-    addCounts(object, kNames, tally.totals.data());
-    addListed(object, "now", tally, kNow);
-    addListed(object, "atNextLogin", tally, kLater);
-    results.line(object.end());
-    return results.flush();
+  if (conversion.options.json) return writeObject(entries, sum);
+  message("entries: " + std::to_string(entries));
+  for (const CountName<Counts>& row : kNames) {
+    const std::uint64_t count = sum.counts.*row.counter;
+    const bool always = row.counter == &Counts::values || row.counter == &Counts::made;
+    if (always || count > 0) message(std::string(row.text) + ": " + std::to_string(count));
   }
-  message("entries: " + std::to_string(tally.entries));
-  for (size_t total = kValues; total <= kFailed; ++total) {
-    const std::uint64_t count = tally.totals[total];
-    if (total <= kMade || count > 0) message(std::string(kNames[total].text) + ": " + std::to_string(count));
-  }
-  const std::string now = listed(tally, kNow);
-  const std::string later = listed(tally, kLater);
+  const std::string now = listed(sum.plan, &Plan::now);
+  const std::string later = listed(sum.plan, &Plan::later);
   if (!now.empty()) message((conversion.options.dryRun ? "would now be " : "now ") + (target.name + (": " + now)));
   if (!later.empty()) message(std::string(target.name) + " only at the next login: " + later);
 }
@@ -354,19 +376,23 @@ ExitCode convertExport(const LdifOptions& options) {
   }
   std::optional<GracefulStop> stop;  // what has been written of changes is whole, what of an export is not
   if (options.changes) stop.emplace();
-  const auto deliver = [&](const Part& part) {
+  ConversionPart sum;
+  const auto deliver = [&](const ConversionPart& part) {
     file ? file->write(part.out.view()) : writeAll(STDOUT_FILENO, part.out.view(), "standard output");
+    addCounts(sum.counts, part.counts, kNames);
+    sum.plan.add(part.plan, kPlanNames);
   };
   ExportOptions source = options.source;
   source.resultsOnStdout = !file;
   source.costly = isCostly(conversion.target);
-  const Part sum = runExport(
-      input, source, [&](RecordWalker& walker, Part& part) { Converter(conversion, part).all(walker); }, deliver);
+  const ExportSum whole = runExport<ConversionPart>(
+      input, source, [&](RecordWalker& walker, ConversionPart& part) { Converter(conversion, part).all(walker); },
+      deliver);
   if (file) file->commit();
-  if (!options.quiet) showSummary(sum.tally, conversion);
+  if (!options.quiet) showSummary(whole.entries, sum, conversion);
   if (stop && stopIsAsked()) message("stopped before the end of the export; --resume goes on with what was written");
   if (stop) stop->finish();
-  return sum.exitCode;
+  return whole.exitCode;
 }
 
 }  // namespace tool

@@ -87,52 +87,34 @@ void Progress::hide() noexcept {
   visible_ = false;
 }
 
-class Run {
+}  // namespace
+
+class ExportRun::State {
  public:
-  Run(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
-      const std::function<void(const Part&)>& deliver)
+  State(Input& input, const ExportOptions& options)
       : input_(input),
         reader_(input, options.costly ? kCostlyBatchBytes : RecordReader::kBatchBytes),
         attributes_(options.attributes, options.others),
         progress_(input.fd(), options.resultsOnStdout, options.progress),
-        work_(work),
-        deliver_(deliver) {}
+        threads_(options.threads > 0 ? options.threads : std::max(1U, std::thread::hardware_concurrency())) {}
 
-  Part all(unsigned threads) {
+  const AttributeSet& attributes() const noexcept { return attributes_; }
+
+  ExportSum all(const std::function<void()>& loop) {
     std::vector<std::thread> helpers;
-    helpers.reserve(threads);
+    helpers.reserve(threads_);
     try {
-      for (unsigned i = 1; i < threads; ++i) helpers.emplace_back([this] { loop(); });
+      for (unsigned i = 1; i < threads_; ++i) helpers.emplace_back([&] { guarded(loop); });
     } catch (const std::system_error&) {
       // Fewer threads do the same work.
     }
-    loop();
+    guarded(loop);
     for (std::thread& helper : helpers) helper.join();
     progress_.hide();
     messages_.finish();
     if (failure_) std::rethrow_exception(failure_);
     reportWhole();
-    return std::move(sum_);
-  }
-
- private:
-  void loop() noexcept {
-    try {
-      Batch batch;
-      Part part;
-      while (take(batch)) {
-        RecordWalker walker(batch, attributes_);
-        work_(walker, part);
-        part.tally.entries = walker.entries();
-        part.tally.outside = walker.outside().size();
-        for (const std::uint64_t line : walker.outside()) part.report(line, "", kBadValue, kOutsideText);
-        if (!hand(batch, part, walker.seen())) return;
-        part.out.clear();
-        part = {std::move(part.out), {}, {}, kSuccess, nullptr};
-      }
-    } catch (...) {
-      stop(std::current_exception());
-    }
+    return sum_;
   }
 
   bool take(Batch& batch) {
@@ -142,29 +124,40 @@ class Run {
     return true;
   }
 
-  bool hand(const Batch& batch, const Part& part, std::uint64_t seen) {
+  bool hand(const Batch& batch, const RecordWalker& walker, ExportPart& part, const std::function<void()>& deliver) {
+    constexpr char kOutside[] = "lines that belong to no entry";
+    for (const std::uint64_t line : walker.outside()) part.report(line, "", kBadValue, kOutside);
     std::unique_lock<std::mutex> lock(output_);
     turn_.wait(lock, [&] { return failure_ || due_ == batch.number; });
     if (failure_) return false;
-    deliver_(part);
+    deliver();
     if (!part.messages.empty()) progress_.hide();
-    for (const Part::Message& one : part.messages) messages_.add(one.text, one.kind);
+    for (const ExportPart::Message& one : part.messages) messages_.add(one.text, one.kind);
     if (batch.number == 0 && batch.text.view().substr(0, kByteOrderMark.size()) == kByteOrderMark) {
       warning(input_.name() + " begins with a byte order mark, which LDIF does not have");
     }
-    seen_ |= seen;
+    seen_ |= walker.seen();
     cutOff_ = batch.text.view().back() != '\n';
     keepFirst(sum_.exitCode, part.exitCode);
-    sum_.tally.add(part.tally);
-    progress_.advance(part.tally.entries, batch.inputBytes);
+    sum_.entries += walker.entries();
+    progress_.advance(walker.entries(), batch.inputBytes);
     ++due_;
     turn_.notify_all();
     return true;
   }
 
+ private:
+  void guarded(const std::function<void()>& loop) noexcept {
+    try {
+      loop();
+    } catch (...) {
+      stop(std::current_exception());
+    }
+  }
+
   void reportWhole() const {
     if (stopIsAsked()) return;
-    if (sum_.tally.entries == 0) {
+    if (sum_.entries == 0) {
       throw Failure(kBadValue, input_.name() + " has no entry, no line that begins with \"dn:\"; it seems to be " +
                                    input_.seems());
     }
@@ -189,8 +182,7 @@ class Run {
   RecordReader reader_;
   const AttributeSet attributes_;
   Progress progress_;
-  const std::function<void(RecordWalker&, Part&)>& work_;
-  const std::function<void(const Part&)>& deliver_;
+  const unsigned threads_;
   std::mutex reading_;
   std::mutex output_;
   std::condition_variable turn_;
@@ -199,12 +191,30 @@ class Run {
   Repeated messages_{kMostOfAKind, message};
   std::uint64_t seen_ = 0;
   bool cutOff_ = false;
-  Part sum_;
+  ExportSum sum_;
 };
 
-}  // namespace
+ExportRun::ExportRun(Input& input, const ExportOptions& options) : state_(std::make_unique<State>(input, options)) {}
+ExportRun::~ExportRun() = default;
 
-void Part::report(std::uint64_t line, const std::string& dn, ExitCode code, const std::string& text) {
+const AttributeSet& ExportRun::attributes() const noexcept {
+  return state_->attributes();
+}
+
+ExportSum ExportRun::all(const std::function<void()>& loop) {
+  return state_->all(loop);
+}
+
+bool ExportRun::take(Batch& batch) {
+  return state_->take(batch);
+}
+
+bool ExportRun::hand(const Batch& batch, const RecordWalker& walker, ExportPart& part,
+                     const std::function<void()>& deliver) {
+  return state_->hand(batch, walker, part, deliver);
+}
+
+void ExportPart::report(std::uint64_t line, const std::string& dn, ExitCode code, const std::string& text) {
   messages.push_back({"line " + std::to_string(line) + ": " + (dn.empty() ? "(no dn)" : dn) + ": " + text, text});
   keepFirst(exitCode, code);
 }
@@ -215,12 +225,6 @@ Input openExport(const ExportOptions& options) {
   Input input = Input(options.in);
   input.requireText();
   return input;
-}
-
-Part runExport(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
-               const std::function<void(const Part& part)>& deliver) {
-  const unsigned threads = options.threads > 0 ? options.threads : std::max(1U, std::thread::hardware_concurrency());
-  return Run(input, options, work, deliver).all(threads);
 }
 
 }  // namespace tool

@@ -1,29 +1,23 @@
 // SPDX-License-Identifier: Apache-2.0
-// Runs a pass over a directory export: batches of records through several threads, and what comes of them in the order
-// of the input. A pass is a work, which makes a part of one batch, and a delivery, which takes the output of the parts.
+// Runs a pass over a directory export: several threads work on batches of records, and what they make of them is delivered
+// in the order of the input.
 #pragma once
 
 #include <cstdint>
 #include <functional>
 #include <memory>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "base/failure.h"
 #include "base/input.h"
 #include "ldif/record.h"
-#include "ldif/tally.h"
 
 namespace tool {
 
-// What a pass makes of a batch beside the counts: each that needs it derives its own.
-struct Gathered {
-  virtual ~Gathered() = default;
-};
-constexpr char kOutsideText[] = "lines that belong to no entry";
-
-// What comes of one batch, and in sum of all.
-struct Part {
+// What a pass makes of a batch. A pass that counts anything derives a part of its own.
+struct ExportPart {
   struct Message {
     std::string text;
     std::string kind;  // the text without the place
@@ -31,12 +25,15 @@ struct Part {
 
   Secret out;
   std::vector<Message> messages;
-  Tally tally;
   ExitCode exitCode = kSuccess;  // of the first problem
-  std::unique_ptr<Gathered> gathered;
 
   // Reports a problem with a value of an entry.
   void report(std::uint64_t line, const std::string& dn, ExitCode code, const std::string& text);
+};
+
+struct ExportSum {
+  std::uint64_t entries = 0;
+  ExitCode exitCode = kSuccess;  // of the first problem
 };
 
 struct ExportOptions {
@@ -46,17 +43,51 @@ struct ExportOptions {
   unsigned threads = 0;                 // 0: one a processor
   bool resultsOnStdout = false;         // the progress line stays away from them
   bool progress = false;                // progress also where standard error is no terminal
-  bool costly = false;                  // values take so long that few at a time are worked on
+  bool costly = false;                  // values are expensive: use small batches
 };
 
 // Opens the export, compressed or not, and the library that its lines need. Throws Failure.
 Input openExport(const ExportOptions& options);
 
-// work runs on many threads at once; deliver, and all reporting, on one at a time, in order. An exception of either
-// ends all and leaves runExport. Returns the sum of the parts, without their output, messages and what was gathered.
-// Lines that belong to no entry are reported here, and what is odd about the export as a whole; one without entries is
-// a Failure (kBadValue).
-Part runExport(Input& input, const ExportOptions& options, const std::function<void(RecordWalker&, Part&)>& work,
-               const std::function<void(const Part& part)>& deliver);
+// The threads of a pass, and the order of their batches.
+class ExportRun {
+ public:
+  ExportRun(Input& input, const ExportOptions& options);
+  ~ExportRun();
+  ExportRun(const ExportRun&) = delete;
+  ExportRun& operator=(const ExportRun&) = delete;
+
+  const AttributeSet& attributes() const noexcept;
+  // Runs loop on each thread. If one throws, all stop and this rethrows.
+  ExportSum all(const std::function<void()>& loop);
+  // For a loop: the next batch, false at the end; and the turn of a batch, false after a failure.
+  bool take(Batch& batch);
+  bool hand(const Batch& batch, const RecordWalker& walker, ExportPart& part, const std::function<void()>& deliver);
+
+ private:
+  class State;
+  std::unique_ptr<State> state_;
+};
+
+// Calls work(walker, part) on many threads at once, and deliver(part) on one at a time, in order. If either throws, all
+// threads stop and runExport rethrows. Reports lines that belong to no entry, and what is odd about the export as a
+// whole; throws Failure (kBadValue) for one without entries.
+template <typename Part, typename Work, typename Deliver>
+ExportSum runExport(Input& input, const ExportOptions& options, const Work& work, const Deliver& deliver) {
+  ExportRun run(input, options);
+  return run.all([&] {
+    Batch batch;
+    Secret memory;  // of the part before
+    while (run.take(batch)) {
+      Part part;
+      part.out = std::move(memory);
+      RecordWalker walker(batch, run.attributes());
+      work(walker, part);
+      if (!run.hand(batch, walker, part, [&] { deliver(part); })) return;
+      memory = std::move(part.out);
+      memory.clear();
+    }
+  });
+}
 
 }  // namespace tool

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "ldif/export_run.h"
+#include "schemes/scheme.h"
 
 namespace tool {
 

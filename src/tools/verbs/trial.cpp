@@ -7,6 +7,7 @@
 #include <ctime>
 #include <optional>
 
+#include "ldif/counts.h"
 #include "ldif/export_run.h"
 #include "password_schemes.h"
 #include "schemes/schemes.h"
@@ -15,23 +16,41 @@
 namespace tool {
 namespace {
 
-// Totals: the clear passwords; the reversible values that the keys open and those that they do not; one-way, unknown,
-// elsewhere or not well formed; what went wrong.
-enum Total : size_t { kClear, kRead, kUnread, kOther, kDifferences };
-// Columns: values made; those accepted; those whose wrong password was refused; those read back and equal, as far as
-// the scheme holds the password; passwords that the scheme cannot hold; processor time.
-enum Column : size_t { kMade, kVerified, kRefused, kRecovered, kSkipped, kNanoseconds };
+struct Counts {
+  std::uint64_t clear = 0;
+  std::uint64_t read = 0;    // reversible values that the keys open
+  std::uint64_t unread = 0;  // and those that they do not
+  std::uint64_t others = 0;  // one-way, unknown, elsewhere or not well formed
+  std::uint64_t differences = 0;
+};
+constexpr CountName<Counts> kNames[] = {{&Counts::clear, "clear", "clear passwords"},
+                                        {&Counts::read, "reversibleRead", "reversible values read"},
+                                        {&Counts::unread, "reversibleUnread", "not read"},
+                                        {&Counts::others, "others", "others"},
+                                        {&Counts::differences, "differences", "differences"}};
 
-constexpr CountName kTotalNames[] = {{"clear", "clear passwords"},
-                                     {"reversibleRead", "reversible values read"},
-                                     {"reversibleUnread", "not read"},
-                                     {"others", "others"},
-                                     {"differences", "differences"}};
-constexpr CountName kColumnNames[] = {{"values", "values"},
-                                      {"verified", "verified"},
-                                      {"refused", "refused"},
-                                      {"recovered", "recovered"},
-                                      {"skipped", "skipped"}};
+struct SchemeCounts {
+  std::uint64_t made = 0;
+  std::uint64_t verified = 0;
+  std::uint64_t refused = 0;    // the wrong password of a value
+  std::uint64_t recovered = 0;  // read back and equal, as far as the scheme holds the password
+  std::uint64_t skipped = 0;    // passwords that the scheme cannot hold
+  std::uint64_t nanoseconds = 0;
+};
+constexpr CountName<SchemeCounts> kSchemeNames[] = {
+    {&SchemeCounts::made, "values", "values"},      {&SchemeCounts::verified, "verified", "verified"},
+    {&SchemeCounts::refused, "refused", "refused"}, {&SchemeCounts::recovered, "recovered", "recovered"},
+    {&SchemeCounts::skipped, "skipped", "skipped"}, {&SchemeCounts::nanoseconds, nullptr, nullptr}};
+
+// True for a counter that is shown for the scheme.
+bool isShown(const CountName<SchemeCounts>& row, const Scheme& scheme) noexcept {
+  return row.name != nullptr && (scheme.reversible() || row.counter != &SchemeCounts::recovered);
+}
+
+struct TrialPart : ExportPart {
+  Counts counts;
+  ByScheme<SchemeCounts> schemes;
+};
 
 constexpr char kNotes[] =
     R"(verified: accepted by the server's check. refused: a password that differs in the first byte is not accepted.
@@ -73,66 +92,66 @@ Secret wrongFor(const Secret& password) {
 }
 
 // The first thing that goes wrong, or null.
-const char* tryPassword(const Scheme& scheme, const Secret& password, const KeyRecord& keys, Tally::Row& counts) {
+const char* tryPassword(const Scheme& scheme, const Secret& password, const KeyRecord& keys, SchemeCounts& counts) {
   Secret stored;
   const Status made = makeValue(scheme, keys, password, stored);
   if (!made.ok()) return made.text;
-  ++counts[kMade];
+  ++counts.made;
   const char* problem = nullptr;
-  const auto check = [&](bool good, Column column, const char* text) {
-    if (good) ++counts[column];
+  const auto check = [&](bool good, std::uint64_t& counter, const char* text) {
+    if (good) ++counter;
     if (!good && problem == nullptr) problem = text;
   };
-  check(serverAccepts(stored, keys, password), kVerified, "the value does not verify");
-  check(!serverAccepts(stored, keys, wrongFor(password)), kRefused, "a wrong password verifies");
+  check(serverAccepts(stored, keys, password), counts.verified, "the value does not verify");
+  check(!serverAccepts(stored, keys, wrongFor(password)), counts.refused, "a wrong password verifies");
   if (!scheme.reversible()) return problem;
   Secret clear;
   const size_t held = scheme.cutBytes != 0 ? scheme.cutBytes : std::string_view::npos;
   const bool same =
       openValue(examine(stored), keys, clear).ok() && equalBytes(clear.view(), password.view().substr(0, held));
-  check(same, kRecovered, "the password does not come back from the value");
+  check(same, counts.recovered, "the password does not come back from the value");
   return problem;
 }
 
-void tryScheme(const Scheme& scheme, const std::vector<Candidate>& candidates, const KeyRecord& keys, Part& part) {
+void tryScheme(const Scheme& scheme, const std::vector<Candidate>& candidates, const KeyRecord& keys, TrialPart& part) {
   const std::uint64_t start = threadNanoseconds();
-  Tally::Row& counts = part.tally.of(scheme);
+  SchemeCounts& counts = part.schemes.of(scheme);
   for (const Candidate& candidate : candidates) {
     if (!passwordProblem(scheme, candidate.password.view()).ok()) {
-      ++counts[kSkipped];
+      ++counts.skipped;
       continue;
     }
     const char* problem = tryPassword(scheme, candidate.password, keys, counts);
     if (problem == nullptr) continue;
-    ++part.tally.totals[kDifferences];
+    ++part.counts.differences;
     part.report(candidate.line, candidate.dn, kBadValue, std::string(scheme.name) + ": " + problem);
   }
-  counts[kNanoseconds] += threadNanoseconds() - start;
+  counts.nanoseconds += threadNanoseconds() - start;
 }
 
 // Counts the value, and returns it when it is a clear password.
-std::optional<Candidate> candidateOf(const RecordWalker& walker, const KeyRecord& keys, Tally& tally) {
+std::optional<Candidate> candidateOf(const RecordWalker& walker, const KeyRecord& keys, Counts& counts) {
   const PasswordLine& password = walker.password();
   if (password.form != ValueForm::kBytes) {
-    ++tally.totals[kOther];
+    ++counts.others;
     return std::nullopt;
   }
   const Examined value = examine(password.value);
   const Kind kind = value.scheme().kind;
   Secret opened;
   if (kind == Kind::kClear) {
-    ++tally.totals[kClear];
+    ++counts.clear;
     return Candidate{walker.lineNumber(), walker.dn(), Secret(password.value.view())};
   }
-  ++tally.totals[kind != Kind::kReversible ? kOther : openValue(value, keys, opened).ok() ? kRead : kUnread];
+  ++(kind != Kind::kReversible ? counts.others : openValue(value, keys, opened).ok() ? counts.read : counts.unread);
   return std::nullopt;
 }
 
-void tryBatch(RecordWalker& walker, const KeyRecord& keys, Part& part) {
+void tryBatch(RecordWalker& walker, const KeyRecord& keys, TrialPart& part) {
   std::vector<Candidate> candidates;
   while (walker.next()) {
     if (!walker.atPassword()) continue;
-    std::optional<Candidate> candidate = candidateOf(walker, keys, part.tally);
+    std::optional<Candidate> candidate = candidateOf(walker, keys, part.counts);
     if (candidate) candidates.push_back(std::move(*candidate));
   }
   for (const Scheme& scheme : kSchemes) {
@@ -140,46 +159,46 @@ void tryBatch(RecordWalker& walker, const KeyRecord& keys, Part& part) {
   }
 }
 
-std::uint64_t rateOf(const Tally::Row& counts) noexcept {
-  const double seconds = static_cast<double>(counts[kNanoseconds]) / 1e9;
-  return seconds > 0 ? static_cast<std::uint64_t>(static_cast<double>(counts[kMade]) / seconds) : 0;
+std::uint64_t rateOf(const SchemeCounts& counts) noexcept {
+  const double seconds = static_cast<double>(counts.nanoseconds) / 1e9;
+  return seconds > 0 ? static_cast<std::uint64_t>(static_cast<double>(counts.made) / seconds) : 0;
 }
 
-void writeTable(const Tally& tally, Results& results) {
+void writeTable(std::uint64_t entries, const TrialPart& sum, Results& results) {
   std::string row = leftCell("scheme", 9);
-  for (const CountName& column : kColumnNames) row += cell(column.text, 10);
+  for (const auto& column : kSchemeNames) row += column.text != nullptr ? cell(column.text, 10) : "";
   results.line(row + cell("values/s", 12));
   for (const Scheme& scheme : kSchemes) {
     if (!inTrial(scheme)) continue;
-    const Tally::Row& counts = tally.of(scheme);
+    const SchemeCounts& counts = sum.schemes.of(scheme);
     row = leftCell(scheme.name, 9);
-    for (size_t column = kMade; column <= kSkipped; ++column) {
-      row += column == kRecovered && !scheme.reversible() ? cell("-", 10) : cell(counts[column], 10);
+    for (const auto& column : kSchemeNames) {
+      if (column.name != nullptr) row += isShown(column, scheme) ? cell(counts.*column.counter, 10) : cell("-", 10);
     }
     results.line(row + cell(rateOf(counts), 12));
   }
-  std::string sum = std::to_string(tally.entries) + " entries";
-  for (size_t total = kClear; total <= kDifferences; ++total) {
-    sum += (total == kClear         ? ": "
-            : total == kDifferences ? "; "
-                                    : ", ") +
-           std::to_string(tally.totals[total]) + " " + kTotalNames[total].text;
+  row = std::to_string(entries) + " entries";
+  const char* separator = ": ";
+  for (const auto& name : kNames) {
+    if (name.counter == &Counts::differences) separator = "; ";
+    row += separator + std::to_string(sum.counts.*name.counter) + " " + name.text;
+    separator = ", ";
   }
-  results.line(sum);
+  results.line(row);
   results.line(kNotes);
 }
 
-void writeObject(const Tally& tally, Results& results) {
+void writeObject(std::uint64_t entries, const TrialPart& sum, Results& results) {
   Json json;
-  json.number("entries", tally.entries);
-  addCounts(json, kTotalNames, tally.totals.data());
+  json.number("entries", entries);
+  addFields(json, sum.counts, kNames);
   json.open("schemes");
   for (const Scheme& scheme : kSchemes) {
     if (!inTrial(scheme)) continue;
-    const Tally::Row& counts = tally.of(scheme);
+    const SchemeCounts& counts = sum.schemes.of(scheme);
     json.open(scheme.name);
-    for (size_t column = kMade; column <= kSkipped; ++column) {
-      if (column != kRecovered || scheme.reversible()) json.number(kColumnNames[column].name, counts[column]);
+    for (const auto& column : kSchemeNames) {
+      if (isShown(column, scheme)) json.number(column.name, counts.*column.counter);
     }
     json.number("perSecond", rateOf(counts)).close();
   }
@@ -190,14 +209,18 @@ ExitCode trial(const Options& options) {
   requireProvider();
   const KeyRecord keys = KeyRecord::load(options.keys);
   Input input = openExport(options.source);
-  const Part sum = runExport(
-      input, options.source, [&](RecordWalker& walker, Part& part) { tryBatch(walker, keys, part); },
-      [](const Part&) {});
+  TrialPart sum;
+  const ExportSum whole = runExport<TrialPart>(
+      input, options.source, [&](RecordWalker& walker, TrialPart& part) { tryBatch(walker, keys, part); },
+      [&](const TrialPart& part) {
+        addCounts(sum.counts, part.counts, kNames);
+        sum.schemes.add(part.schemes, kSchemeNames);
+      });
   Results results;
-  (options.json ? writeObject : writeTable)(sum.tally, results);
+  (options.json ? writeObject : writeTable)(whole.entries, sum, results);
   results.flush();
-  if (sum.exitCode != kSuccess) return sum.exitCode;
-  return sum.tally.totals[kUnread] > 0 ? kBadKey : kSuccess;
+  if (whole.exitCode != kSuccess) return whole.exitCode;
+  return sum.counts.unread > 0 ? kBadKey : kSuccess;
 }
 
 }  // namespace

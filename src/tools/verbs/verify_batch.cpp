@@ -152,7 +152,7 @@ ExitCode checkEntries(const BatchOptions& options, const KeyRecord& key) {
   ExportOptions source;
   source.in = options.ldif;
   Input input = openExport(source);
-  const auto work = [&](RecordWalker& walker, Part&) {
+  const auto work = [&](RecordWalker& walker, ExportPart&) {
     std::uint64_t entries = 0;
     while (walker.next()) {
       if (walker.entries() > entries) waiting.meet(walker.dn());
@@ -163,7 +163,7 @@ ExitCode checkEntries(const BatchOptions& options, const KeyRecord& key) {
       }
     }
   };
-  runExport(input, source, work, [](const Part&) {});
+  runExport<ExportPart>(input, source, work, [](const ExportPart&) {});
   Answers answers(options);
   for (const Status& status : waiting.answers()) answers.add(status, false);
   return answers.finish();
