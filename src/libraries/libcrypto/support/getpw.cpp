@@ -2,6 +2,8 @@
 // The terminal password prompt.
 #include "encoding_utils.h"
 
+#include <poll.h>
+#include <pthread.h>
 #include <termios.h>
 #include <unistd.h>
 
@@ -26,24 +28,33 @@ int terminal;
 termios attributesBefore;
 struct sigaction actionsBefore[std::size(kSignals)];
 
-// Blocked while it runs, the signal that is raised again acts as it would have without us as soon as this returns.
+// The signal that is raised again acts, as it would have without us, once it is let through.
 void restoreAndAct(int signal) noexcept {
   const int error = errno;
   tcsetattr(terminal, TCSANOW, &attributesBefore);
   for (size_t i = 0; i < std::size(kSignals); ++i) {
     if (kSignals[i] == signal) sigaction(signal, &actionsBefore[i], nullptr);
   }
+  sigset_t itself;
+  sigemptyset(&itself);
+  sigaddset(&itself, signal);
   raise(signal);
+  pthread_sigmask(SIG_UNBLOCK, &itself, nullptr);
   errno = error;
 }
 
-// Switches echo off while it lives. Input that is no terminal is left alone.
+// Switches echo off while it lives. Input that is no terminal is left alone. The signals come while it waits for input
+// and at no other time: one between the switching and the reading would leave the echo on.
 class SilentTerminal {
  public:
   explicit SilentTerminal(int descriptor) noexcept {
     terminal = descriptor;
     isTerminal_ = tcgetattr(terminal, &attributesBefore) == 0;
     if (!isTerminal_) return;
+    sigset_t signals;
+    sigemptyset(&signals);
+    for (const int signal : kSignals) sigaddset(&signals, signal);
+    pthread_sigmask(SIG_BLOCK, &signals, &maskBefore_);
     for (size_t i = 0; i < std::size(kSignals); ++i) sigaction(kSignals[i], nullptr, &actionsBefore[i]);
     silence();
   }
@@ -51,13 +62,15 @@ class SilentTerminal {
     if (!isTerminal_) return;
     if (tcsetattr(terminal, TCSANOW, &attributesBefore) != 0) std::fprintf(stderr, "Unable to reset the display.\n");
     for (size_t i = 0; i < std::size(kSignals); ++i) sigaction(kSignals[i], &actionsBefore[i], nullptr);
+    pthread_sigmask(SIG_SETMASK, &maskBefore_, nullptr);
   }
   SilentTerminal(const SilentTerminal&) = delete;
   SilentTerminal& operator=(const SilentTerminal&) = delete;
 
-  // A signal came, and its action has returned.
-  void interrupted() noexcept {
-    if (isTerminal_) silence();
+  // Returns when there is input. Where a signal comes and its action returns, echo is switched off again.
+  void awaitInput() noexcept {
+    pollfd input{terminal, POLLIN, 0};
+    while (isTerminal_ && ppoll(&input, 1, nullptr, &maskBefore_) < 0 && errno == EINTR) silence();
   }
 
  private:
@@ -76,6 +89,7 @@ class SilentTerminal {
   }
 
   bool isTerminal_;
+  sigset_t maskBefore_{};
 };
 
 // One byte of the input, without a buffer in which the password or what follows it would stay; a stream without a
@@ -91,11 +105,9 @@ ssize_t readByte(int descriptor, char* byte) noexcept {
 size_t readLine(SilentTerminal& silent, int descriptor, char* line, size_t size) noexcept {
   size_t length = 0;
   while (length + 1 < size) {
+    silent.awaitInput();
     const ssize_t count = readByte(descriptor, line + length);
-    if (count < 0 && errno == EINTR) {
-      silent.interrupted();
-      continue;
-    }
+    if (count < 0 && errno == EINTR) continue;
     if (count <= 0 || line[length++] == '\n') break;
   }
   return length;
