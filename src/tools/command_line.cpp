@@ -3,6 +3,8 @@
 
 #include <unistd.h>
 
+#include <CLI/CLI.hpp>
+
 #include <algorithm>
 #include <new>
 #include <numeric>

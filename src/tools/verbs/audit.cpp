@@ -51,7 +51,7 @@ std::string timeNow() {
 }
 
 // Lists separated by commas, as an option that may be given several times takes them.
-std::vector<std::string> itemsOf(const CLI::Option& option) {
+std::vector<std::string> itemsOf(const Argument& option) {
   std::vector<std::string> items;
   for (const std::string& list : option.results()) {
     for (size_t begin = 0; begin <= list.size(); begin = list.find(',', begin) + 1) {
@@ -159,28 +159,28 @@ ExitCode run(const Options& options) {
 
 void setUpAudit(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  const CLI::Option* exports = addValues(verb, "EXPORT", "exports to read; - is standard input")->required();
-  const CLI::Option* failOn = addValues(verb, "--fail-on", "findings that the policy forbids, separated by commas");
-  const CLI::Option* accept = addValues(verb, "--accept", "schemes that the policy allows, separated by commas");
+  const Argument exports = addValues(verb, "EXPORT", "exports to read; - is standard input").required();
+  const Argument failOn = addValues(verb, "--fail-on", "findings that the policy forbids, separated by commas");
+  const Argument accept = addValues(verb, "--accept", "schemes that the policy allows, separated by commas");
   addKeys(verb, "--keys", options->keys, "key stash file that opens the AES values");
   addPath(verb, "--known-bad", options->knownBad, "file of known bad passwords, one a line");
-  verb.add_flag("--check-hashes", options->checkHashes,
-                "try known bad passwords, uid and cn on one-way values: as many checks, at the cost of each scheme");
-  verb.add_option("--list", options->listed, "DNs to list for each finding (default: 20)");
-  verb.add_option("--subtree-depth", options->subtreeDepth, "RDNs that name a subtree (default: 3)");
-  const CLI::Option* attributes = addValues(verb, "--attribute", "an attribute that holds passwords");
-  verb.add_flag("--allow-binary", options->allowBinary, "accept values that open into bytes that are not text");
-  verb.add_option("--threads", options->source.threads, "threads to work with (default: one a processor)")
-      ->check(CLI::Range(1U, 256U));
-  verb.add_flag("--json", options->json, "the report as a JSON object");
+  addFlag(verb, "--check-hashes", options->checkHashes,
+          "try known bad passwords, uid and cn on one-way values: as many checks, at the cost of each scheme");
+  addOption(verb, "--list", options->listed, "DNs to list for each finding (default: 20)");
+  addOption(verb, "--subtree-depth", options->subtreeDepth, "RDNs that name a subtree (default: 3)");
+  const Argument attributes = addValues(verb, "--attribute", "an attribute that holds passwords");
+  addFlag(verb, "--allow-binary", options->allowBinary, "accept values that open into bytes that are not text");
+  addOption(verb, "--threads", options->source.threads, "threads to work with (default: one a processor)")
+      .between(1, 256);
+  addFlag(verb, "--json", options->json, "the report as a JSON object");
   addPath(verb, "--html", options->html, "write the report as a page, too; - puts it in the place of the text");
-  verb.add_flag("--force", options->force, "replace the file of --html");
-  verb.footer(kFooter);
-  verb.callback([=, &exitCode] {
-    options->exports = exports->results();
-    options->failOn = itemsOf(*failOn);
-    options->accept = itemsOf(*accept);
-    options->source.attributes = attributes->results();
+  addFlag(verb, "--force", options->force, "replace the file of --html");
+  addFooter(verb, kFooter);
+  onRun(verb, [=, &exitCode] {
+    options->exports = exports.results();
+    options->failOn = itemsOf(failOn);
+    options->accept = itemsOf(accept);
+    options->source.attributes = attributes.results();
     exitCode = run(*options);
   });
 }

@@ -15,7 +15,7 @@ struct Options {
   std::string keys;
   std::string passwordFile;
   Costs costs;
-  CLI::Option* secrets = nullptr;
+  Argument secrets;
   char end = '\n';
   size_t generate = 0;  // characters
   bool allowEmpty = false;
@@ -116,24 +116,24 @@ ExitCode format(const Options& options) {
 
 void setUpFormat(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  verb.add_option("--scheme", options->scheme,
-                  "sha, ssha, md5, crypt, qveil, aes128, aes192, aes256; of other servers argon2id, pbkdf2-sha512, "
-                  "yescrypt, sha512-crypt, ssha512")
-      ->required();
+  addOption(verb, "--scheme", options->scheme,
+            "sha, ssha, md5, crypt, qveil, aes128, aes192, aes256; of other servers argon2id, pbkdf2-sha512, "
+            "yescrypt, sha512-crypt, ssha512")
+      .required();
   addCosts(verb, options->costs);
   addKeys(verb, "--keys", options->keys, "key stash file, for the AES schemes");
-  CLI::Option* file =
+  const Argument file =
       addPath(verb, "--password-file", options->passwordFile, "read the passwords, one a line, from this file");
-  verb.add_option("--generate", options->generate,
-                  "make a password of this many letters and digits, shown before its value")
-      ->check(CLI::Range(size_t{8}, size_t{1024}))
-      ->type_name("LENGTH")
-      ->excludes(file);
+  addOption(verb, "--generate", options->generate,
+            "make a password of this many letters and digits, shown before its value")
+      .between(8, 1024)
+      .takes("LENGTH")
+      .excludes(file);
   addNull(verb, options->end);
-  verb.add_flag("--allow-empty", options->allowEmpty, "make a value of the empty password too");
-  verb.add_flag("--json", options->json, "one JSON object a line");
+  addFlag(verb, "--allow-empty", options->allowEmpty, "make a value of the empty password too");
+  addFlag(verb, "--json", options->json, "one JSON object a line");
   options->secrets = addRefusedSecrets(verb, "PASSWORD");
-  verb.callback([options, &exitCode] { exitCode = format(*options); });
+  onRun(verb, [options, &exitCode] { exitCode = format(*options); });
 }
 
 }  // namespace tool

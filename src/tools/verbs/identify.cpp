@@ -9,7 +9,7 @@ namespace tool {
 namespace {
 
 struct Options {
-  CLI::Option* values = nullptr;
+  Argument values;
   char end = '\n';
   bool json = false;
 };
@@ -47,7 +47,7 @@ void showJson(const Examined& examined, size_t index, Results& results) {
 ExitCode identify(const Options& options) {
   ExitCode exitCode = kSuccess;
   Results results(options.end);
-  forEachValue(*options.values, options.end, results, [&](const Secret& whole, size_t index, const std::string&) {
+  forEachValue(options.values, options.end, results, [&](const Secret& whole, size_t index, const std::string&) {
     const Examined examined = examine(whole);
     if (examined.problem != nullptr) keepFirst(exitCode, kBadValue);
     options.json ? showJson(examined, index, results) : showText(examined, results);
@@ -61,8 +61,8 @@ void setUpIdentify(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
   options->values = addValues(verb, "VALUE", "stored values; without any, one a line from standard input");
   addNull(verb, options->end);
-  verb.add_flag("--json", options->json, "one JSON object a line");
-  verb.callback([options, &exitCode] { exitCode = identify(*options); });
+  addFlag(verb, "--json", options->json, "one JSON object a line");
+  onRun(verb, [options, &exitCode] { exitCode = identify(*options); });
 }
 
 }  // namespace tool

@@ -17,7 +17,7 @@ constexpr Verb kKeyVerbs[] = {
 }  // namespace
 
 void setUpKeys(CLI::App& verb, ExitCode& exitCode) {
-  verb.require_subcommand(1);
+  requireVerb(verb);
   for (const Verb& row : kKeyVerbs) addVerb(verb, row, exitCode);
 }
 

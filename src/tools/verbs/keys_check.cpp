@@ -43,14 +43,13 @@ ExitCode check(const Options& options) {
 
 void setUpKeysCheck(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  addKeys(verb, "FILE", options->file, "key stash file")->required();
+  addKeys(verb, "FILE", options->file, "key stash file").required();
   addPath(verb, "EXPORT", options->exported, "export (LDIF): how many of its AES values do these keys open?");
-  CLI::Option* sync = verb.add_option("--sync", options->sync, "sync text to compare");
-  addPath(verb, "--salt-file", options->saltFile, "compare the salt too, with the first line of this file")
-      ->needs(sync);
-  verb.add_flag("--quiet", options->quiet, "show no result: the exit code has it");
-  verb.add_flag("--json", options->json, "the result as a JSON object");
-  verb.callback([options, &exitCode] { exitCode = check(*options); });
+  const Argument sync = addOption(verb, "--sync", options->sync, "sync text to compare");
+  addPath(verb, "--salt-file", options->saltFile, "compare the salt too, with the first line of this file").needs(sync);
+  addFlag(verb, "--quiet", options->quiet, "show no result: the exit code has it");
+  addFlag(verb, "--json", options->json, "the result as a JSON object");
+  onRun(verb, [options, &exitCode] { exitCode = check(*options); });
 }
 
 }  // namespace tool

@@ -37,11 +37,11 @@ ExitCode compare(const Options& options) {
 
 void setUpKeysCompare(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  addKeys(verb, "FILE", options->first, "key stash file")->required();
-  addPath(verb, "OTHER", options->second, "the one to compare it with")->required();
-  verb.add_flag("--quiet", options->quiet, "show no result: the exit code has it");
-  verb.add_flag("--json", options->json, "the result as a JSON object");
-  verb.callback([options, &exitCode] { exitCode = compare(*options); });
+  addKeys(verb, "FILE", options->first, "key stash file").required();
+  addPath(verb, "OTHER", options->second, "the one to compare it with").required();
+  addFlag(verb, "--quiet", options->quiet, "show no result: the exit code has it");
+  addFlag(verb, "--json", options->json, "the result as a JSON object");
+  onRun(verb, [options, &exitCode] { exitCode = compare(*options); });
 }
 
 }  // namespace tool

@@ -165,9 +165,9 @@ ExitCode create(const Options& options) {
 void setUpKeysCreate(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
   addPath(verb, "--config", options->config, "configuration stash file to make; none without it");
-  addPath(verb, "--directory", options->directory, "directory stash file to make")->required();
+  addPath(verb, "--directory", options->directory, "directory stash file to make").required();
   addSeedOptions(verb, *options, "read the directory's salt from this file instead of drawing one");
-  verb.callback([options, &exitCode] { exitCode = create(*options); });
+  onRun(verb, [options, &exitCode] { exitCode = create(*options); });
 }
 
 }  // namespace tool

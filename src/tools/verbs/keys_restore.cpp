@@ -52,10 +52,10 @@ ExitCode restore(const Options& options) {
 
 void setUpKeysRestore(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  addPath(verb, "FILE", options->file, "key stash file to make")->required();
-  verb.add_option("--expect-sync", options->expectSync, "write nothing unless seed and salt give this sync text");
+  addPath(verb, "FILE", options->file, "key stash file to make").required();
+  addOption(verb, "--expect-sync", options->expectSync, "write nothing unless seed and salt give this sync text");
   addSeedOptions(verb, *options, "read the salt from the first line of this file");
-  verb.callback([options, &exitCode] { exitCode = restore(*options); });
+  onRun(verb, [options, &exitCode] { exitCode = restore(*options); });
 }
 
 }  // namespace tool

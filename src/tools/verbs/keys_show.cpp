@@ -67,9 +67,9 @@ ExitCode show(const Options& options) {
 
 void setUpKeysShow(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  addKeys(verb, "FILE", options->file, "key stash file")->required();
-  verb.add_flag("--json", options->json, "the result as a JSON object");
-  verb.callback([options, &exitCode] { exitCode = show(*options); });
+  addKeys(verb, "FILE", options->file, "key stash file").required();
+  addFlag(verb, "--json", options->json, "the result as a JSON object");
+  onRun(verb, [options, &exitCode] { exitCode = show(*options); });
 }
 
 }  // namespace tool

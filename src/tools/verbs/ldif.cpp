@@ -63,37 +63,34 @@ ExitCode run(const Options& options) {
 
 void setUpLdif(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  verb.add_option("--to", options->to, "scheme to convert the values to");
-  verb.add_flag("--audit", options->audit, "count schemes and findings instead, as \"ldappw audit\" does");
+  addOption(verb, "--to", options->to, "scheme to convert the values to");
+  addFlag(verb, "--audit", options->audit, "count schemes and findings instead, as \"ldappw audit\" does");
   addKeys(verb, "--keys", options->keys, "key stash file that opens the AES values of the export; may be repeated");
   addPath(verb, "--new-keys", options->newKeys, "key stash file for the new values");
-  verb.add_option("--attribute", options->source.attributes,
-                  "attribute that holds passwords, as often as there are such; without it userPassword, pwdHistory, "
-                  "olcRootPW, nsslapd-rootpw and authPassword")
-      ->expected(1)
-      ->allow_extra_args(false)
-      ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll)
-      ->type_name("NAME");
-  CLI::Option* in = addPath(verb, "--in", options->source.in, "export to read, \"-\" (default) for standard input");
-  addPath(verb, "FILE", options->source.in, "export to read, in place of --in")->excludes(in);
+  addList(verb, "--attribute", options->source.attributes,
+          "attribute that holds passwords, as often as there are such; without it userPassword, pwdHistory, "
+          "olcRootPW, nsslapd-rootpw and authPassword")
+      .takes("NAME");
+  const Argument in = addPath(verb, "--in", options->source.in, "export to read, \"-\" (default) for standard input");
+  addPath(verb, "FILE", options->source.in, "export to read, in place of --in").excludes(in);
   addPath(verb, "--out", options->out, "file to write (default: standard output); may be the one that is read");
-  verb.add_flag("--force", options->force, "replace the file of --out");
-  verb.add_flag("--changes", options->changes, "write change records for ldapmodify in place of the export");
-  verb.add_flag("--dry-run", options->dryRun, "write nothing but the summary");
+  addFlag(verb, "--force", options->force, "replace the file of --out");
+  addFlag(verb, "--changes", options->changes, "write change records for ldapmodify in place of the export");
+  addFlag(verb, "--dry-run", options->dryRun, "write nothing but the summary");
   addPath(verb, "--resume", options->resume, "change records of a stopped run; what they hold is not made again");
-  verb.add_flag("--progress", options->source.progress, "show progress where standard error is no terminal too");
+  addFlag(verb, "--progress", options->source.progress, "show progress where standard error is no terminal too");
   addCosts(verb, options->costs);
-  verb.add_flag("--fix", options->fix, "unwrap values with blanks around them or encoded in base64 once more");
-  verb.add_flag("--allow-clear", options->allowClear, "allow --to clear");
-  verb.add_flag("--allow-binary", options->allowBinary,
-                "accept values that open into bytes that are not text; a wrong key gives such bytes now and then");
-  verb.add_option("--threads", options->source.threads, "threads to work with (default: one a processor)")
-      ->check(CLI::Range(1U, 256U));
-  verb.add_flag("--verbose", options->verbose, "in an audit, report every value");
-  CLI::Option* json = verb.add_flag("--json", options->json, "counts as JSON, on standard output");
-  verb.add_flag("--quiet", options->quiet, "no counts after a conversion")->excludes(json);
-  verb.footer(kFooter);
-  verb.callback([options, &exitCode] { exitCode = run(*options); });
+  addFlag(verb, "--fix", options->fix, "unwrap values with blanks around them or encoded in base64 once more");
+  addFlag(verb, "--allow-clear", options->allowClear, "allow --to clear");
+  addFlag(verb, "--allow-binary", options->allowBinary,
+          "accept values that open into bytes that are not text; a wrong key gives such bytes now and then");
+  addOption(verb, "--threads", options->source.threads, "threads to work with (default: one a processor)")
+      .between(1, 256);
+  addFlag(verb, "--verbose", options->verbose, "in an audit, report every value");
+  const Argument json = addFlag(verb, "--json", options->json, "counts as JSON, on standard output");
+  addFlag(verb, "--quiet", options->quiet, "no counts after a conversion").excludes(json);
+  addFooter(verb, kFooter);
+  onRun(verb, [options, &exitCode] { exitCode = run(*options); });
 }
 
 }  // namespace tool

@@ -2,12 +2,52 @@
 // The parts of the command line that verbs have in common.
 #include "verbs/options.h"
 
+#include <CLI/CLI.hpp>
 #include <cstdint>
+#include <utility>
 
 #include "base/input.h"
 #include "schemes/key_record.h"
 
 namespace tool {
+
+const Argument& Argument::required() const {
+  option_->required();
+  return *this;
+}
+
+const Argument& Argument::needs(const Argument& other) const {
+  option_->needs(other.option_);
+  return *this;
+}
+
+const Argument& Argument::excludes(const Argument& other) const {
+  option_->excludes(other.option_);
+  return *this;
+}
+
+const Argument& Argument::between(std::uint64_t least, std::uint64_t most) const {
+  option_->check(CLI::Range(least, most));
+  return *this;
+}
+
+const Argument& Argument::takes(const std::string& what) const {
+  option_->type_name(what);
+  return *this;
+}
+
+const Argument& Argument::hidden() const {
+  option_->group("");
+  return *this;
+}
+
+bool Argument::empty() const noexcept {
+  return option_->empty();
+}
+
+const std::vector<std::string>& Argument::results() const {
+  return option_->results();
+}
 
 // A verb's options are added when the verb is named: those of all the others take 8 % of a short run.
 void addVerb(CLI::App& app, const Verb& row, ExitCode& exitCode) {
@@ -15,8 +55,41 @@ void addVerb(CLI::App& app, const Verb& row, ExitCode& exitCode) {
   verb->preparse_callback([verb, &row, &exitCode](size_t) { row.setUp(*verb, exitCode); });
 }
 
-CLI::Option* addPath(CLI::App& verb, const std::string& name, std::string& path, const std::string& help) {
-  return verb.add_option(name, path, help)->type_name(name.front() == '-' ? "FILE" : "");
+void requireVerb(CLI::App& verb) {
+  verb.require_subcommand(1);
+}
+
+void addFooter(CLI::App& verb, const std::string& text) {
+  verb.footer(text);
+}
+
+void onRun(CLI::App& verb, std::function<void()> work) {
+  verb.callback(std::move(work));
+}
+
+Argument addFlag(CLI::App& verb, const std::string& name, bool& flag, const std::string& help) {
+  return Argument(verb.add_flag(name, flag, help));
+}
+
+template <typename Value>
+Argument addOption(CLI::App& verb, const std::string& name, Value& value, const std::string& help) {
+  return Argument(verb.add_option(name, value, help));
+}
+template Argument addOption(CLI::App&, const std::string&, std::string&, const std::string&);
+template Argument addOption(CLI::App&, const std::string&, unsigned&, const std::string&);
+template Argument addOption(CLI::App&, const std::string&, unsigned long&, const std::string&);
+
+Argument addOption(CLI::App& verb, const std::string& name, const std::string& help) {
+  return Argument(verb.add_option(name, help));
+}
+
+Argument addList(CLI::App& verb, const std::string& name, std::vector<std::string>& values, const std::string& help) {
+  CLI::Option* option = verb.add_option(name, values, help);
+  return Argument(option->expected(1)->allow_extra_args(false)->multi_option_policy(CLI::MultiOptionPolicy::TakeAll));
+}
+
+Argument addPath(CLI::App& verb, const std::string& name, std::string& path, const std::string& help) {
+  return addOption(verb, name, path, help).takes(name.front() == '-' ? "FILE" : "");
 }
 
 namespace {
@@ -29,30 +102,28 @@ void addKeysGroup(CLI::App& verb) {
 
 }  // namespace
 
-CLI::Option* addKeys(CLI::App& verb, const std::string& name, std::string& path, const std::string& help) {
+Argument addKeys(CLI::App& verb, const std::string& name, std::string& path, const std::string& help) {
   addKeysGroup(verb);
   return addPath(verb, name, path, help);
 }
 
-CLI::Option* addKeys(CLI::App& verb, const std::string& name, std::vector<std::string>& paths,
-                     const std::string& help) {
+Argument addKeys(CLI::App& verb, const std::string& name, std::vector<std::string>& paths, const std::string& help) {
   addKeysGroup(verb);
-  CLI::Option* option = verb.add_option(name, paths, help)->type_name("FILE");
-  return option->expected(1)->allow_extra_args(false)->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
+  return addList(verb, name, paths, help).takes("FILE");
 }
 
 void addCosts(CLI::App& verb, Costs& costs) {
   for (const CostName& cost : kCostNames) {
-    verb.add_option(cost.option, costs.*cost.member, cost.help)->check(CLI::Range(1U, UINT32_MAX));
+    addOption(verb, cost.option, costs.*cost.member, cost.help).between(1, UINT32_MAX);
   }
 }
 
 // A value list of the parser's own would split a value that is wrapped in brackets and drop "{}".
-CLI::Option* addValues(CLI::App& verb, const std::string& name, const std::string& help) {
+Argument addValues(CLI::App& verb, const std::string& name, const std::string& help) {
   constexpr int kMany = 1 << 20;
   CLI::Option* option = verb.add_option(name, help);
   option->expected(kMany)->allow_extra_args(false)->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
-  return option->option_text("...");
+  return Argument(option->option_text("..."));
 }
 
 void addNull(CLI::App& verb, char& end) {
@@ -60,7 +131,7 @@ void addNull(CLI::App& verb, char& end) {
       "--null", [&end] { end = '\0'; }, "lines end in NUL bytes, in the input and in the results");
 }
 
-void forEachValue(const CLI::Option& given, char end, Results& results, const ValueWork& work) {
+void forEachValue(const Argument& given, char end, Results& results, const ValueWork& work) {
   size_t index = 0;
   for (const std::string& value : given.results()) {
     ++index;
@@ -82,12 +153,12 @@ void showProblem(bool json, const Status& status, size_t index, Results& results
   results.line(json ? Json().number("index", index).problem(status).end() : "");
 }
 
-CLI::Option* addRefusedSecrets(CLI::App& verb, const std::string& name) {
-  return addValues(verb, name, "")->group("");
+Argument addRefusedSecrets(CLI::App& verb, const std::string& name) {
+  return addValues(verb, name, "").hidden();
 }
 
-void refuseSecrets(const CLI::Option* option, const std::string& what) {
-  if (option->empty()) return;
+void refuseSecrets(const Argument& option, const std::string& what) {
+  if (option.empty()) return;
   throw Failure(kUsage, "a " + what +
                             " is not taken from the command line, where other users of the system can see it; " +
                             "use the prompt, standard input or --" + what + "-file");

@@ -10,7 +10,7 @@ namespace tool {
 namespace {
 
 struct Options {
-  CLI::Option* values = nullptr;
+  Argument values;
   std::string keys;
   char end = '\n';
   bool json = false;
@@ -35,7 +35,7 @@ ExitCode reveal(const Options& options) {
   ExitCode exitCode = kSuccess;
   Results results(options.end);
   Repeated problems(kMostOfAKind, message);
-  forEachValue(*options.values, options.end, results, [&](const Secret& whole, size_t index, const std::string& place) {
+  forEachValue(options.values, options.end, results, [&](const Secret& whole, size_t index, const std::string& place) {
     const Examined value = examine(whole);
     Secret clear;
     Status status = openValue(value, key, clear);
@@ -60,9 +60,9 @@ void setUpReveal(CLI::App& verb, ExitCode& exitCode) {
   options->values = addValues(verb, "VALUE", "stored values; without any, one a line from standard input");
   addKeys(verb, "--keys", options->keys, "key stash file, for the AES schemes");
   addNull(verb, options->end);
-  verb.add_flag("--json", options->json,
-                "one JSON object a line: the password as text, or as passwordBase64 where it is not one line of UTF-8");
-  verb.callback([options, &exitCode] { exitCode = reveal(*options); });
+  addFlag(verb, "--json", options->json,
+          "one JSON object a line: the password as text, or as passwordBase64 where it is not one line of UTF-8");
+  onRun(verb, [options, &exitCode] { exitCode = reveal(*options); });
 }
 
 }  // namespace tool

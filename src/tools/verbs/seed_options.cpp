@@ -6,8 +6,8 @@ namespace tool {
 void addSeedOptions(CLI::App& verb, SeedOptions& options, const std::string& saltHelp) {
   addPath(verb, "--seed-file", options.seedFile, "read the seed from the first line of this file");
   addPath(verb, "--salt-file", options.saltFile, saltHelp);
-  verb.add_flag("--force", options.force, "replace what exists");
-  verb.add_flag("--json", options.json, "the result as a JSON object");
+  addFlag(verb, "--force", options.force, "replace what exists");
+  addFlag(verb, "--json", options.json, "the result as a JSON object");
   options.secrets = addRefusedSecrets(verb, "SEED");
 }
 

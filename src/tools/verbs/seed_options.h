@@ -11,7 +11,7 @@ namespace tool {
 struct SeedOptions {
   std::string seedFile;
   std::string saltFile;
-  CLI::Option* secrets = nullptr;
+  Argument secrets;
   bool force = false;
   bool json = false;
 };

@@ -228,11 +228,11 @@ ExitCode trial(const Options& options) {
 void setUpTrial(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
   addPath(verb, "FILE", options->source.in, "export (LDIF) to read, \"-\" for standard input; it is not changed")
-      ->required();
-  addKeys(verb, "--keys", options->keys, "key stash file, for the AES schemes and values")->required();
-  verb.add_flag("--json", options->json, "the counts as one JSON object");
-  verb.footer("Exits with 0 when everything agrees, 3 when anything differs, 4 when the keys do not open a value.");
-  verb.callback([options, &exitCode] { exitCode = trial(*options); });
+      .required();
+  addKeys(verb, "--keys", options->keys, "key stash file, for the AES schemes and values").required();
+  addFlag(verb, "--json", options->json, "the counts as one JSON object");
+  addFooter(verb, "Exits with 0 when everything agrees, 3 when anything differs, 4 when the keys do not open a value.");
+  onRun(verb, [options, &exitCode] { exitCode = trial(*options); });
 }
 
 }  // namespace tool

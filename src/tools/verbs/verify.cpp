@@ -12,22 +12,22 @@ namespace tool {
 namespace {
 
 struct Options {
-  CLI::Option* value = nullptr;
+  Argument value;
   std::string valueFile;
   std::string passwordFile;
   std::string keys;
   BatchOptions batch;
-  CLI::Option* secrets = nullptr;
+  Argument secrets;
   bool clear = false;
   bool json = false;
   bool quiet = false;
 };
 
 Secret storedValue(const Options& options) {
-  if (options.value->empty() == options.valueFile.empty()) {
+  if (options.value.empty() == options.valueFile.empty()) {
     throw Failure(kUsage, "give either a VALUE or --value-file");
   }
-  if (!options.value->empty()) return Secret(options.value->results().front());
+  if (!options.value.empty()) return Secret(options.value.results().front());
   return firstLine(options.valueFile, "value");
 }
 
@@ -64,7 +64,7 @@ void show(const Options& options, const Scheme& scheme, const Status& status) {
 }
 
 ExitCode batch(const Options& options) {
-  if (!options.value->empty() || !options.valueFile.empty() || !options.passwordFile.empty()) {
+  if (!options.value.empty() || !options.valueFile.empty() || !options.passwordFile.empty()) {
     throw Failure(kUsage, "--batch has the values and the passwords");
   }
   BatchOptions all = options.batch;
@@ -92,23 +92,23 @@ ExitCode verify(const Options& options) {
 
 void setUpVerify(CLI::App& verb, ExitCode& exitCode) {
   const auto options = std::make_shared<Options>();
-  options->value = verb.add_option("VALUE", "stored value");
+  options->value = addOption(verb, "VALUE", "stored value");
   addPath(verb, "--value-file", options->valueFile, "read the stored value from the first line of this file");
   addPath(verb, "--password-file", options->passwordFile, "read the password from the first line of this file");
   addKeys(verb, "--keys", options->keys, "key stash file, for the AES schemes");
-  verb.add_flag("--clear", options->clear, "take a value without a tag as a clear password");
-  CLI::Option* many = addPath(verb, "--batch", options->batch.file,
-                              "check many: lines of value, tab, password in this file; a line of result for each");
+  addFlag(verb, "--clear", options->clear, "take a value without a tag as a clear password");
+  const Argument many = addPath(verb, "--batch", options->batch.file,
+                                "check many: lines of value, tab, password in this file; a line of result for each");
   addPath(verb, "--ldif", options->batch.ldif, "export of the values: --batch has lines of DN, tab, password")
-      ->needs(many);
-  verb.add_flag("--null", options->batch.null, "lines of --batch and of its results end in NUL bytes")->needs(many);
-  verb.add_flag("--quiet", options->quiet, "show no result: the exit code has it");
-  verb.add_flag("--json", options->json, "the result as a JSON object");
-  verb.footer(
-      "Exit code: 0 match, 1 no match, 2 usage, 3 unknown or malformed value, 4 missing or wrong key, "
-      "5 input or output, 6 internal.");
+      .needs(many);
+  addFlag(verb, "--null", options->batch.null, "lines of --batch and of its results end in NUL bytes").needs(many);
+  addFlag(verb, "--quiet", options->quiet, "show no result: the exit code has it");
+  addFlag(verb, "--json", options->json, "the result as a JSON object");
+  addFooter(verb,
+            "Exit code: 0 match, 1 no match, 2 usage, 3 unknown or malformed value, 4 missing or wrong key, "
+            "5 input or output, 6 internal.");
   options->secrets = addRefusedSecrets(verb, "PASSWORD");
-  verb.callback([options, &exitCode] { exitCode = verify(*options); });
+  onRun(verb, [options, &exitCode] { exitCode = verify(*options); });
 }
 
 }  // namespace tool
