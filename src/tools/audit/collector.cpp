@@ -172,6 +172,7 @@ void Collector::finishEntry() {
 
 Verdict Collector::judgeLine(const StoredLine& line, Subtree& subtree) {
   constexpr const char* kElsewhere[] = {"", "url", "deleted", "authPassword"};
+  static_assert(sizeof kElsewhere / sizeof kElsewhere[0] == static_cast<size_t>(ValueForm::kBroken));
   if (line.form == ValueForm::kBytes) return judge(line.value, line.current, subtree);
   if (line.form == ValueForm::kBroken) return {"unknown", Condition::kBroken, line.problem};
   return {kElsewhere[static_cast<size_t>(line.form)], Condition::kFine, ""};

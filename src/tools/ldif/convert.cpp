@@ -86,6 +86,7 @@ struct ConversionPart : ExportPart {
 struct Conversion {
   const Scheme& target;
   const LdifOptions& options;
+  Costs costs;
   KeyRecord newKeys;
   KeyRing keys;  // the new ones first
   EarlierChanges earlier;
@@ -110,7 +111,7 @@ Status makeTarget(const Secret& clear, const Conversion& conversion, Secret& mad
     drawRandom(made.data(), made.size());
     return passwordProblem(target, clear.view());
   }
-  const Status status = makeValue(target, conversion.newKeys, clear, made, conversion.options.costs);
+  const Status status = makeValue(target, conversion.newKeys, conversion.costs, clear, made);
   if (!status.ok() || target.code == FORMAT_NONE || serverAccepts(made, conversion.newKeys, clear)) return status;
   return {kBadValue, "the new value does not verify"};
 }
@@ -172,6 +173,7 @@ Outcome fixValue(const Examined& value, const Conversion& conversion, Secret& ma
 // Of a line that holds no value to convert.
 Outcome outcomeWithout(const PasswordLine& password) {
   constexpr Counter kKept[] = {&Counts::made, &Counts::urls, &Counts::deleted, &Counts::authPasswords};
+  static_assert(sizeof kKept / sizeof kKept[0] == static_cast<size_t>(ValueForm::kBroken));
   if (password.form == ValueForm::kBroken) return {&Counts::failed, {kBadValue, password.problem}};
   return {kKept[static_cast<size_t>(password.form)], {}};
 }
@@ -347,11 +349,11 @@ void showSummary(std::uint64_t entries, const ConversionPart& sum, const Convers
 
 Conversion conversionOf(const LdifOptions& options) {
   const Scheme& target = targetOf(options);
-  completeCosts(target, options.costs);  // refuses what the scheme does not have
+  const Costs costs = completeCosts(target, options.costs);
   requireProvider();
   std::vector<std::string> paths = options.keys;
   paths.insert(paths.begin(), options.newKeys);
-  return {target, options, KeyRecord::load(options.newKeys), KeyRing(paths), {}};
+  return {target, options, costs, KeyRecord::load(options.newKeys), KeyRing(paths), {}};
 }
 
 void requireOtherKeys(const Conversion& conversion) {

@@ -10,11 +10,14 @@
 namespace tool {
 namespace {
 
-// clang-format off
 // Outside the table: a tag of no known scheme.
-constexpr Scheme kUnknownScheme = {"unknown", "", FORMAT_NONE, Kind::kUnknown, 0, 0, -1, false, {nullptr, 0, 0, 0, nullptr}, "",
-    nullptr, nullptr, nullptr, nullptr, Strength::kUnknown, ""};
-// clang-format on
+constexpr Scheme unknownScheme() {
+  Scheme scheme;
+  scheme.name = "unknown";
+  scheme.kind = Kind::kUnknown;
+  return scheme;
+}
+constexpr Scheme kUnknownScheme = unknownScheme();
 
 // Among tags that stand one by one; "{NAME-*}" is any that begins so.
 bool hasTag(std::string_view tags, std::string_view tag) noexcept {

@@ -11,7 +11,6 @@
 namespace tool {
 namespace {
 
-constexpr int kNoKey = -1;
 constexpr PayloadRule kAny{nullptr, 0, 0, 0, nullptr};
 constexpr PayloadRule kBlocks{base64Problem, 16, LONG_MAX, 16, "the payload is not a whole number of 16-byte blocks"};
 constexpr PayloadRule kHex{hexProblem, 16, LONG_MAX, 1, "the payload is not hexadecimal text of a digest"};
@@ -65,26 +64,77 @@ constexpr Scheme row(const char* name, std::string_view tags, std::string_view p
                      const char* writers, const PayloadRule& payload, const Functions& functions = kNone,
                      const char* algorithm = "") {
   const bool opens = strength == Strength::kClear || strength == Strength::kReversible;
-  const bool limited = functions.make == makeCrypt3;
-  return {name,
-          tags,
-          FORMAT_NONE,
-          opens ? Kind::kReversible : Kind::kOneWay,
-          0,
-          0,
-          -1,
-          false,
-          payload,
-          "",
-          limited ? crypt3PasswordProblem : nullptr,
-          functions.make,
-          functions.check,
-          functions.open,
-          strength,
-          writers,
-          functions.costs,
-          algorithm,
-          prefix};
+  Scheme scheme;
+  scheme.name = name;
+  scheme.tag = tags;
+  scheme.kind = opens ? Kind::kReversible : Kind::kOneWay;
+  scheme.payload = payload;
+  if (functions.make == makeCrypt3) scheme.passwordProblem = crypt3PasswordProblem;
+  scheme.make = functions.make;
+  scheme.check = functions.check;
+  scheme.open = functions.open;
+  scheme.strength = strength;
+  scheme.writers = writers;
+  scheme.costs = functions.costs;
+  scheme.algorithm = algorithm;
+  scheme.prefix = prefix;
+  return scheme;
+}
+
+// A scheme of the library. The other columns are set by name.
+class Own {
+ public:
+  constexpr Own(const char* name, std::string_view tag, int code, Kind kind, Strength strength, const char* writers)
+      : scheme_(start(name, tag, code, kind, strength, writers)) {}
+
+  constexpr Own payload(const PayloadRule& rule) const { return with(&Scheme::payload, rule); }
+  constexpr Own foreignMarks(const char* marks) const { return with(&Scheme::foreignMarks, marks); }
+  constexpr Own cutBytes(size_t bytes) const { return with(&Scheme::cutBytes, bytes); }
+  constexpr Own comparedBytes(size_t bytes) const { return with(&Scheme::comparedBytes, bytes); }
+  constexpr Own key(int index) const { return with(&Scheme::keyIndex, index); }
+  constexpr Own needsProvider() const { return with(&Scheme::needsProvider, true); }
+  constexpr Own refuses(decltype(Scheme::passwordProblem) function) const {
+    return with(&Scheme::passwordProblem, function);
+  }
+  constexpr Own made(decltype(Scheme::make) function) const { return with(&Scheme::make, function); }
+  constexpr Own checked(decltype(Scheme::check) function) const { return with(&Scheme::check, function); }
+  constexpr Own opened(decltype(Scheme::open) function) const { return with(&Scheme::open, function); }
+  constexpr Own costs(const CostRules& rules) const { return with(&Scheme::costs, &rules); }
+  constexpr Own algorithm(const char* name) const { return with(&Scheme::algorithm, name); }
+
+  constexpr operator Scheme() const { return scheme_; }  // NOLINT(google-explicit-constructor): a row of the table
+
+ private:
+  static constexpr Scheme start(const char* name, std::string_view tag, int code, Kind kind, Strength strength,
+                                const char* writers) {
+    Scheme scheme;
+    scheme.name = name;
+    scheme.tag = tag;
+    scheme.code = code;
+    scheme.kind = kind;
+    scheme.strength = strength;
+    scheme.writers = writers;
+    return scheme;
+  }
+  template <typename Member, typename Value>
+  constexpr Own with(Member Scheme::*member, const Value& value) const {
+    Own changed = *this;
+    changed.scheme_.*member = value;
+    return changed;
+  }
+
+  Scheme scheme_;
+};
+
+// The three AES schemes differ in their keys alone.
+constexpr Own aes(const char* name, std::string_view tag, int code, int key) {
+  return Own(name, tag, code, Kind::kReversible, Strength::kReversible, "ldappw")
+      .payload(kBlocks)
+      .key(key)
+      .needsProvider()
+      .made(makeByLibrary)
+      .checked(checkByOpening)
+      .opened(openByLibrary);
 }
 
 constexpr Strength kClear = Strength::kClear, kReversible = Strength::kReversible, kUnsalted = Strength::kUnsalted,
@@ -98,44 +148,28 @@ constexpr char kArgon2d[] = "0", kArgon2i[] = "1", kArgon2id[] = "2";
 
 // clang-format off
 const std::initializer_list<Scheme> kSchemes = {
-    // Of the library, clear text first.
-    // name, tag, code, kind, cut and compared bytes, key, provider, payload, foreign marks,
-    //     passwords refused, made, checked, opened, strength, who writes it
-    {"clear", "", FORMAT_NONE, Kind::kClear, 0, 46, kNoKey, false, kAny, "",
-         nullptr, makeClear, checkByLibrary, openClear,
-         Strength::kClear, "any"},
-    {"sha", "{SHA}", FORMAT_SHA, Kind::kOneWay, 0, 0, kNoKey, false,
-         {base64Problem, 20, 20, 1, "the payload does not hold 20 bytes"}, "",
-         shaPasswordProblem, makeByLibrary, checkByLibrary, nullptr,
-         Strength::kUnsalted, "ldappw, slapd, 389-ds, Dovecot, passlib"},
-    {"ssha", "{SSHA}", FORMAT_SSHA, Kind::kOneWay, 0, 0, kNoKey, true,
-         {base64Problem, 20, LONG_MAX, 1, "the payload holds less than a digest of 20 bytes"}, "",
-         nullptr, makeSsha, checkByLibrary, nullptr,
-         Strength::kSaltedFast, "ldappw, slapd, 389-ds, Dovecot, passlib", &kSshaCosts, "SHA1"},
-    {"md5", "{MD5}", FORMAT_MD5, Kind::kOneWay, 0, 0, kNoKey, true,
-         {base64Problem, 16, 16, 1, "the payload does not hold 16 bytes"}, "$",
-         nullptr, makeByLibrary, checkByLibrary, nullptr,
-         Strength::kUnsalted, "ldappw, slapd, 389-ds, passlib"},
-    {"crypt", "{crypt}", FORMAT_CRYPT, Kind::kOneWay, 8, 8, kNoKey, false,
-         {cryptProblem, 0, 0, 0, "the payload is not 13 characters of the crypt alphabet"}, "$_*!",
-         nullptr, makeCrypt, checkByLibrary, nullptr,
-         Strength::kDesCrypt, "ldappw, slapd, 389-ds, passlib"},
-    {"qveil", "{qVEIL}", FORMAT_QVEIL, Kind::kReversible, 46, 46, kNoKey, false,
-         {maskedProblem, 0, 0, 0, "the masked payload does not decode"}, "",
-         nullptr, makeByLibrary, checkByLibrary, openByLibrary,
-         Strength::kReversible, "ldappw"},
-    {"aes128", "{AES128}", FORMAT_AES128, Kind::kReversible, 0, 0, 0, true, kBlocks, "",
-         nullptr, makeByLibrary, checkByOpening, openByLibrary,
-         Strength::kReversible, "ldappw"},
-    {"aes192", "{AES192}", FORMAT_AES192, Kind::kReversible, 0, 0, 1, true, kBlocks, "",
-         nullptr, makeByLibrary, checkByOpening, openByLibrary,
-         Strength::kReversible, "ldappw"},
-    {"aes256", "{AES256}", FORMAT_AES256, Kind::kReversible, 0, 0, 2, true, kBlocks, "",
-         nullptr, makeByLibrary, checkByOpening, openByLibrary,
-         Strength::kReversible, "ldappw"},
-    {"vldl", "{VLDL}", FORMAT_VLDL, Kind::kOneWay, 0, 0, kNoKey, false, kAny, "",
-         nullptr, nullptr, nullptr, nullptr,
-         Strength::kUnknown, ""},
+    // Of the library, clear text first: name, tag, code, kind, strength, who writes it, and what the names say.
+    Own("clear", "", FORMAT_NONE, Kind::kClear, kClear, "any")
+        .comparedBytes(46).made(makeClear).checked(checkByLibrary).opened(openClear),
+    Own("sha", "{SHA}", FORMAT_SHA, Kind::kOneWay, kUnsalted, "ldappw, slapd, 389-ds, Dovecot, passlib")
+        .payload({base64Problem, 20, 20, 1, "the payload does not hold 20 bytes"})
+        .refuses(shaPasswordProblem).made(makeByLibrary).checked(checkByLibrary),
+    Own("ssha", "{SSHA}", FORMAT_SSHA, Kind::kOneWay, kSaltedFast, "ldappw, slapd, 389-ds, Dovecot, passlib")
+        .payload({base64Problem, 20, LONG_MAX, 1, "the payload holds less than a digest of 20 bytes"})
+        .needsProvider().made(makeSsha).costs(kSshaCosts).algorithm("SHA1").checked(checkByLibrary),
+    Own("md5", "{MD5}", FORMAT_MD5, Kind::kOneWay, kUnsalted, "ldappw, slapd, 389-ds, passlib")
+        .payload({base64Problem, 16, 16, 1, "the payload does not hold 16 bytes"}).foreignMarks("$")
+        .needsProvider().made(makeByLibrary).checked(checkByLibrary),
+    Own("crypt", "{crypt}", FORMAT_CRYPT, Kind::kOneWay, kDesCrypt, "ldappw, slapd, 389-ds, passlib")
+        .payload({cryptProblem, 0, 0, 0, "the payload is not 13 characters of the crypt alphabet"}).foreignMarks("$_*!")
+        .cutBytes(8).comparedBytes(8).made(makeCrypt).checked(checkByLibrary),
+    Own("qveil", "{qVEIL}", FORMAT_QVEIL, Kind::kReversible, kReversible, "ldappw")
+        .payload({maskedProblem, 0, 0, 0, "the masked payload does not decode"})
+        .cutBytes(46).comparedBytes(46).made(makeByLibrary).checked(checkByLibrary).opened(openByLibrary),
+    aes("aes128", "{AES128}", FORMAT_AES128, 0),
+    aes("aes192", "{AES192}", FORMAT_AES192, 1),
+    aes("aes256", "{AES256}", FORMAT_AES256, 2),
+    Own("vldl", "{VLDL}", FORMAT_VLDL, Kind::kOneWay, Strength::kUnknown, ""),
 
     // Of other servers.
     // name, tags, beginning of the payload, strength, who writes it,

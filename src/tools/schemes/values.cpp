@@ -39,11 +39,11 @@ Status passwordProblem(const Scheme& scheme, std::string_view password) {
   return problem != nullptr ? Status{kBadValue, problem} : Status{};
 }
 
-Status makeValue(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out, const Costs& costs) {
+Status makeValue(const Scheme& scheme, const KeyRecord& key, const Costs& costs, const Secret& password, Secret& out) {
   const Status problem = passwordProblem(scheme, password.view());
   if (!problem.ok()) return problem;
   if (scheme.needsKey() && !key) return kNoKey;
-  return scheme.make(scheme, key, completeCosts(scheme, costs), password, out);
+  return scheme.make(scheme, key, costs, password, out);
 }
 
 bool isCostly(const Scheme& scheme) noexcept {

@@ -17,9 +17,8 @@ namespace tool {
 Status passwordProblem(const Scheme& scheme, std::string_view password);
 
 // Makes the stored value of a password; for clear text that is the password. The AES schemes need key (kBadKey
-// otherwise). Each call draws a salt of its own. Costs are those of completeCosts, or none.
-Status makeValue(const Scheme& scheme, const KeyRecord& key, const Secret& password, Secret& out,
-                 const Costs& costs = {});
+// otherwise). Each call draws a salt of its own. Costs are those of completeCosts.
+Status makeValue(const Scheme& scheme, const KeyRecord& key, const Costs& costs, const Secret& password, Secret& out);
 
 // True for schemes whose values take long on purpose.
 bool isCostly(const Scheme& scheme) noexcept;

@@ -38,12 +38,12 @@ const Scheme& chosenScheme(const Options& options) {
 // Makes the values, one after the other.
 class Maker {
  public:
-  Maker(const Options& options, const Scheme& scheme, const KeyRecord& key)
-      : results(options.end), options_(options), scheme_(scheme), key_(key) {}
+  Maker(const Options& options, const Scheme& scheme, const Costs& costs, const KeyRecord& key)
+      : results(options.end), options_(options), scheme_(scheme), costs_(costs), key_(key) {}
 
   void make(const Secret& password, size_t index, const std::string& place) {
     const Status status =
-        password.empty() && !options_.allowEmpty ? kEmpty : makeValue(scheme_, key_, password, value_, options_.costs);
+        password.empty() && !options_.allowEmpty ? kEmpty : makeValue(scheme_, key_, costs_, password, value_);
     keepFirst(exitCode_, status.code);
     if (!status.ok()) {
       problems_.add(place + ": " + status.text, status.text);
@@ -81,6 +81,7 @@ class Maker {
 
   const Options& options_;
   const Scheme& scheme_;
+  const Costs costs_;
   const KeyRecord& key_;
   Secret value_;
   ExitCode exitCode_ = kSuccess;
@@ -91,10 +92,10 @@ class Maker {
 ExitCode format(const Options& options) {
   refuseSecrets(options.secrets, "password");
   const Scheme& scheme = chosenScheme(options);
-  completeCosts(scheme, options.costs);  // refuses what the scheme does not have before a password is asked for
+  const Costs costs = completeCosts(scheme, options.costs);  // before a password is asked for
   if (scheme.needsProvider) requireProvider();
   const KeyRecord key = KeyRecord::load(scheme.needsKey() ? options.keys : "");
-  Maker maker(options, scheme, key);
+  Maker maker(options, scheme, costs, key);
   if (options.generate > 0) {
     maker.make(generatePassword(options.generate), 1, "the new password");
     maker.results.flush();

@@ -92,9 +92,10 @@ Secret wrongFor(const Secret& password) {
 }
 
 // The first thing that goes wrong, or null.
-const char* tryPassword(const Scheme& scheme, const Secret& password, const KeyRecord& keys, SchemeCounts& counts) {
+const char* tryPassword(const Scheme& scheme, const Costs& costs, const Secret& password, const KeyRecord& keys,
+                        SchemeCounts& counts) {
   Secret stored;
-  const Status made = makeValue(scheme, keys, password, stored);
+  const Status made = makeValue(scheme, keys, costs, password, stored);
   if (!made.ok()) return made.text;
   ++counts.made;
   const char* problem = nullptr;
@@ -116,12 +117,13 @@ const char* tryPassword(const Scheme& scheme, const Secret& password, const KeyR
 void tryScheme(const Scheme& scheme, const std::vector<Candidate>& candidates, const KeyRecord& keys, TrialPart& part) {
   const std::uint64_t start = threadNanoseconds();
   SchemeCounts& counts = part.schemes.of(scheme);
+  const Costs costs = completeCosts(scheme, {});
   for (const Candidate& candidate : candidates) {
     if (!passwordProblem(scheme, candidate.password.view()).ok()) {
       ++counts.skipped;
       continue;
     }
-    const char* problem = tryPassword(scheme, candidate.password, keys, counts);
+    const char* problem = tryPassword(scheme, costs, candidate.password, keys, counts);
     if (problem == nullptr) continue;
     ++part.counts.differences;
     part.report(candidate.line, candidate.dn, kBadValue, std::string(scheme.name) + ": " + problem);

@@ -100,50 +100,54 @@ std::string plainName(std::string_view dn) {
   return plain;
 }
 
-// The records, and what is known of each. An entry may have several values: any of them may match, and one that cannot
-// be checked leaves the answer open.
+// What is known of a record; a later one counts more. An entry may have several values: any of them may match, and one
+// that cannot be checked leaves the answer open.
+enum class Known { kNothing, kEntry, kNoMatch, kProblem, kMatch };
+
+struct Answer {
+  Known known;
+  Status status;
+};
+
 class Waiting {
  public:
   explicit Waiting(const BatchOptions& options) {
     forEachRecord(options, [&](const Secret& dn, const Secret& password, bool whole, bool) {
       if (whole) places_.emplace(plainName(dn.view()), passwords_.size());
       passwords_.emplace_back(password.view());
-      answers_.push_back(whole ? kNoEntry : kNoTab);
+      answers_.push_back({Known::kNothing, whole ? kNoEntry : kNoTab});
     });
   }
 
   void meet(const std::string& dn) {
-    if (places_.count(plainName(dn)) > 0) settle(plainName(dn), [](const Secret&) { return kNoPassword; });
+    if (places_.count(plainName(dn)) > 0)
+      settle(plainName(dn), [](const Secret&) { return Answer{Known::kEntry, kNoPassword}; });
   }
   void meet(const std::string& dn, const Secret& value, const KeyRecord& key, bool clear) {
-    settle(plainName(dn), [&](const Secret& password) { return check(value, key, password, clear); });
+    settle(plainName(dn), [&](const Secret& password) {
+      const Status status = check(value, key, password, clear);
+      const Known known = status.ok() ? Known::kMatch : status.code == kNoMatch ? Known::kNoMatch : Known::kProblem;
+      return Answer{known, status};
+    });
   }
 
-  const std::vector<Status>& answers() const noexcept { return answers_; }
+  const std::vector<Answer>& answers() const noexcept { return answers_; }
 
  private:
   template <typename Find>
   void settle(const std::string& name, Find find) {
     const auto places = places_.equal_range(name);
     for (auto place = places.first; place != places.second; ++place) {
-      const Status found = find(passwords_[place->second]);
+      const Answer found = find(passwords_[place->second]);
       const std::lock_guard<std::mutex> lock(mutex_);
-      Status& known = answers_[place->second];
-      if (rank(found) > rank(known)) known = found;
+      Answer& answer = answers_[place->second];
+      if (found.known > answer.known) answer = found;
     }
-  }
-
-  // Which of two answers counts.
-  static int rank(const Status& status) noexcept {
-    if (status.ok()) return 4;
-    if (status.text == kNoEntry.text) return 0;
-    if (status.text == kNoPassword.text) return 1;
-    return status.code == kNoMatch ? 2 : 3;
   }
 
   std::unordered_multimap<std::string, size_t> places_;
   std::vector<Secret> passwords_;
-  std::vector<Status> answers_;
+  std::vector<Answer> answers_;
   std::mutex mutex_;
 };
 
@@ -165,7 +169,7 @@ ExitCode checkEntries(const BatchOptions& options, const KeyRecord& key) {
   };
   runExport<ExportPart>(input, source, work, [](const ExportPart&) {});
   Answers answers(options);
-  for (const Status& status : waiting.answers()) answers.add(status, false);
+  for (const Answer& answer : waiting.answers()) answers.add(answer.status, false);
   return answers.finish();
 }
 #endif
