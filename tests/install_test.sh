@@ -32,8 +32,8 @@ cd "$work/moved/share/man"
 ls man3/{format_password,initQelCrypto,setAESKeyData,des}.3ldappw man7/ldappw.7 >> "$work/log"
 sed -n 's/^\.so //p' man3/* | xargs -d '\n' ls >> "$work/log"
 
-for file in bash-completion/completions/ldappw zsh/site-functions/_ldappw fish/vendor_completions.d/ldappw.fish \
+for file in bash-completion/completions/ldappw zsh/*/_ldappw fish/vendor_completions.d/ldappw.fish \
   doc/ldappw/{values,interoperability,moving}.md; do
-  [ -s "$work/moved/share/$file" ] || { echo "install_test: $file is missing" >&2; exit 1; }
+  compgen -G "$work/moved/share/$file" >/dev/null || { echo "install_test: $file is missing" >&2; exit 1; }
 done
 echo abc | "$work/moved/bin/ldappw" format --scheme md5 | grep -qx '{MD5}kAFQmDzST7DWlj99KOF/cg=='
