@@ -1,5 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // Directory exports: conversions to the byte, the readers that they stand on, and resuming what was stopped.
+#include <algorithm>
+
 #include "command.h"
 #include "ldif/record.h"
 

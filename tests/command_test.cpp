@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // The verbs that work on values and key stash files: what they answer, what they refuse, and that a refusal changes
 // nothing. Digests and AES values were made by openssl, foreign values by the programs that their table names.
+#include <algorithm>
 #include <set>
 
 #include "command.h"

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // The password schemes: detection, formatting, verification and reversal, what is left of secrets, and many threads.
 // What is expected comes from OpenSSL and from the system's own crypt, not from the product.
+#include <algorithm>
 #include <climits>
 #include <thread>
 
