@@ -36,7 +36,7 @@ inline std::vector<Counted>& countedWorks() {
 
 // A piece of work, named <row>/ours, or the same work by a peer, named <row>/<peer>. scripts/bench prints the ratios
 // of each row, and bars.csv states what they must not exceed.
-template <class Work>
+template <typename Work>
 benchmark::internal::Benchmark* measure(const std::string& name, Work work) {
   countedWorks().push_back({name, work});
   return benchmark::RegisterBenchmark(name.c_str(), [work](benchmark::State& state) {
@@ -45,7 +45,7 @@ benchmark::internal::Benchmark* measure(const std::string& name, Work work) {
 }
 
 // The same on one, two and four threads, named <row>/threads.
-template <class Work>
+template <typename Work>
 void measureThreads(const std::string& row, Work work) {
   benchmark::RegisterBenchmark((row + "/threads").c_str(),
                                [work](benchmark::State& state) {

@@ -18,7 +18,7 @@ namespace {
 constexpr char kPassword[] = "correct horse 42";
 constexpr size_t kPasswordBytes = sizeof kPassword - 1;
 
-template <class Function>
+template <typename Function>
 Function* found(void* library, const char* name, Function*) {
   return reinterpret_cast<Function*>(dlsym(library, name));
 }

@@ -34,10 +34,10 @@ if(LDAPPW_SANITIZE)
 endif()
 include(CheckCXXCompilerFlag)
 check_cxx_compiler_flag(-fcf-protection LDAPPW_CF_PROTECTION)
-# Release files: guarded stacks, checked copies, marked jump targets, and no path of the machine that builds them. A target
-# with the property LDAPPW_GUARD_ARRAYS_ALONE has the guard in functions with arrays, not wherever an address is taken.
-# Builds of the type None are those of distributions, with flags of their own; Debian's leave the paths as they are when
-# one has a blank, and do not reach assembly.
+# Release files: guarded stacks, checked copies, marked jump targets, and no path of the machine that builds them. A
+# target with the property LDAPPW_GUARD_ARRAYS_ALONE has the guard in functions with arrays, not wherever an address is
+# taken. Builds of the type None are those of distributions, with flags of their own; Debian's leave the paths as they
+# are when one has a blank, and do not reach assembly.
 target_compile_options(ldappw_options INTERFACE
   $<$<CONFIG:Release>:-fstack-protector$<$<NOT:$<BOOL:$<TARGET_PROPERTY:LDAPPW_GUARD_ARRAYS_ALONE>>>:-strong>>
   $<$<AND:$<CONFIG:Release,None>,$<BOOL:${LDAPPW_CF_PROTECTION}>>:-fcf-protection>
@@ -49,7 +49,8 @@ if(LDAPPW_COVERAGE)
 endif()
 
 # For sources that take long to compile and are not what a build is for: the suites, and the command under a sanitizer.
-# The checks left out there are the costly ones of the undefined-behaviour sanitizer; bad pointers still end the program.
+# The checks left out there are the costly ones of the undefined-behaviour sanitizer; bad pointers still end the
+# program.
 function(ldappw_compile_quickly target)
   if(LDAPPW_SANITIZE MATCHES undefined)
     target_compile_options(${target} PRIVATE -fno-sanitize=null,alignment,object-size,vptr)

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Base64 over any alphabet in both directions and the compaction, against the plainest way of each: a search through the
-// alphabet for every character.
+// Base64 over any alphabet in both directions and the compaction, against the plainest way of each: a search through
+// the alphabet for every character.
 #include "encoding_utils.h"
 #include "fuzz_input.h"
 

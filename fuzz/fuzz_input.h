@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the fuzz targets share: the input, taken apart from its front into heap blocks of exactly their size, so that the
-// sanitizers see every step beyond one; the requirement whose breach is a find; and a key record.
+// What the fuzz targets share: the input, taken apart from its front into heap blocks of exactly their size, so that
+// the sanitizers see every step beyond one; the requirement whose breach is a find; and a key record.
 #pragma once
 
 #include <cstdint>
@@ -49,7 +49,7 @@ class Input {
   Input(const uint8_t* data, size_t size) : rest_(reinterpret_cast<const char*>(data), size) {}
 
   // What is not there is zeros, or less.
-  template <class T>
+  template <typename T>
   T number() {
     static_assert(std::is_integral_v<T>);
     T value = 0;
@@ -74,7 +74,7 @@ class Input {
 struct Free {
   void operator()(void* data) const { std::free(data); }
 };
-template <class T>
+template <typename T>
 using Made = std::unique_ptr<T, Free>;
 
 inline AesKeyData* keyRecord() {

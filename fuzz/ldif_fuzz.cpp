@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // Directory exports, compressed ones among them, through the whole command, called as a function: any conversion leaves
-// every line that holds no password as it was, and neither it nor an audit of its result, as counts, as a report or as a
-// page, fails otherwise than by findings.
+// every line that holds no password as it was, and neither it nor an audit of its result, as counts, as a report or as
+// a page, fails otherwise than by findings.
 #include <strings.h>
 #include <sys/mman.h>
 #include <unistd.h>

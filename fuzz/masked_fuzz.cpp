@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// The masked decoder against a plain one. Behind base64 and DES a mutation of the text reaches nothing but noise, so most
-// mutations are made on the opened record, its packet and its data in clear, which is then enciphered again under the
-// keys that it names.
+// The masked decoder against a plain one. Behind base64 and DES a mutation of the text reaches nothing but noise, so
+// most mutations are made on the opened record, its packet and its data in clear, which is then enciphered again under
+// the keys that it names.
 #include <algorithm>
 #include <optional>
 

@@ -75,7 +75,7 @@ class Machine {
     kEntries[entry](*this);
   }
 
-  template <class T>
+  template <typename T>
   static T* as(uintptr_t handle) {
     return reinterpret_cast<T*>(handle);
   }
@@ -144,7 +144,7 @@ class Machine {
     require(QEL_RAND_seed(ctx(), buffer.bytes(), count) == rc);
   }
 
-  template <class Algorithm>
+  template <typename Algorithm>
   void find(const Algorithm* (*entry)(QEL_CTX*, const char*), int (*size)(QEL_CTX*, const Algorithm*), Kind kind) {
     const Algorithm* found = entry(ctx(), name().text());
     require(found == nullptr || isLive());
@@ -160,11 +160,11 @@ class Machine {
     require(ofDigest >= 0 && (ofDigest == 0 || live(any, kDigest) != nullptr));
     require(ofCipher >= 0 && (ofCipher == 0 || live(any, kCipher) != nullptr));
   }
-  template <class Context>
+  template <typename Context>
   void make(Context* (*entry)(QEL_CTX*), Kind kind) {
     require((add(entry(ctx()), kind) != nullptr) == isLive());
   }
-  template <class Context>
+  template <typename Context>
   void wipe(int (*entry)(QEL_CTX*, Context*), Kind kind, bool ends = false) {
     const uintptr_t any = handle(kind);
     Object* const object = live(any, kind);

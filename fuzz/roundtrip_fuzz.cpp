@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// A value is made under every scheme, in a buffer of exactly the least size: it matches the password that it was made of
-// and no other, and opens into it when the scheme is reversible.
+// A value is made under every scheme, in a buffer of exactly the least size: it matches the password that it was made
+// of and no other, and opens into it when the scheme is reversible.
 #include <strings.h>
 
 #include <algorithm>

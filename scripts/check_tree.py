@@ -208,6 +208,37 @@ def bare_word_faults():
                 yield '%s:%d: a bare "meant"; say why, and what follows' % (path.relative_to(ROOT), number)
 
 
+DIALECT = (
+    (re.compile(r"^#ifndef \w+_H_?$", re.M), "an include guard; use #pragma once"),
+    (re.compile(r"\bstd::size_t\b"), "std::size_t; write size_t"),
+    (re.compile(r"\btemplate <[^>]*\bclass\b"), "template <class; write typename"),
+    (re.compile(r"^#include <(?:errno|limits|signal|stddef|stdint|stdio|stdlib|string|time)\.h>", re.M),
+     "a header of C; include its C++ form"),
+)
+# C programs read these too.
+C_HEADERS = PUBLIC | {"qel.h", "ldtr.h", "dsutil.h"}
+
+
+def dialect_faults():
+    for path in files("src/*.cpp", "src/*.h", "tests/*.cpp", "tests/*.h", "bench/*.cpp", "bench/*.h", "fuzz/*.cpp",
+                      "fuzz/*.h"):
+        text = path.read_text()
+        for pattern, what in DIALECT:
+            for match in pattern.finditer(text) if path.name not in C_HEADERS else ():
+                yield "%s:%d: %s" % (path.relative_to(ROOT), text.count("\n", 0, match.start()) + 1, what)
+
+
+def wide_line_faults():
+    """Of code, and of comments wherever they are: the formatter leaves them alone, and reads no scripts."""
+    for path in files("src", "bench/*.cpp", "bench/*.h", "examples", "cmake", "fuzz/*.cpp", "fuzz/*.h", "tests",
+                      "scripts"):
+        if path.name == "page_parts.h" or path.suffix == ".vec":  # text of a page, data
+            continue
+        for number, line in enumerate(path.read_text(errors="replace").splitlines(), 1):
+            if len(line) > 120 and (path.parts[len(ROOT.parts)] != "scripts" or line.lstrip().startswith("#")):
+                yield "%s:%d: wider than 120 columns" % (path.relative_to(ROOT), number)
+
+
 def objects_of(part, build):
     folder = build / part / "CMakeFiles" / (OBJECTS[part] + ".dir")
     objects = {str(path.relative_to(folder).with_suffix("")): path for path in sorted(folder.rglob("*.o"))}
@@ -219,7 +250,8 @@ def objects_of(part, build):
 
 def main():
     build = ROOT / (sys.argv[1] if len(sys.argv) > 1 else "build/release")
-    faults = [*include_faults(), *forbidden_call_faults(), *bare_word_faults()]
+    faults = [*include_faults(), *forbidden_call_faults(), *bare_word_faults(), *dialect_faults(),
+              *wide_line_faults()]
     for part in LAYERS:
         defined, needed = defined_and_needed(objects_of(part, build))
         graph = calls(defined, needed)

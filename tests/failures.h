@@ -19,7 +19,7 @@ using Body = std::function<void()>;
 using Failure = std::function<void(const Body&)>;
 
 // Runs the body with another value in the slot: a provider entry that fails, an argument that is null.
-template <class T>
+template <typename T>
 Failure replacing(T& slot, std::common_type_t<T> value) {
   return [&slot, value](const Body& body) {
     const Replaced<T> guard(slot, value);

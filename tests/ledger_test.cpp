@@ -40,13 +40,13 @@ class Odd {
  public:
   Odd(int argument, int variant) : argument_(argument), variant_(variant) {}
 
-  template <class T>
+  template <typename T>
   T* pointer(T* sound) {
     return isOdd(1) ? nullptr : sound;
   }
   int number(int sound) { return odd(sound, 4); }
   int bytes(int sound) { return odd(sound, 3); }
-  template <class T>
+  template <typename T>
   T** slot(T** sound) {
     if (!isOdd(2)) return sound;
     if (variant_ == 0) return nullptr;
@@ -78,7 +78,7 @@ char Odd::held_[64];
 std::string shown(int result) {
   return std::to_string(result);
 }
-template <class T>
+template <typename T>
 std::string shown(T* result) {
   free(result);
   return result == nullptr ? "null" : "some";
@@ -106,7 +106,7 @@ void *context = nullptr, *algorithm = nullptr;
 unsigned length = 0;
 int number = 0;
 
-template <class T>
+template <typename T>
 std::string with(
     int rc, T*& slot, void (*release)(T*) = [](T* data) { free(data); }) {
   T* const got = std::exchange(slot, nullptr);
@@ -128,12 +128,12 @@ std::string blob(unsigned char* data) {
 }
 
 // Arguments in braces, so that they are handed out from left to right.
-template <class... T>
+template <typename... T>
 struct Arguments : std::tuple<T...> {
   Arguments(T... arguments) : std::tuple<T...>(arguments...) {}
 };
 
-template <class Operation, class... T>
+template <typename Operation, typename... T>
 auto run(Operation operation, const Arguments<T...>& arguments) {
   return std::apply(operation, static_cast<const std::tuple<T...>&>(arguments));
 }
@@ -247,150 +247,252 @@ class HostState {
   }
 };
 
+// A call of an operation with odd arguments, which an initialiser takes in order.
+#define CALL(operation, ...) [](Odd& a) -> std::string { return shown(run(operation, Arguments{__VA_ARGS__})); }
+
 // clang-format off
 const Row kRows[] = {
-    {"check_format", [](Odd& a) -> std::string { return shown(run(check_format, Arguments{a.pointer(value), static_cast<unsigned>(a.bytes(8))})); }, "1 | 133 133 1"},
-    {"formatted_password_length", [](Odd& a) -> std::string { return shown(run(formatted_password_length, Arguments{a.number(133), a.number(16)})); }, "-1 -1 -1 -1 | -1 8 32 -1"},
-    {"format_password", [](Odd& a) -> std::string { return shown(run(format_password, Arguments{a.number(2), a.pointer(salt), a.pointer(keys), a.pointer(text), a.bytes(6), a.pointer(room), a.bytes(256)})); }, "0 0 0 0 | 33 | 33 | 0 | 0 0 33 | 0 | 0 0 0",
+    {"check_format", CALL(check_format, a.pointer(value), static_cast<unsigned>(a.bytes(8))), "1 | 133 133 1"},
+    {"formatted_password_length", CALL(formatted_password_length, a.number(133), a.number(16)),
+     "-1 -1 -1 -1 | -1 8 32 -1"},
+    {"format_password", CALL(format_password, a.number(2), a.pointer(salt), a.pointer(keys), a.pointer(text),
+     a.bytes(6), a.pointer(room), a.bytes(256)), "0 0 0 0 | 33 | 33 | 0 | 0 0 33 | 0 | 0 0 0",
      {}, {"no alphabet: 0 "}},
-    {"format_password, crypt", [](Odd& a) -> std::string { return shown(run(format_password, Arguments{4, a.pointer(salt), nullptr, a.pointer(text), a.bytes(6), a.pointer(room), a.bytes(256)})); }, "0 | 0 | 0 0 20 | 0 | 0 0 0"},
-    {"format_password, AES", [](Odd& a) -> std::string { return shown(run(format_password, Arguments{134, nullptr, a.pointer(keys), a.pointer(text), a.bytes(6), a.pointer(room), a.bytes(256)})); }, "0 | 0 | 0 0 32 | 0 | 0 0 0",
-     {}, cipherSteps("Encrypt", "0 debug: Error - aesEncryptBuffer: ", " rc = 1\n") + Lines{"no alphabet: 0 debug: Error - aesEncryptBuffer: binaryBlobToBase64() returned NULL. rc = 1\n"}},
-    {"format_password, same", [](Odd& a) -> std::string { return shown(run(format_password, Arguments{a.number(1), nullptr, nullptr, room, 3, room, 256})); }, "0 0 0 0"},
-    {"verify_password", [](Odd& a) -> std::string { return shown(run(verify_password, Arguments{a.pointer(text), a.bytes(6), a.pointer(text), a.bytes(6), a.number(1), a.pointer(keys)})); }, "99 | 99 99 99 | 99 | 99 99 99 | 0 0 0 0 | 0"},
-    {"verify_password, SHA", [](Odd& a) -> std::string { return shown(run(verify_password, Arguments{text, 6, shaValue.c_str(), a.bytes(33), 1, a.pointer(keys)})); }, "99 99 99 | 0",
+    {"format_password, crypt", CALL(format_password, 4, a.pointer(salt), nullptr, a.pointer(text), a.bytes(6),
+     a.pointer(room), a.bytes(256)), "0 | 0 | 0 0 20 | 0 | 0 0 0"},
+    {"format_password, AES", CALL(format_password, 134, nullptr, a.pointer(keys), a.pointer(text), a.bytes(6),
+     a.pointer(room), a.bytes(256)), "0 | 0 | 0 0 32 | 0 | 0 0 0",
+     {}, cipherSteps("Encrypt", "0 debug: Error - aesEncryptBuffer: ",
+      " rc = 1\n") +
+      Lines{"no alphabet: 0 debug: Error - aesEncryptBuffer: binaryBlobToBase64() returned NULL. rc = 1\n"}},
+    {"format_password, same", CALL(format_password, a.number(1), nullptr, nullptr, room, 3, room, 256), "0 0 0 0"},
+    {"verify_password", CALL(verify_password, a.pointer(text), a.bytes(6), a.pointer(text), a.bytes(6), a.number(1),
+     a.pointer(keys)), "99 | 99 99 99 | 99 | 99 99 99 | 0 0 0 0 | 0"},
+    {"verify_password, SHA", CALL(verify_password, text, 6, shaValue.c_str(), a.bytes(33), 1, a.pointer(keys)),
+     "99 99 99 | 0",
      {}, {"no alphabet: 99 "}},
-    {"unformat_password", [](Odd& a) -> std::string { return with(run(unformat_password, Arguments{a.pointer(maskedText()), a.slot(&made), a.pointer(keys), a.pointer(&number)}), made); }, "0 | 0 1+ | 1+ | 1+",
+    {"unformat_password", [](Odd& a) -> std::string { return with(run(unformat_password,
+     Arguments{a.pointer(maskedText()), a.slot(&made), a.pointer(keys), a.pointer(&number)}), made); },
+     "0 | 0 1+ | 1+ | 1+",
      {"0 "}},
-    {"morva_decodePW", [](Odd& a) -> std::string { return with(run(morva_decodePW, Arguments{a.slot(&made), a.pointer(maskedText()), a.pointer(keys)}), made); }, "1 0+ | 1 | 0+",
+    {"morva_decodePW", [](Odd& a) -> std::string { return with(run(morva_decodePW, Arguments{a.slot(&made),
+     a.pointer(maskedText()), a.pointer(keys)}), made); }, "1 0+ | 1 | 0+",
      {"80 "}},
-    {"_crypt_r", [](Odd& a) -> std::string { return std::to_string(run(_crypt_r, Arguments{a.pointer(text), a.pointer(salt), a.pointer(&state)}) != nullptr); }, "0 | 0 | 0"},
-    {"_crypt_r, same", [](Odd& a) -> std::string { return std::to_string(run(_crypt_r, Arguments{state.iobuf, a.pointer(salt), &state}) != nullptr); }, "0"},
-    {"__crypt_std_r", [](Odd& a) -> std::string { return std::to_string(run(__crypt_std_r, Arguments{a.pointer(text), a.pointer(salt), a.pointer(&state)}) != nullptr); }, "0 | 0 | 0"},
-    {"_crypt", [](Odd& a) -> std::string { return std::to_string(run(_crypt, Arguments{a.pointer(text), a.pointer(salt)}) != nullptr); }, "0 | 0"},
-    {"__crypt_std", [](Odd& a) -> std::string { return std::to_string(run(__crypt_std, Arguments{a.pointer(text), a.pointer(salt)}) != nullptr); }, "0 | 0"},
-    {"_setkey_r", [](Odd& a) -> std::string { return shown(run(_setkey_r, Arguments{a.pointer(bits), a.pointer(&state)})); }, "-1 | -1"},
-    {"_setkey_r, same", [](Odd& a) -> std::string { return shown(run(_setkey_r, Arguments{state.block, a.pointer(&state)})); }, "-1"},
-    {"_encrypt_r", [](Odd& a) -> std::string { return shown(run(_encrypt_r, Arguments{a.pointer(bits), a.number(0), a.pointer(&state)})); }, "-1 | -1 -1 0 -1 | -1"},
-    {"_encrypt_r, same", [](Odd& a) -> std::string { return shown(run(_encrypt_r, Arguments{state.block, a.number(0), &state})); }, "-1 -1 0 -1"},
-    {"_setkey", [](Odd& a) -> std::string { return shown(run(_setkey, Arguments{a.pointer(bits)})); }, "-1"},
-    {"_encrypt", [](Odd& a) -> std::string { return shown(run(_encrypt, Arguments{a.pointer(bits), a.number(0)})); }, "-1 | -1 -1 0 -1"},
-    {"setkey_r", [](Odd& a) -> std::string { return shown(run(ldappw_setkey_r, Arguments{a.pointer(bits), a.pointer(&state)})); }, "0 | 0"},
-    {"encrypt_r", [](Odd& a) -> std::string { return shown(run(ldappw_encrypt_r, Arguments{a.pointer(bits), a.number(0), a.pointer(&state)})); }, "0 | 0 0 0 0 | 0"},
-    {"setkey", [](Odd& a) -> std::string { return shown(run(ldappw_setkey, Arguments{a.pointer(bits)})); }, "0"},
-    {"encrypt", [](Odd& a) -> std::string { return shown(run(ldappw_encrypt, Arguments{a.pointer(bits), a.number(0)})); }, "0 | 0 0 0 0"},
-    {"generate_crypt_salt", [](Odd& a) -> std::string { return (run(generate_crypt_salt, Arguments{a.pointer(salt)}), "-"); }, "-"},
-    {"SHA", [](Odd& a) -> std::string { return (run(SHA, Arguments{a.pointer(text), 6, a.pointer(&digest)}), "-"); }, "- | -"},
-    {"SHA, same", [](Odd& a) -> std::string { return (run(SHA, Arguments{reinterpret_cast<char*>(digest.word), 20, a.pointer(&digest)}), "-"); }, "-"},
-    {"saltedHashEncrypt", [](Odd& a) -> std::string { return with(run(saltedHashEncrypt, Arguments{a.pointer(text), a.slot(&made), a.pointer("SHA1")}), made); }, "1! | 1! 0+ | 1!",
-     {"1 debug: binaryBlobToBase64() returned NULL."}, saltedSteps({"MD_size=0 MD_size=-1: 1 debug: QEL_EVP_MD_size() failed."}, {"RAND_bytes: 1 debug: QEL_RAND_bytes() failed."}) + Lines{"no alphabet: 1 debug: binaryBlobToBase64() returned NULL."}},
-    {"unsaltedHashEncrypt", [](Odd& a) -> std::string { return with(run(unsaltedHashEncrypt, Arguments{a.pointer("md5"), a.pointer(text), a.slot(&made)}), made); }, "1 | 1 | 1 0+",
+    {"_crypt_r", [](Odd& a) -> std::string { return std::to_string(run(_crypt_r, Arguments{a.pointer(text),
+     a.pointer(salt), a.pointer(&state)}) != nullptr); }, "0 | 0 | 0"},
+    {"_crypt_r, same", [](Odd& a) -> std::string { return std::to_string(run(_crypt_r, Arguments{state.iobuf,
+     a.pointer(salt), &state}) != nullptr); }, "0"},
+    {"__crypt_std_r", [](Odd& a) -> std::string { return std::to_string(run(__crypt_std_r, Arguments{a.pointer(text),
+     a.pointer(salt), a.pointer(&state)}) != nullptr); }, "0 | 0 | 0"},
+    {"_crypt", [](Odd& a) -> std::string { return std::to_string(run(_crypt, Arguments{a.pointer(text),
+     a.pointer(salt)}) != nullptr); }, "0 | 0"},
+    {"__crypt_std", [](Odd& a) -> std::string { return std::to_string(run(__crypt_std, Arguments{a.pointer(text),
+     a.pointer(salt)}) != nullptr); }, "0 | 0"},
+    {"_setkey_r", CALL(_setkey_r, a.pointer(bits), a.pointer(&state)), "-1 | -1"},
+    {"_setkey_r, same", CALL(_setkey_r, state.block, a.pointer(&state)), "-1"},
+    {"_encrypt_r", CALL(_encrypt_r, a.pointer(bits), a.number(0), a.pointer(&state)), "-1 | -1 -1 0 -1 | -1"},
+    {"_encrypt_r, same", CALL(_encrypt_r, state.block, a.number(0), &state), "-1 -1 0 -1"},
+    {"_setkey", CALL(_setkey, a.pointer(bits)), "-1"},
+    {"_encrypt", CALL(_encrypt, a.pointer(bits), a.number(0)), "-1 | -1 -1 0 -1"},
+    {"setkey_r", CALL(ldappw_setkey_r, a.pointer(bits), a.pointer(&state)), "0 | 0"},
+    {"encrypt_r", CALL(ldappw_encrypt_r, a.pointer(bits), a.number(0), a.pointer(&state)), "0 | 0 0 0 0 | 0"},
+    {"setkey", CALL(ldappw_setkey, a.pointer(bits)), "0"},
+    {"encrypt", CALL(ldappw_encrypt, a.pointer(bits), a.number(0)), "0 | 0 0 0 0"},
+    {"generate_crypt_salt", [](Odd& a) -> std::string { return (run(generate_crypt_salt, Arguments{a.pointer(salt)}),
+     "-"); }, "-"},
+    {"SHA", [](Odd& a) -> std::string { return (run(SHA, Arguments{a.pointer(text), 6, a.pointer(&digest)}), "-"); },
+     "- | -"},
+    {"SHA, same", [](Odd& a) -> std::string { return (run(SHA, Arguments{reinterpret_cast<char*>(digest.word), 20,
+     a.pointer(&digest)}), "-"); }, "-"},
+    {"saltedHashEncrypt", [](Odd& a) -> std::string { return with(run(saltedHashEncrypt, Arguments{a.pointer(text),
+     a.slot(&made), a.pointer("SHA1")}), made); }, "1! | 1! 0+ | 1!",
+     {"1 debug: binaryBlobToBase64() returned NULL."},
+      saltedSteps({"MD_size=0 MD_size=-1: 1 debug: QEL_EVP_MD_size() failed."},
+      {"RAND_bytes: 1 debug: QEL_RAND_bytes() failed."}) +
+      Lines{"no alphabet: 1 debug: binaryBlobToBase64() returned NULL."}},
+    {"unsaltedHashEncrypt", [](Odd& a) -> std::string { return with(run(unsaltedHashEncrypt,
+     Arguments{a.pointer("md5"), a.pointer(text), a.slot(&made)}), made); }, "1 | 1 | 1 0+",
      {"1 debug: binaryBlobToBase64()returned NULL."}, {
-      "no provider: 1 Error - initQelCrypto: loadQelCrypto() failed. \n", "get_digestbyname=0 MD_CTX_new=0: 1 debug: Error - unsaltedHashEncrypt: initQelDigest() failed",
-      "MD_size=0 MD_size=-1: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_MD_size() failed", "DigestInit=0: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_DigestInit() failed",
-      "DigestInit=2 DigestInit=-1 DigestUpdate=0: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_DigestUpdate() failed", "DigestFinal=0: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_DigestFinal() failed", "no alphabet: 1 debug: binaryBlobToBase64()returned NULL."}},
-    {"saltedHashVerify", [](Odd& a) -> std::string { return shown(run(saltedHashVerify, Arguments{a.pointer(text), a.pointer(saltedValue.c_str()), a.pointer("SHA1")})); }, "1! | 1! | 1!",
-     {"1 debug: base64ToBinaryBlob() returned NULL."}, saltedSteps({"MD_size=0: 1 debug: QEL_EVP_MD_size() failed.", "MD_size=2: 49 ", "MD_size=-1: 1 debug: QEL_EVP_MD_size() failed."}) + Lines{"no alphabet: 1 debug: base64ToBinaryBlob() returned NULL."}},
-    {"binaryBlobToString", [](Odd& a) -> std::string { return shown(run(binaryBlobToString, Arguments{a.pointer(bytes), a.bytes(16), a.pointer(pBase64)})); }, "null | some some some | null",
+      "no provider: 1 Error - initQelCrypto: loadQelCrypto() failed. \n",
+      "get_digestbyname=0 MD_CTX_new=0: 1 debug: Error - unsaltedHashEncrypt: initQelDigest() failed",
+      "MD_size=0 MD_size=-1: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_MD_size() failed",
+      "DigestInit=0: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_DigestInit() failed",
+      "DigestInit=2 DigestInit=-1 DigestUpdate=0: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_DigestUpdate() failed",
+      "DigestFinal=0: 1 debug: Error - unsaltedHashEncrypt: QEL_EVP_DigestFinal() failed",
+      "no alphabet: 1 debug: binaryBlobToBase64()returned NULL."}},
+    {"saltedHashVerify", CALL(saltedHashVerify, a.pointer(text), a.pointer(saltedValue.c_str()), a.pointer("SHA1")),
+     "1! | 1! | 1!",
+     {"1 debug: base64ToBinaryBlob() returned NULL."}, saltedSteps({"MD_size=0: 1 debug: QEL_EVP_MD_size() failed.",
+      "MD_size=2: 49 ",
+      "MD_size=-1: 1 debug: QEL_EVP_MD_size() failed."}) +
+      Lines{"no alphabet: 1 debug: base64ToBinaryBlob() returned NULL."}},
+    {"binaryBlobToString", CALL(binaryBlobToString, a.pointer(bytes), a.bytes(16), a.pointer(pBase64)),
+     "null | some some some | null",
      {"null "}, {"no alphabet: null "}},
-    {"binaryBlobToBase64", [](Odd& a) -> std::string { return shown(run(binaryBlobToBase64, Arguments{a.pointer(bytes), a.bytes(16)})); }, "null | some some some",
+    {"binaryBlobToBase64", CALL(binaryBlobToBase64, a.pointer(bytes), a.bytes(16)), "null | some some some",
      {"null "}, {"no alphabet: null "}},
-    {"stringToBinaryBlob", [](Odd& a) -> std::string { return blob(run(stringToBinaryBlob, Arguments{a.pointer(base64), a.pointer(&length), a.pointer(pBase64)})); }, "null | null | null",
+    {"stringToBinaryBlob", [](Odd& a) -> std::string { return blob(run(stringToBinaryBlob, Arguments{a.pointer(base64),
+     a.pointer(&length), a.pointer(pBase64)})); }, "null | null | null",
      {"null "}, {"no alphabet: null "}},
-    {"stringToBinaryBlob, same", [](Odd& a) -> std::string { return blob(run(stringToBinaryBlob, Arguments{pBase64, a.pointer(&length), pBase64})); }, "null",
+    {"stringToBinaryBlob, same", [](Odd& a) -> std::string { return blob(run(stringToBinaryBlob, Arguments{pBase64,
+     a.pointer(&length), pBase64})); }, "null",
      {"null "}, {"no alphabet: null "}},
-    {"base64ToBinaryBlob", [](Odd& a) -> std::string { return blob(run(base64ToBinaryBlob, Arguments{a.pointer(base64), a.pointer(&length)})); }, "null | null",
+    {"base64ToBinaryBlob", [](Odd& a) -> std::string { return blob(run(base64ToBinaryBlob, Arguments{a.pointer(base64),
+     a.pointer(&length)})); }, "null | null",
      {"null "}, {"no alphabet: null "}},
-    {"compactToOnlyString", [](Odd& a) -> std::string { return shown(run(compactToOnlyString, Arguments{a.pointer(base64), a.pointer(pBase64)})); }, "null | null",
+    {"compactToOnlyString", CALL(compactToOnlyString, a.pointer(base64), a.pointer(pBase64)), "null | null",
      {"null "}, {"no alphabet: null "}},
-    {"compactToOnlyBase64", [](Odd& a) -> std::string { return shown(run(compactToOnlyBase64, Arguments{a.pointer(base64)})); }, "null",
+    {"compactToOnlyBase64", CALL(compactToOnlyBase64, a.pointer(base64)), "null",
      {"null "}, {"no alphabet: null "}},
-    {"des", [](Odd& a) -> std::string { return (run(des, Arguments{a.pointer(words), a.pointer(bytes)}), "-"); }, "- | -"},
-    {"deskey", [](Odd& a) -> std::string { return (run(deskey, Arguments{a.pointer(words), a.pointer(bytes), a.number(0)}), "-"); }, "- | - | - - - -"},
-    {"deskey, same", [](Odd& a) -> std::string { return (run(deskey, Arguments{words, reinterpret_cast<unsigned char*>(a.pointer(words)), 0}), "-"); }, "-"},
-    {"deskey56", [](Odd& a) -> std::string { return (run(deskey56, Arguments{a.pointer(words), a.pointer(bytes), a.number(0)}), "-"); }, "- | - | - - - -"},
-    {"deskey40", [](Odd& a) -> std::string { return (run(deskey40, Arguments{a.pointer(words), a.pointer(bytes), a.number(0)}), "-"); }, "- | - | - - - -"},
-    {"des3key", [](Odd& a) -> std::string { return (run(des3key, Arguments{a.pointer(words), a.pointer(bytes), a.number(0)}), "-"); }, "- | - | - - - -"},
-    {"simpleCrypt", [](Odd& a) -> std::string { return shown(run(simpleCrypt, Arguments{a.pointer(text), a.bytes(6)})); }, "null | some some some",
+    {"des", [](Odd& a) -> std::string { return (run(des, Arguments{a.pointer(words), a.pointer(bytes)}), "-"); },
+     "- | -"},
+    {"deskey", [](Odd& a) -> std::string { return (run(deskey, Arguments{a.pointer(words), a.pointer(bytes),
+     a.number(0)}), "-"); }, "- | - | - - - -"},
+    {"deskey, same", [](Odd& a) -> std::string { return (run(deskey, Arguments{words,
+     reinterpret_cast<unsigned char*>(a.pointer(words)), 0}), "-"); }, "-"},
+    {"deskey56", [](Odd& a) -> std::string { return (run(deskey56, Arguments{a.pointer(words), a.pointer(bytes),
+     a.number(0)}), "-"); }, "- | - | - - - -"},
+    {"deskey40", [](Odd& a) -> std::string { return (run(deskey40, Arguments{a.pointer(words), a.pointer(bytes),
+     a.number(0)}), "-"); }, "- | - | - - - -"},
+    {"des3key", [](Odd& a) -> std::string { return (run(des3key, Arguments{a.pointer(words), a.pointer(bytes),
+     a.number(0)}), "-"); }, "- | - | - - - -"},
+    {"simpleCrypt", CALL(simpleCrypt, a.pointer(text), a.bytes(6)), "null | some some some",
      {"null "}},
-    {"_morva_utils_encode_buffer", [](Odd& a) -> std::string { return with(run(_morva_utils_encode_buffer, Arguments{a.pointer(text), a.slot(&made)}), made); }, "1 | 1 0+",
+    {"_morva_utils_encode_buffer", [](Odd& a) -> std::string { return with(run(_morva_utils_encode_buffer,
+     Arguments{a.pointer(text), a.slot(&made)}), made); }, "1 | 1 0+",
      {"90 "}},
-    {"_morva_utils_encode_binary", [](Odd& a) -> std::string { return with(run(_morva_utils_encode_binary, Arguments{a.pointer(bytes), a.number(16), a.slot(&made)}), made); }, "1 | 80 80 0+ 80 | 1 0+",
+    {"_morva_utils_encode_binary", [](Odd& a) -> std::string { return with(run(_morva_utils_encode_binary,
+     Arguments{a.pointer(bytes), a.number(16), a.slot(&made)}), made); }, "1 | 80 80 0+ 80 | 1 0+",
      {"90 "}},
-    {"_morva_utils_decode_buffer", [](Odd& a) -> std::string { return with(run(_morva_utils_decode_buffer, Arguments{a.pointer(const_cast<char*>(maskedText())), a.slot(&made)}), made); }, "1 | 1 0+",
+    {"_morva_utils_decode_buffer", [](Odd& a) -> std::string { return with(run(_morva_utils_decode_buffer,
+     Arguments{a.pointer(const_cast<char*>(maskedText())), a.slot(&made)}), made); }, "1 | 1 0+",
      {"90 "}},
-    {"_morva_utils_decode_binary", [](Odd& a) -> std::string { return with(run(_morva_utils_decode_binary, Arguments{a.pointer(const_cast<char*>(maskedText())), a.slot(&madeBytes), a.pointer(&number)}), madeBytes); }, "1 | 1 0+ | 1",
+    {"_morva_utils_decode_binary", [](Odd& a) -> std::string { return with(run(_morva_utils_decode_binary,
+     Arguments{a.pointer(const_cast<char*>(maskedText())), a.slot(&madeBytes), a.pointer(&number)}), madeBytes); },
+     "1 | 1 0+ | 1",
      {"90 "}},
-    {"_morva_utils_encode_buffer_free", [](Odd& a) -> std::string { return (run(_morva_utils_encode_buffer_free, Arguments{a.pointer(&made)}), "-"); }, "-"},
-    {"_morva_utils_encode_binary_free", [](Odd& a) -> std::string { return (run(_morva_utils_encode_binary_free, Arguments{a.pointer(&made)}), "-"); }, "-"},
-    {"_morva_utils_decode_buffer_free", [](Odd& a) -> std::string { return (run(_morva_utils_decode_buffer_free, Arguments{a.pointer(&made)}), "-"); }, "-"},
-    {"_morva_utils_decode_binary_free", [](Odd& a) -> std::string { return (run(static_cast<void (*)(char**)>(_morva_utils_decode_binary_free), Arguments{a.pointer(&made)}), "-"); }, "-"},
-    {"_morva_utils_getEncodedSize", [](Odd& a) -> std::string { return shown(run(_morva_utils_getEncodedSize, Arguments{a.number(16)})); }, "165 165 165 0"},
-    {"ldapLoadLib", [](Odd& a) -> std::string { return std::to_string(ldapUnloadLib(run(ldapLoadLib, Arguments{a.pointer(nowhere), 0}))); }, "80",
+    {"_morva_utils_encode_buffer_free", [](Odd& a) -> std::string { return (run(_morva_utils_encode_buffer_free,
+     Arguments{a.pointer(&made)}), "-"); }, "-"},
+    {"_morva_utils_encode_binary_free", [](Odd& a) -> std::string { return (run(_morva_utils_encode_binary_free,
+     Arguments{a.pointer(&made)}), "-"); }, "-"},
+    {"_morva_utils_decode_buffer_free", [](Odd& a) -> std::string { return (run(_morva_utils_decode_buffer_free,
+     Arguments{a.pointer(&made)}), "-"); }, "-"},
+    {"_morva_utils_decode_binary_free",
+     [](Odd& a) -> std::string { return (run(static_cast<void (*)(char**)>(_morva_utils_decode_binary_free),
+     Arguments{a.pointer(&made)}), "-"); }, "-"},
+    {"_morva_utils_getEncodedSize", CALL(_morva_utils_getEncodedSize, a.number(16)), "165 165 165 0"},
+    {"ldapLoadLib", [](Odd& a) -> std::string { return std::to_string(ldapUnloadLib(run(ldapLoadLib,
+     Arguments{a.pointer(nowhere), 0}))); }, "80",
      {"80 "}},
-    {"ldapGetSymAddress", [](Odd& a) -> std::string { return std::to_string(run(ldapGetSymAddress, Arguments{a.pointer(qelLoadGlobal), a.pointer("QEL_Init")}) != nullptr); }, "0 | 0",
+    {"ldapGetSymAddress", [](Odd& a) -> std::string { return std::to_string(run(ldapGetSymAddress,
+     Arguments{a.pointer(qelLoadGlobal), a.pointer("QEL_Init")}) != nullptr); }, "0 | 0",
      {}, {"no provider: 0 "}},
-    {"setDefLibpath", [](Odd&) { setenv("LD_LIBRARY_PATH", "/opt/x", 1); return shown(setDefLibpath()); }, "", {}, {}, "environment"},
-    {"fixupCipherSpecs", [](Odd& a) -> std::string { return (run(fixupCipherSpecs, Arguments{a.pointer(room)}), "-"); }, "-"},
-    {"loadQelCrypto", [](Odd& a) -> std::string { return with(run(loadQelCrypto, Arguments{a.slot(&made)}), made); }, "1! 0+",
-     {"0 debug:  Memory allocation failed ! \n", "90 Error - loadQelCrypto: Out of Memory!.\n"}, {"no provider: 1 Error - loadQelCrypto: ldapGetSymAddress(pQEL_GetStatus) failed.\n"}},
-    {"initQelCrypto", [](Odd& a) -> std::string { return shown(run(initQelCrypto, Arguments{a.pointer(&ctx)})); }, "1!",
+    {"setDefLibpath", [](Odd&) { setenv("LD_LIBRARY_PATH", "/opt/x", 1); return shown(setDefLibpath()); }, "", {}, {},
+     "environment"},
+    {"fixupCipherSpecs", [](Odd& a) -> std::string { return (run(fixupCipherSpecs, Arguments{a.pointer(room)}),
+     "-"); }, "-"},
+    {"loadQelCrypto", [](Odd& a) -> std::string { return with(run(loadQelCrypto, Arguments{a.slot(&made)}), made); },
+     "1! 0+",
+     {"0 debug:  Memory allocation failed ! \n", "90 Error - loadQelCrypto: Out of Memory!.\n"},
+      {"no provider: 1 Error - loadQelCrypto: ldapGetSymAddress(pQEL_GetStatus) failed.\n"}},
+    {"initQelCrypto", CALL(initQelCrypto, a.pointer(&ctx)), "1!",
      {}, {"no provider: 1 Error - initQelCrypto: loadQelCrypto() failed. \n"}},
-    {"freeQelCrypto", [](Odd& a) -> std::string { return shown(run(freeQelCrypto, Arguments{a.pointer<void>(nullptr)})); }, "0"},
-    {"initQelCipher", [](Odd& a) -> std::string { return withCipher(run(initQelCipher, Arguments{a.pointer(ctx), a.slot(&context), a.pointer("AES-128-ECB"), a.slot(&algorithm)})); }, "1! | 1! 0+ | 1! | 1! 0+",
-     {}, {"get_cipherbyname=0: 1 QEL_EVP_get_cipherbyname() failed.", "CIPHER_CTX_new=0: 1 QEL_EVP_CIPHER_CTX_new() failed."}},
-    {"initQelDigest", [](Odd& a) -> std::string { return withDigest(run(initQelDigest, Arguments{a.pointer(ctx), a.slot(&context), a.pointer("SHA1"), a.slot(&algorithm)})); }, "1! | 1! 0+ | 1! | 1! 0+",
+    {"freeQelCrypto", CALL(freeQelCrypto, a.pointer<void>(nullptr)), "0"},
+    {"initQelCipher", [](Odd& a) -> std::string { return withCipher(run(initQelCipher, Arguments{a.pointer(ctx),
+     a.slot(&context), a.pointer("AES-128-ECB"), a.slot(&algorithm)})); }, "1! | 1! 0+ | 1! | 1! 0+",
+     {}, {"get_cipherbyname=0: 1 QEL_EVP_get_cipherbyname() failed.",
+      "CIPHER_CTX_new=0: 1 QEL_EVP_CIPHER_CTX_new() failed."}},
+    {"initQelDigest", [](Odd& a) -> std::string { return withDigest(run(initQelDigest, Arguments{a.pointer(ctx),
+     a.slot(&context), a.pointer("SHA1"), a.slot(&algorithm)})); }, "1! | 1! 0+ | 1! | 1! 0+",
      {}, {"get_digestbyname=0: 1 QEL_EVP_get_digestbyname() failed.", "MD_CTX_new=0: 1 QEL_EVP_MD_CTX_new() failed."}},
-    {"freeQelCipher", [](Odd& a) -> std::string { return shown(run(freeQelCipher, Arguments{a.pointer(ctx), a.pointer(digestCtx)})); }, "1! | 0"},
-    {"freeQelDigest", [](Odd& a) -> std::string { return shown(run(freeQelDigest, Arguments{a.pointer(ctx), a.pointer<void>(nullptr)})); }, "1! | 0"},
-    {"qelStatusToLdap", [](Odd& a) -> std::string { return shown(run(qelStatusToLdap, Arguments{a.pointer<void>(nullptr), a.pointer<QelStatus>(nullptr)})); }, "1! | 1!"},
-    {"initAesKeyData", [](Odd& a) -> std::string { return withRecord(run(initAesKeyData, Arguments{a.slot(&record)})); }, "1! 0+",
-     {"90 calloc(keyData) returned NULL.", "90 calloc(cryptoSalt) returned NULL.", "90 calloc(aesKeys) returned NULL."}},
-    {"copyAesKeyData", [](Odd& a) -> std::string { return withRecord(run(copyAesKeyData, Arguments{a.pointer(keys), a.slot(&record)})); }, "1! | 1! 0+",
-     {"90 calloc(keyDataCopy) returned NULL.", "90 calloc(cryptoSalt) returned NULL.", "90 calloc(aesKeys) returned NULL."}},
-    {"freeAesKeyData", [](Odd& a) -> std::string { return shown(run(freeAesKeyData, Arguments{a.pointer<AesKeyData>(nullptr)})); }, "0"},
-    {"setAESKeyData", [](Odd& a) -> std::string { return withRecord(run(setAESKeyData, Arguments{a.pointer("/dev/zero"), a.slot(&record)})); }, "1! | 1! 0+",
-     {"90 Error - initAesKeyData: calloc(keyData) returned NULL. rc = 90\n", "90 Error - initAesKeyData: calloc(cryptoSalt) returned NULL. rc = 90\n",
-      "90 Error - initAesKeyData: calloc(aesKeys) returned NULL. rc = 90\n", "90 Error - genKeySyncVal: calloc(cryptoSync) returned NULL. rc = 90\n"}},
-    {"setCfgKeyDataGlobal", [](Odd& a) -> std::string { return shown(run(setCfgKeyDataGlobal, Arguments{a.pointer(nowhere)})); }, "1!",
+    {"freeQelCipher", CALL(freeQelCipher, a.pointer(ctx), a.pointer(digestCtx)), "1! | 0"},
+    {"freeQelDigest", CALL(freeQelDigest, a.pointer(ctx), a.pointer<void>(nullptr)), "1! | 0"},
+    {"qelStatusToLdap", CALL(qelStatusToLdap, a.pointer<void>(nullptr), a.pointer<QelStatus>(nullptr)), "1! | 1!"},
+    {"initAesKeyData", [](Odd& a) -> std::string { return withRecord(run(initAesKeyData,
+     Arguments{a.slot(&record)})); }, "1! 0+",
+     {"90 calloc(keyData) returned NULL.", "90 calloc(cryptoSalt) returned NULL.",
+      "90 calloc(aesKeys) returned NULL."}},
+    {"copyAesKeyData", [](Odd& a) -> std::string { return withRecord(run(copyAesKeyData, Arguments{a.pointer(keys),
+     a.slot(&record)})); }, "1! | 1! 0+",
+     {"90 calloc(keyDataCopy) returned NULL.", "90 calloc(cryptoSalt) returned NULL.",
+      "90 calloc(aesKeys) returned NULL."}},
+    {"freeAesKeyData", CALL(freeAesKeyData, a.pointer<AesKeyData>(nullptr)), "0"},
+    {"setAESKeyData", [](Odd& a) -> std::string { return withRecord(run(setAESKeyData,
+     Arguments{a.pointer("/dev/zero"), a.slot(&record)})); }, "1! | 1! 0+",
+     {"90 Error - initAesKeyData: calloc(keyData) returned NULL. rc = 90\n",
+      "90 Error - initAesKeyData: calloc(cryptoSalt) returned NULL. rc = 90\n",
+      "90 Error - initAesKeyData: calloc(aesKeys) returned NULL. rc = 90\n",
+      "90 Error - genKeySyncVal: calloc(cryptoSync) returned NULL. rc = 90\n"}},
+    {"setCfgKeyDataGlobal", CALL(setCfgKeyDataGlobal, a.pointer(nowhere)), "1!",
      noRecord()},
-    {"setDirKeyDataGlobal", [](Odd& a) -> std::string { return shown(run(setDirKeyDataGlobal, Arguments{a.pointer(nowhere)})); }, "1!",
+    {"setDirKeyDataGlobal", CALL(setDirKeyDataGlobal, a.pointer(nowhere)), "1!",
      noRecord()},
     {"getCfgKeyDataGlobal", [](Odd&) -> std::string { return getCfgKeyDataGlobal() == nullptr ? "null" : "some"; }, ""},
     {"getDirKeyDataGlobal", [](Odd&) -> std::string { return getDirKeyDataGlobal() == nullptr ? "null" : "some"; }, ""},
-    {"setCfgCryptoSyncGlobal", [](Odd& a) -> std::string { return shown(run(setCfgCryptoSyncGlobal, Arguments{a.pointer<char>(nullptr)})); }, "1"},
-    {"checkKeyStashFile", [](Odd& a) -> std::string { return shown(run(checkKeyStashFile, Arguments{a.number(1), a.pointer(keys), a.pointer(text), a.pointer(text), a.pointer(&number)})); }, "1 1 0 1 | 1! | 1! | 1! | 1!"},
-    {"readKeyStashFile", [](Odd& a) -> std::string { return shown(run(readKeyStashFile, Arguments{a.pointer("/dev/zero"), a.pointer(keys)})); }, "1! | 1!",
+    {"setCfgCryptoSyncGlobal", CALL(setCfgCryptoSyncGlobal, a.pointer<char>(nullptr)), "1"},
+    {"checkKeyStashFile", CALL(checkKeyStashFile, a.number(1), a.pointer(keys), a.pointer(text), a.pointer(text),
+     a.pointer(&number)), "1 1 0 1 | 1! | 1! | 1! | 1!"},
+    {"readKeyStashFile", CALL(readKeyStashFile, a.pointer("/dev/zero"), a.pointer(keys)), "1! | 1!",
      {"90 Error - genKeySyncVal: calloc(cryptoSync) returned NULL. rc = 90\n"}},
-    {"createKeyStashFiles", [](Odd& a) -> std::string { return with(run(createKeyStashFiles, Arguments{a.pointer(cfg), a.pointer(cfg), a.pointer(seed), a.slot(&made), a.pointer(keySalt)}), made); }, "1! | 1! | 1! | 1! 0+ | 0+",
+    {"createKeyStashFiles", [](Odd& a) -> std::string { return with(run(createKeyStashFiles, Arguments{a.pointer(cfg),
+     a.pointer(cfg), a.pointer(seed), a.slot(&made), a.pointer(keySalt)}), made); }, "1! | 1! | 1! | 1! 0+ | 0+",
      {
-      "90 genKeyDataVal(cfg) failed.", "1 genKeyDataVal(cfg) failed.", "90 genKeyDataVal(cfg) failed.", "90 calloc(cryptoSyncStr) returned NULL.",
-      "90 genKeyDataVal(dir) failed.", "1 genKeyDataVal(dir) failed.", "90 genKeyDataVal(dir) failed."}, digestSteps("genKeyDataVal(cfg)")},
-    {"restoreKeyStashFile", [](Odd& a) -> std::string { return shown(run(restoreKeyStashFile, Arguments{a.pointer(cfg), a.pointer(seed), a.pointer(keySalt)})); }, "1! | 1! | 1!",
+      "90 genKeyDataVal(cfg) failed.", "1 genKeyDataVal(cfg) failed.", "90 genKeyDataVal(cfg) failed.",
+      "90 calloc(cryptoSyncStr) returned NULL.",
+      "90 genKeyDataVal(dir) failed.", "1 genKeyDataVal(dir) failed.", "90 genKeyDataVal(dir) failed."},
+      digestSteps("genKeyDataVal(cfg)")},
+    {"restoreKeyStashFile", CALL(restoreKeyStashFile, a.pointer(cfg), a.pointer(seed), a.pointer(keySalt)),
+     "1! | 1! | 1!",
      noKeys("genKeyDataVal(dir)"), digestSteps("genKeyDataVal(dir)")},
-    {"validateCryptoString", [](Odd& a) -> std::string { return shown(run(validateCryptoString, Arguments{a.pointer(seed), a.number(0)})); }, "1! | 1 1 0 1"},
-    {"morva_rand_ascii", [](Odd& a) -> std::string { return shown(run(morva_rand_ascii, Arguments{ctx, a.pointer(bytes), static_cast<unsigned>(a.bytes(16) & 63)})); }, "0 | 0 0 0"},
-    {"genKeySaltVal", [](Odd& a) -> std::string { return shown(run(genKeySaltVal, Arguments{a.pointer(ctx), a.pointer(keys)})); }, "1! | 1!"},
-    {"morva_pbkdf2", [](Odd& a) -> std::string { return shown(run(morva_pbkdf2, Arguments{a.pointer(ctx), a.pointer(digestCtx), a.pointer(sha1), a.pointer(bytes), 4, a.pointer(bytes), 4, static_cast<uint32_t>(a.number(1) & 7), a.pointer(bytes), 20})); }, "1! | 1! | 1! | 1! | 1! | 0 0 0 0 | 1!",
+    {"validateCryptoString", CALL(validateCryptoString, a.pointer(seed), a.number(0)), "1! | 1 1 0 1"},
+    {"morva_rand_ascii", CALL(morva_rand_ascii, ctx, a.pointer(bytes), static_cast<unsigned>(a.bytes(16) & 63)),
+     "0 | 0 0 0"},
+    {"genKeySaltVal", CALL(genKeySaltVal, a.pointer(ctx), a.pointer(keys)), "1! | 1!"},
+    {"morva_pbkdf2", CALL(morva_pbkdf2, a.pointer(ctx), a.pointer(digestCtx), a.pointer(sha1), a.pointer(bytes), 4,
+     a.pointer(bytes), 4, static_cast<uint32_t>(a.number(1) & 7), a.pointer(bytes), 20),
+     "1! | 1! | 1! | 1! | 1! | 0 0 0 0 | 1!",
      {"90 morva_pkcs5_F() failed."}},
-    {"growKeysFromSeed", [](Odd& a) -> std::string { return shown(run(growKeysFromSeed, Arguments{a.pointer(ctx), a.pointer(digestCtx), a.pointer(sha1), a.pointer(seed), a.pointer(keys)})); }, "1! | 1! | 1! | 1! | 1!",
+    {"growKeysFromSeed", CALL(growKeysFromSeed, a.pointer(ctx), a.pointer(digestCtx), a.pointer(sha1), a.pointer(seed),
+     a.pointer(keys)), "1! | 1! | 1! | 1! | 1!",
      {"90 morva_pbkdf2() failed."}, {"DigestInit DigestUpdate DigestFinal: 1 morva_pbkdf2() failed."}},
-    {"genKeySyncVal", [](Odd& a) -> std::string { return shown(run(genKeySyncVal, Arguments{a.pointer(ctx), a.pointer(digestCtx), a.pointer(sha1), a.pointer(seed), a.pointer(keys)})); }, "1! | 1! | 1! | 1! | 1!",
-     {"90 calloc(cryptoSync) returned NULL.", "90 morva_pbkdf2() failed.", "1 binaryBlobToBase64() returned NULL."}, {"DigestInit DigestUpdate DigestFinal: 1 morva_pbkdf2() failed.", "no alphabet: 1 binaryBlobToBase64() returned NULL."}},
-    {"genKeyDataVal", [](Odd& a) -> std::string { return withRecord(run(genKeyDataVal, Arguments{a.pointer(ctx), a.pointer(digestCtx), a.pointer(sha1), a.pointer(seed), a.pointer(keySalt), a.slot(&record)})); }, "1! | 1! | 1! | 0+ | 0+ | 1! 0+",
-     {"90 initAesKeyData() failed.", "90 strdup() returned NULL.", "90 genKeySyncVal() failed.", "1 genKeySyncVal() failed.", "90 growKeysFromSeed() failed."}, {"DigestInit DigestUpdate DigestFinal no alphabet: 1 genKeySyncVal() failed."}},
-    {"genTmpKeyDataVal", [](Odd& a) -> std::string { return withRecord(run(genTmpKeyDataVal, Arguments{a.pointer(seed), a.pointer(keySalt), a.slot(&record)})); }, "1! | 1! | 1! 0+",
+    {"genKeySyncVal", CALL(genKeySyncVal, a.pointer(ctx), a.pointer(digestCtx), a.pointer(sha1), a.pointer(seed),
+     a.pointer(keys)), "1! | 1! | 1! | 1! | 1!",
+     {"90 calloc(cryptoSync) returned NULL.", "90 morva_pbkdf2() failed.", "1 binaryBlobToBase64() returned NULL."},
+      {"DigestInit DigestUpdate DigestFinal: 1 morva_pbkdf2() failed.",
+       "no alphabet: 1 binaryBlobToBase64() returned NULL."}},
+    {"genKeyDataVal", [](Odd& a) -> std::string { return withRecord(run(genKeyDataVal, Arguments{a.pointer(ctx),
+     a.pointer(digestCtx), a.pointer(sha1), a.pointer(seed), a.pointer(keySalt), a.slot(&record)})); },
+     "1! | 1! | 1! | 0+ | 0+ | 1! 0+",
+     {"90 initAesKeyData() failed.", "90 strdup() returned NULL.", "90 genKeySyncVal() failed.",
+      "1 genKeySyncVal() failed.", "90 growKeysFromSeed() failed."},
+      {"DigestInit DigestUpdate DigestFinal no alphabet: 1 genKeySyncVal() failed."}},
+    {"genTmpKeyDataVal", [](Odd& a) -> std::string { return withRecord(run(genTmpKeyDataVal, Arguments{a.pointer(seed),
+     a.pointer(keySalt), a.slot(&record)})); }, "1! | 1! | 1! 0+",
      noKeys("genKeyDataVal()"), digestSteps("genKeyDataVal()")},
-    {"aesEncryptBuffer", [](Odd& a) -> std::string { return with(run(aesEncryptBuffer, Arguments{a.pointer(text), a.slot(&made), a.pointer("AES-256-ECB"), a.pointer(&key), a.pointer(&key), a.number(6)}), made); }, "1! | 1! 0+ | 1! | 1! | 1! | 1! 1! 0+ 90",
-     {"1 debug: binaryBlobToBase64() returned NULL."}, cipherSteps("Encrypt") + Lines{"no alphabet: 1 debug: binaryBlobToBase64() returned NULL."}},
-    {"aesEncryptBuffer, long", [](Odd&) { return with(aesEncryptBuffer(longText.c_str(), &made, "AES-256-ECB", &key, &key, 300), made); }, "",
-     {"90 debug: calloc() returned NULL.", "1 debug: binaryBlobToBase64() returned NULL."}, cipherSteps("Encrypt") + Lines{"no alphabet: 1 debug: binaryBlobToBase64() returned NULL."}},
-    {"aesDecryptBuffer, long", [](Odd&) { return with(aesDecryptBuffer(longCipherValue.c_str(), &made, "AES-256-ECB", &key, &key, &number), made); }, "",
-     {"1 debug: base64ToBinaryBlob() returned NULL.", "90 debug: QEL_EVP_DecryptInit() failed."}, cipherSteps("Decrypt") + Lines{"no alphabet: 1 debug: base64ToBinaryBlob() returned NULL."}},
-    {"freeQelCipher, live", [](Odd&) { return initQelCipher(ctx, &context, "AES-128-ECB", &algorithm) != 0 ? "none" : shown(freeQelCipher(ctx, context)); }, "", {}, contextSteps("Cipher", "CIPHER", "cipherbyname")},
-    {"freeQelDigest, live", [](Odd&) { return initQelDigest(ctx, &context, "SHA1", &algorithm) != 0 ? "none" : shown(freeQelDigest(ctx, context)); }, "", {}, contextSteps("Digest", "MD", "digestbyname")},
-    {"aesDecryptBuffer", [](Odd& a) -> std::string { return with(run(aesDecryptBuffer, Arguments{a.pointer(cipherText()), a.slot(&made), a.pointer("AES-256-ECB"), a.pointer(&key), a.pointer(&key), a.pointer(&number)}), made); }, "1! | 1! 0+ | 1! | 1! | 1! | 0+",
-     {"90 debug: QEL_EVP_DecryptInit() failed."}, cipherSteps("Decrypt") + Lines{"no alphabet: 1 debug: base64ToBinaryBlob() returned NULL."}},
+    {"aesEncryptBuffer", [](Odd& a) -> std::string { return with(run(aesEncryptBuffer, Arguments{a.pointer(text),
+     a.slot(&made), a.pointer("AES-256-ECB"), a.pointer(&key), a.pointer(&key), a.number(6)}), made); },
+     "1! | 1! 0+ | 1! | 1! | 1! | 1! 1! 0+ 90",
+     {"1 debug: binaryBlobToBase64() returned NULL."},
+      cipherSteps("Encrypt") + Lines{"no alphabet: 1 debug: binaryBlobToBase64() returned NULL."}},
+    {"aesEncryptBuffer, long", [](Odd&) { return with(aesEncryptBuffer(longText.c_str(), &made, "AES-256-ECB", &key,
+     &key, 300), made); }, "",
+     {"90 debug: calloc() returned NULL.", "1 debug: binaryBlobToBase64() returned NULL."},
+      cipherSteps("Encrypt") + Lines{"no alphabet: 1 debug: binaryBlobToBase64() returned NULL."}},
+    {"aesDecryptBuffer, long", [](Odd&) { return with(aesDecryptBuffer(longCipherValue.c_str(), &made, "AES-256-ECB",
+     &key, &key, &number), made); }, "",
+     {"1 debug: base64ToBinaryBlob() returned NULL.", "90 debug: QEL_EVP_DecryptInit() failed."},
+      cipherSteps("Decrypt") + Lines{"no alphabet: 1 debug: base64ToBinaryBlob() returned NULL."}},
+    {"freeQelCipher, live", [](Odd&) { return initQelCipher(ctx, &context, "AES-128-ECB",
+     &algorithm) != 0 ? "none" : shown(freeQelCipher(ctx, context)); }, "", {}, contextSteps("Cipher", "CIPHER",
+     "cipherbyname")},
+    {"freeQelDigest, live", [](Odd&) { return initQelDigest(ctx, &context, "SHA1",
+     &algorithm) != 0 ? "none" : shown(freeQelDigest(ctx, context)); }, "", {}, contextSteps("Digest", "MD",
+     "digestbyname")},
+    {"aesDecryptBuffer", [](Odd& a) -> std::string { return with(run(aesDecryptBuffer,
+     Arguments{a.pointer(cipherText()), a.slot(&made), a.pointer("AES-256-ECB"), a.pointer(&key), a.pointer(&key),
+     a.pointer(&number)}), made); }, "1! | 1! 0+ | 1! | 1! | 1! | 0+",
+     {"90 debug: QEL_EVP_DecryptInit() failed."},
+      cipherSteps("Decrypt") + Lines{"no alphabet: 1 debug: base64ToBinaryBlob() returned NULL."}},
 };
 // clang-format on
 
@@ -588,14 +690,17 @@ constexpr char kScopes[] = R"(
 50030100 43 10000 genKeySaltVal: Entering. qelCtx = #, keyData = #
 50040100 43 10000 morva_pbkdf2: Entering. qelCtx = #, digestCtx = #, digest = #, seed = #, salt = #, derivedKey = #
 50040200 43 10000 morva_pkcs5_F: Entering. qelCtx = #, digestCtx = #, digest = #, seed = #, salt = #, outBuff = #
-50040300 43 10000 morva_pkcs5_initial_prf: Entering. qelCtx = #, digestCtx = #, digest = #, buffer = #, outBuff = #, outLen = #
-50040400 43 10000 genKeyDataVal: Entering. qelCtx = #, digestCtx = #, digest = #, userCryptoSeed = #, userCryptoSalt = #, keyData = #
+50040300 43 10000 morva_pkcs5_initial_prf: Entering. qelCtx = #, digestCtx = #, digest = #, buffer = #, outBuff = #,)"
+                           R"( outLen = #
+50040400 43 10000 genKeyDataVal: Entering. qelCtx = #, digestCtx = #, digest = #, userCryptoSeed = #,)"
+                           R"( userCryptoSalt = #, keyData = #
 50040500 43 10000 genTmpKeyDataVal: Entering. userCryptoSeed = #, userCryptoSalt = #, keyData = #
 50040600 43 10000 growKeysFromSeed: Entering. qelCtx = #, digestCtx = #, digest = #, cryptoSeed = #, keyData = #
 50050100 43 10000 genKeySyncVal: Entering. qelCtx = #, digestCtx = #, digest = #, cryptoSeed = #, keyData = #
 50060100 43 10000 writeKeyStashFile: Entering. keyStashFile = #, keyData = #
 50060200 43 10000 readKeyStashFile: Entering. keyStashFile = #, keyData = #
-50060300 43 10000 createKeyStashFiles: Entering. cfgKeyStashFile = #, dirKeyStashFile = #, dirCryptoSeed = #, cryptoSyncStr = #, dirCryptoSalt = #
+50060300 43 10000 createKeyStashFiles: Entering. cfgKeyStashFile = #, dirKeyStashFile = #, dirCryptoSeed = #,)"
+                           R"( cryptoSyncStr = #, dirCryptoSalt = #
 50060400 43 10000 createKeyStashFiles: Entering. keyStashFile = #, cryptoSeed = #, cryptoSalt = #
 50060500 43 10000 validateCryptoSeed: Entering. cryptoString = #
 50070100 43 10000 aesEncryptBuffer: Entering. clear = #, out = #, cipherName = #, key = #, iv = #

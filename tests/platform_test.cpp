@@ -37,7 +37,7 @@ namespace {
 using test::Replaced;
 
 // What the call prints for the debug log at that debug level.
-template <class Call>
+template <typename Call>
 std::string debugOutput(int level, Call call) {
   testing::internal::CaptureStderr();
   set_ldap_debug(level);

@@ -145,7 +145,7 @@ class Guarded {
 };
 
 // Puts another value in place while it lives, such as a failing provider entry.
-template <class T>
+template <typename T>
 class Replaced {
  public:
   Replaced(T& slot, T value) : slot_(slot), before_(std::exchange(slot, value)) {}
@@ -157,7 +157,7 @@ class Replaced {
   T& slot_;
   T before_;
 };
-template <class T, class V>
+template <typename T, typename V>
 Replaced(T&, V) -> Replaced<T>;
 
 // Whether a relative name can be opened from a folder deeper than any path. The loader of a C library newer than 2.36

@@ -2,11 +2,11 @@
 // Documented in key_file.h.
 #include "key_file.h"
 
-#include <errno.h>
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstdio>
 #include <cstring>
 

@@ -9,7 +9,7 @@ namespace {
 
 constexpr char kFile[] = "libldappw.so.1";
 
-template <class Function>
+template <typename Function>
 bool resolve(void* handle, const char* name, Function& function) noexcept {
   function = reinterpret_cast<Function>(dlsym(handle, name));
   return function != nullptr;

@@ -112,7 +112,7 @@ int closeAll(Slapi_PBlock* /*block*/) noexcept {
   return kMatch;
 }
 
-template <class Function>
+template <typename Function>
 void* asAddress(Function* function) noexcept {
   return reinterpret_cast<void*>(function);
 }

@@ -25,8 +25,8 @@ void occupyStandardDescriptors() {
 }
 
 // Starts the command again with everything bound. A shared C++ runtime looks its calls up as they come, and the loader
-// then saves the vector registers, with pieces of the secrets that were copied last, on the stack: `secrets` finds them.
-// Where the command cannot be started again it goes on as it is.
+// then saves the vector registers, with pieces of the secrets that were copied last, on the stack: `secrets` finds
+// them. Where the command cannot be started again it goes on as it is.
 [[maybe_unused]] void bindSharedRuntime(char** argv) {
   char path[PATH_MAX];
   if (getenv("LD_BIND_NOW") != nullptr) return;

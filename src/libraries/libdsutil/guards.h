@@ -16,8 +16,8 @@ struct Free {
 
 using Text = std::unique_ptr<char, Free>;
 
-// A cancellation would unwind the caller in the middle of a line, with the stream locked. What the writing does to errno
-// is undone too.
+// A cancellation would unwind the caller in the middle of a line, with the stream locked. What the writing does to
+// errno is undone too.
 class NoCancellation {
  public:
   NoCancellation() noexcept { pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &before_); }

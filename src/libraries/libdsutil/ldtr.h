@@ -47,9 +47,10 @@ struct ldtr_record {
 /* The event mask. 0 at start, or the number in LDTR_EVENTS (C notation). May be written at any time. */
 extern LDTR_API unsigned int trcEvents;
 
-/* Sends records to sink (called with user, possibly from many threads at once) instead of to standard error, one line
- * a record. Null brings the default back. A call under way on another thread may still reach the former sink. A sink may
- * trace and call what traces; it must return: an exception that leaves it, or an end of its thread, ends the process. */
+/* Sends records to sink (called with user, possibly from many threads at once) instead of to standard error, one line a
+ * record. Null brings the default back. A call under way on another thread may still reach the former sink. A sink may
+ * trace and call what traces; it must return: an exception that leaves it, or an end of its thread, ends the process.
+ * */
 LDTR_API void ldtr_set_sink(void (*sink)(const struct ldtr_record*, void* user), void* user);
 
 /* Hands one record to the sink, whatever trcEvents says. */

@@ -39,7 +39,7 @@ struct Lock {
 int setValue(const Call& call, Context& context, int id, const char* value) noexcept {
   if (id < QEL_VALUE_STRICT || id > QEL_VALUE_LOAD_PATH) return call.fail(QEL_REASON_BAD_VALUE_ID, "no such value");
   if (value == nullptr) return call.fail(QEL_REASON_NULL_ARGUMENT, "the value is null");
-  const std::size_t bytes = strnlen(value, sizeof context.values[id]) + 1;
+  const size_t bytes = strnlen(value, sizeof context.values[id]) + 1;
   if (bytes > sizeof context.values[id]) return call.fail(QEL_REASON_PATH_TOO_LONG, "the value is too long");
   const bool isOn = std::strcmp(value, "on") == 0;
   if (id == QEL_VALUE_STRICT && !isOn && std::strcmp(value, "off") != 0) {
@@ -60,10 +60,10 @@ int checkBytes(const Call& call, const void* bytes, int count) noexcept {
 // Straight from the kernel: there is nothing that a fork, the end of OpenSSL, a lack of memory or a cancellation could
 // break.
 int drawRandom(const Call& call, unsigned char* buffer, int count) noexcept {
-  constexpr std::size_t kMostBytes = 256;  // in one call
+  constexpr size_t kMostBytes = 256;  // in one call
   if (checkBytes(call, buffer, count) == 0) return 0;
-  const auto bytes = static_cast<std::size_t>(count);
-  for (std::size_t at = 0; at < bytes; at += kMostBytes) {
+  const auto bytes = static_cast<size_t>(count);
+  for (size_t at = 0; at < bytes; at += kMostBytes) {
     if (getentropy(buffer + at, std::min(bytes - at, kMostBytes)) == 0) continue;
     return call.fail(QEL_REASON_RANDOM_FAILURE, "the random generator failed");
   }
@@ -99,7 +99,7 @@ int QEL_GetValue(QEL_CTX* ctx, QelStatus* status, int id, char* buffer, int size
   const Lock lock;
   const int bytes = static_cast<int>(std::strlen(context->values[id])) + 1;
   if (size < bytes) return call.fail(QEL_REASON_BUFFER_TOO_SMALL, "the value is longer");
-  std::memcpy(buffer, context->values[id], static_cast<std::size_t>(bytes));
+  std::memcpy(buffer, context->values[id], static_cast<size_t>(bytes));
   return call.succeed();
 }
 
@@ -112,7 +112,7 @@ QEL_CTX* QEL_Init(QelStatus* status, const char* path) noexcept {
   if (context == end) return call.fail(QEL_REASON_OUT_OF_MEMORY, "there are too many provider contexts");
   if (setValue(call, *context, QEL_VALUE_LOAD_PATH, path == nullptr ? "" : path) == 0) return nullptr;
   setValue(call, *context, QEL_VALUE_STRICT, "on");
-  const auto place = static_cast<std::size_t>(context - contexts) << kIndexBits;
+  const auto place = static_cast<size_t>(context - contexts) << kIndexBits;
   if (context->next == 0) context->next = firstHandle(kContextKind, place);
   return static_cast<QEL_CTX*>(context->publish());
 }

@@ -28,7 +28,7 @@ const T* byName(const QEL_CTX* ctx, const char* name) noexcept {
 }
 
 template <typename T>
-int sizeOf(const QEL_CTX* ctx, const T* handle, std::size_t Algorithm::*size) noexcept {
+int sizeOf(const QEL_CTX* ctx, const T* handle, size_t Algorithm::*size) noexcept {
   const Call call{ctx};
   const Algorithm* found = call.context() == nullptr ? nullptr : call.algorithm(kTypeOf<T>, handle);
   return found == nullptr ? 0 : static_cast<int>(found->*size);
@@ -68,8 +68,8 @@ Work* prepare(const Call& call, Type type, const void* handle, const void* algor
   return call.fail(QEL_REASON_OUT_OF_MEMORY, "no memory for the state of an algorithm");
 }
 
-// For a step: the context that an init has started, in this direction. When the checks are not strict, it may go on after
-// the end of a cipher that has nothing left.
+// For a step: the context that an init has started, in this direction. When the checks are not strict, it may go on
+// after the end of a cipher that has nothing left.
 Work* running(const Call& call, Type type, const void* handle, bool encrypts = false) noexcept {
   Work* work = call.work(type, handle);
   if (work == nullptr || (work->phase == Phase::kRunning && work->encrypts == encrypts)) return work;
@@ -107,8 +107,8 @@ int update(const QEL_CTX* ctx, const void* handle, bool encrypts, unsigned char*
   Work* work = running(call, kCipher, handle, encrypts);
   if (work == nullptr) return 0;
   if (out == nullptr || outLength == nullptr) return call.fail(QEL_REASON_NULL_ARGUMENT, "there is no output");
-  const auto inBytes = static_cast<std::size_t>(inLength);
-  const std::size_t room = inBytes + work->algorithm->endSize;
+  const auto inBytes = static_cast<size_t>(inLength);
+  const size_t room = inBytes + work->algorithm->endSize;
   if (inLength < 0 || room > INT_MAX) return call.fail(QEL_REASON_BAD_LENGTH, "the input length cannot be served");
   if (inLength == 0) return 1;
   if (in == nullptr) return call.fail(QEL_REASON_NULL_ARGUMENT, "the input is null");
@@ -117,7 +117,7 @@ int update(const QEL_CTX* ctx, const void* handle, bool encrypts, unsigned char*
   if (overlaps && (ahead != 0 || work->held != 0)) {
     return call.fail(QEL_REASON_OVERLAP, "the output would overwrite input that is still to be read");
   }
-  std::size_t written = 0;
+  size_t written = 0;
   auto* take = work->function<OSSL_FUNC_cipher_update_fn>(OSSL_FUNC_CIPHER_UPDATE);
   if (take(work->state, out, &written, room, in, inBytes) != 1) {
     work->phase = Phase::kFailed;
@@ -130,15 +130,15 @@ int update(const QEL_CTX* ctx, const void* handle, bool encrypts, unsigned char*
 
 // The last block of a padded text is held back until another one comes. Its padding is judged here, since OpenSSL would
 // raise an error for a wrong key.
-bool endPadded(Work& work, unsigned char* out, std::size_t* written) noexcept {
+bool endPadded(Work& work, unsigned char* out, size_t* written) noexcept {
   static constexpr unsigned char kNext[EVP_MAX_BLOCK_LENGTH] = {};
-  const std::size_t size = work.algorithm->blockSize;
+  const size_t size = work.algorithm->blockSize;
   auto* take = work.function<OSSL_FUNC_cipher_update_fn>(OSSL_FUNC_CIPHER_UPDATE);
   if (take(work.state, out, written, size, kNext, size) != 1) return false;
-  const std::size_t padding = out[size - 1];
+  const size_t padding = out[size - 1];
   bool isWrong = padding == 0 || padding > size;
   *written = isWrong ? 0 : size - padding;
-  for (std::size_t i = *written; i < size; ++i) isWrong |= std::exchange(out[i], '\0') != padding;
+  for (size_t i = *written; i < size; ++i) isWrong |= std::exchange(out[i], '\0') != padding;
   if (isWrong) std::memset(out, 0, size);
   return !isWrong;
 }
@@ -154,7 +154,7 @@ int finish(const QEL_CTX* ctx, const T* handle, bool encrypts, unsigned char* ou
   const bool hasOutput = out != nullptr && (outLength != nullptr || !kIsCipher);
   if (!hasOutput) return call.fail(QEL_REASON_NULL_ARGUMENT, "there is no output");
   work->phase = Phase::kEnded;
-  std::size_t written = 0;
+  size_t written = 0;
   if (kIsCipher && !work->isWhole()) return call.fail(QEL_REASON_CIPHER_FAILURE, "the last block is not whole");
   if (kIsCipher && work->isPadded() && !encrypts) {
     if (!endPadded(*work, out, &written)) return call.fail(QEL_REASON_CIPHER_FAILURE, "the padding is wrong");

@@ -18,12 +18,12 @@ namespace {
 // notices a number that went and came back while it looked below.
 class FreeNumbers {
  public:
-  void push(std::size_t number) noexcept {
+  void push(size_t number) noexcept {
     std::uint64_t top = top_.load(std::memory_order_relaxed);
     do below_[number].store(static_cast<std::uint32_t>(top), std::memory_order_relaxed);
     while (!replace(top, static_cast<std::uint32_t>(number + 1)));
   }
-  bool pop(std::size_t& number) noexcept {
+  bool pop(size_t& number) noexcept {
     std::uint64_t top = top_.load(std::memory_order_acquire);
     do {
       if (static_cast<std::uint32_t>(top) == 0) return false;
@@ -43,7 +43,7 @@ class FreeNumbers {
 };
 
 FreeNumbers freeRooms, freePlaces[2];  // rooms that threads have left; places that any thread may take, by type
-std::atomic<std::size_t> roomCount{0};
+std::atomic<size_t> roomCount{0};
 
 }  // namespace
 
@@ -110,7 +110,7 @@ bool Work::overwrite() noexcept {
   auto* start = function<OSSL_FUNC_cipher_decrypt_init_fn>(OSSL_FUNC_CIPHER_DECRYPT_INIT);
   auto* update = function<OSSL_FUNC_cipher_update_fn>(OSSL_FUNC_CIPHER_UPDATE);
   unsigned char none[EVP_MAX_BLOCK_LENGTH];
-  std::size_t written = 0;
+  size_t written = 0;
   return start(state, kZeros, algorithm->keyLength, kZeros, algorithm->ivLength, nullptr) == 1 &&
          update(state, none, &written, sizeof none, kZeros, algorithm->blockSize) == 1;
 }
@@ -138,10 +138,10 @@ Room* addRoom() noexcept {
   const ErrorMark mark;
   void* memory = roomCount.load() < std::size(rooms) ? OPENSSL_zalloc(sizeof(Room)) : nullptr;
   if (memory == nullptr) return nullptr;
-  const std::size_t number = roomCount.fetch_add(1);
+  const size_t number = roomCount.fetch_add(1);
   if (number >= std::size(rooms)) return OPENSSL_free(memory), nullptr;
   Room* room = new (memory) Room;
-  for (std::size_t i = 0; i < std::size(room->works); ++i) {
+  for (size_t i = 0; i < std::size(room->works); ++i) {
     room->works[i].next = firstHandle(kWorkKind + i / Room::kWorks, number * Room::kWorks + i % Room::kWorks);
   }
   rooms[number].store(room, std::memory_order_release);
@@ -180,7 +180,7 @@ Work* Room::takeShared(Type type) noexcept {
   freeWorksIn(*this, false);
   if (Work* work = idle(type)) return work;
   if (++outside > roomCount.load(std::memory_order_relaxed)) freeWorks(false);
-  std::size_t place = 0;
+  size_t place = 0;
   while (!freePlaces[type].pop(place)) {
     if (!shareRoom()) return nullptr;
   }
@@ -190,7 +190,7 @@ Work* Room::takeShared(Type type) noexcept {
 Room* ownRoom() noexcept {
   auto* room = static_cast<Room*>(pthread_getspecific(roomKey));
   if (room != nullptr) return room;
-  std::size_t number = 0;
+  size_t number = 0;
   room = freeRooms.pop(number) ? rooms[number].load(std::memory_order_acquire) : addRoom();
   if (room == nullptr || pthread_setspecific(roomKey, room) == 0) return room;
   freeRooms.push(room->number());
@@ -200,7 +200,7 @@ Room* ownRoom() noexcept {
 void Room::freeWorks(bool all) noexcept {
   freeWorksIn(*this, all);
   if (outside == 0) return;
-  for (std::size_t number = 0; number < std::min(roomCount.load(), std::size(rooms)); ++number) {
+  for (size_t number = 0; number < std::min(roomCount.load(), std::size(rooms)); ++number) {
     Room* room = rooms[number].load(std::memory_order_acquire);
     if (room != nullptr) freeWorksIn(*room, all);
   }

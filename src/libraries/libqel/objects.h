@@ -31,7 +31,7 @@ constexpr Handle kNextUse = kPlaces << kKindBits;
 constexpr int kFunctions = 16;  // more than an algorithm has
 
 // With 64-bit pointers the top bit puts handles where no address of a process is.
-constexpr Handle firstHandle(Handle kind, std::size_t place) noexcept {
+constexpr Handle firstHandle(Handle kind, size_t place) noexcept {
   return (sizeof(Handle) > 4 ? Handle{1} << (sizeof(Handle) * 8 - 1) : 0) | (place << kKindBits) | kind;
 }
 
@@ -66,19 +66,19 @@ struct Algorithm {
   const char* names;  // separated by colons
   Type type;
   bool isOverwritten;  // the state, by another start
-  std::size_t size, blockSize, keyLength, ivLength;
-  std::size_t endSize;              // the most that an end may write, and an update of a cipher beyond what it is given
+  size_t size, blockSize, keyLength, ivLength;
+  size_t endSize;                   // the most that an end may write, and an update of a cipher beyond what it is given
   void (*functions[kFunctions])();  // by OpenSSL's number
 };
 
 // Read once, before there is a provider context, and there until the process ends.
 inline Algorithm algorithms[2][255];  // by type; twice as many as there are
-inline std::size_t algorithmCounts[2];
+inline size_t algorithmCounts[2];
 inline void* providerContext;  // for the making of states
 
-// Takes what OpenSSL raises while it lives out of the thread's queue again, in which the host may have something. It costs
-// a quarter of an AES value, and so stands where memory is asked for; the steps of a digest or cipher have checked before
-// they call what OpenSSL would refuse.
+// Takes what OpenSSL raises while it lives out of the thread's queue again, in which the host may have something. It
+// costs a quarter of an AES value, and so stands where memory is asked for; the steps of a digest or cipher have
+// checked before they call what OpenSSL would refuse.
 struct ErrorMark {
   ErrorMark() noexcept { ERR_set_mark(); }
   ~ErrorMark() { ERR_pop_to_mark(); }
@@ -108,7 +108,7 @@ struct Work : Entry {
   bool isPadded() const noexcept { return padding && algorithm->blockSize > 1; }
   bool isWhole() const noexcept { return held == algorithm->blockSize || (isPadded() ? encrypts : held == 0); }
   Type type() const noexcept { return static_cast<Type>(next % (Handle{1} << kKindBits) - kWorkKind); }
-  std::size_t place() const noexcept { return (next >> kKindBits) % kPlaces; }
+  size_t place() const noexcept { return (next >> kKindBits) % kPlaces; }
 
   template <typename Signature>
   Signature* function(int id) const noexcept {
@@ -125,24 +125,23 @@ struct Work : Entry {
   bool padding = true;
   bool isShared = false;  // its place is any thread's to take
   int keyLength = 0;      // what the caller stated, or 0
-  std::size_t held = 0;   // bytes that a cipher has taken and not given out
+  size_t held = 0;        // bytes that a cipher has taken and not given out
 };
 
 // What a thread has here: places for contexts, and its last failure. A room passes on to a later thread. Where a thread
 // wants more places, it takes some of rooms that no thread has.
 struct Room {
-  static constexpr std::size_t kWorks = 8;
+  static constexpr size_t kWorks = 8;
 
   Work* idle(Type type) noexcept;  // null when all are live
   [[gnu::cold]] Work* takeShared(Type type) noexcept;
-  std::size_t number() const noexcept { return works[0].place() / kWorks; }
+  size_t number() const noexcept { return works[0].place() / kWorks; }
 
   // Frees the contexts of the calling thread, whose own room this is: those whose provider context is gone, or all.
   void freeWorks(bool all) noexcept;
 
   Work works[2 * kWorks];  // digest contexts, then cipher contexts
-  std::size_t outside =
-      0;  // how often the thread has taken a place, or another one's context, since it last saw to them
+  size_t outside = 0;  // how often the thread has taken a place, or another one's context, since it last saw to them
   Handle failureOwner = 0;
   QelStatus failure = {};
 };
@@ -160,7 +159,7 @@ inline Context* findContext(Handle handle) noexcept {
 }
 
 inline Work* findWork(Type type, Handle handle) noexcept {
-  const std::size_t place = (handle >> kKindBits) % kPlaces;
+  const size_t place = (handle >> kKindBits) % kPlaces;
   Room* room = rooms[place / Room::kWorks].load(std::memory_order_acquire);
   Work* work = room == nullptr ? nullptr : &room->works[type * Room::kWorks + place % Room::kWorks];
   return work != nullptr && work->answersTo(handle) ? work : nullptr;

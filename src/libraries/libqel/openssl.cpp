@@ -21,7 +21,8 @@ struct Usual {
 } usual[] = {{kDigest, "SHA1"},        {kDigest, "md5"},         {kDigest, "SHA256"},
              {kCipher, "AES-256-ECB"}, {kCipher, "AES-192-ECB"}, {kCipher, "AES-128-ECB"}};
 
-// As OpenSSL compares names, whose function for it the first releases do not have, and the host's language changes nothing.
+// As OpenSSL compares names, whose function for it the first releases do not have, and the host's language changes
+// nothing.
 bool isSame(char a, char b) noexcept {
   const auto lower = [](char c) { return c >= 'A' && c <= 'Z' ? c - 'A' + 'a' : c; };
   return lower(a) == lower(b);
@@ -36,8 +37,9 @@ bool isAmong(const char* names, const char* name) noexcept {
   }
 }
 
-// False for one that is not served. A digest is when it has one size. A cipher is when it gives back what it took, through a start, updates of any size
-// and an end: authenticated ones do not, nor those that wrap keys or take their data at once.
+// False for one that is not served. A digest is when it has one size. A cipher is when it gives back what it took,
+// through a start, updates of any size and an end: authenticated ones do not, nor those that wrap keys or take their
+// data at once.
 bool read(const OSSL_ALGORITHM& source, Type type, Algorithm& algorithm) noexcept {
   algorithm = {};
   algorithm.type = type;
@@ -75,7 +77,7 @@ void readAll(OSSL_PROVIDER* provider, Type type, int operation) noexcept {
   for (const OSSL_ALGORITHM* each = all; each != nullptr && each->algorithm_names != nullptr; ++each) {
     if (next != std::end(algorithms[type]) && read(*each, type, *next)) ++next;
   }
-  algorithmCounts[type] = static_cast<std::size_t>(next - algorithms[type]);
+  algorithmCounts[type] = static_cast<size_t>(next - algorithms[type]);
 }
 
 }  // namespace
@@ -100,7 +102,7 @@ const Algorithm* findAlgorithm(Type type, const char* name) noexcept {
   for (const Usual& each : usual) {
     if (each.type == type && each.algorithm != nullptr && std::strcmp(each.spelling, name) == 0) return each.algorithm;
   }
-  for (std::size_t i = 0; i < algorithmCounts[type]; ++i) {
+  for (size_t i = 0; i < algorithmCounts[type]; ++i) {
     if (isAmong(algorithms[type][i].names, name)) return &algorithms[type][i];
   }
   return nullptr;

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // Where the library was loaded from. That is worked out while it is loaded, before the host can change its working
-// folder, against which the loader has just read a relative name; the loader's own note of it cannot be read when memory
-// ran out for it.
+// folder, against which the loader has just read a relative name; the loader's own note of it cannot be read when
+// memory ran out for it.
 #include <dlfcn.h>
 #include <unistd.h>
 
@@ -14,9 +14,8 @@
 
 namespace {
 
-char folder[PATH_MAX];  // that holds qellib/
-std::atomic<std::size_t> folderBytes{
-    0};  // with the NUL; 0 when it is not known. Other threads may load at the same time
+char folder[PATH_MAX];               // that holds qellib/
+std::atomic<size_t> folderBytes{0};  // with the NUL; 0 when it is not known. Other threads may load at the same time
 
 // Cuts the last component off an absolute path, and the slashes and components "." before it.
 void toParent(char* path) noexcept {
@@ -31,7 +30,7 @@ void toParent(char* path) noexcept {
   if (dladdr(reinterpret_cast<void*>(&treskqels_path), &info) == 0) return;
   if (*info.dli_fname != '/' && getcwd(here, sizeof here) == nullptr) return;
   const int length = std::snprintf(folder, sizeof folder, "%s%s%s", here, *here == '\0' ? "" : "/", info.dli_fname);
-  if (length < 0 || static_cast<std::size_t>(length) + sizeof "/.." > sizeof folder) return;
+  if (length < 0 || static_cast<size_t>(length) + sizeof "/.." > sizeof folder) return;
   toParent(folder);
   char* end = folder + std::strlen(folder);
   const bool isNamed = end - folder < 3 || std::strcmp(end - 3, "/..") != 0;
@@ -45,8 +44,8 @@ void toParent(char* path) noexcept {
 extern "C" {
 
 int treskqels_path(char* buffer, int size) noexcept {
-  const std::size_t bytes = folderBytes.load(std::memory_order_acquire);
-  if (buffer == nullptr || bytes == 0 || size < 0 || static_cast<std::size_t>(size) < bytes) return 0;
+  const size_t bytes = folderBytes.load(std::memory_order_acquire);
+  if (buffer == nullptr || bytes == 0 || size < 0 || static_cast<size_t>(size) < bytes) return 0;
   std::memcpy(buffer, folder, bytes);
   return 1;
 }

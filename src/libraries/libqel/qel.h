@@ -110,8 +110,9 @@ int QEL_Cleanup(QEL_CTX* ctx, QelStatus* status) QEL_NOEXCEPT;
 
 /* Find an algorithm by any name that OpenSSL's default provider has for it, in either case ("SHA1", "sha-1",
  * "AES-128-ECB"). Every name of it gives the same handle, which is valid until QEL_Cleanup and never released by
- * itself. Digests are those of one size, so SHAKE and KECCAK-KMAC are not found. Ciphers are those that work in pieces of any size and give everything back with padding on; the others are
- * not found: authenticated ones (GCM, CCM, OCB, SIV, Poly1305, CBC with HMAC), key wraps, XTS, and CBC-CTS. */
+ * itself. Digests are those of one size, so SHAKE and KECCAK-KMAC are not found. Ciphers are those that work in pieces
+ * of any size and give everything back with padding on; the others are not found: authenticated ones (GCM, CCM, OCB,
+ * SIV, Poly1305, CBC with HMAC), key wraps, XTS, and CBC-CTS. */
 const QEL_CIPHER* QEL_EVP_get_cipherbyname(QEL_CTX* ctx, const char* name) QEL_NOEXCEPT;
 const QEL_DIGEST* QEL_EVP_get_digestbyname(QEL_CTX* ctx, const char* name) QEL_NOEXCEPT;
 

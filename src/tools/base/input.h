@@ -53,8 +53,8 @@ class Input {
   const char* seems_ = "text";
 };
 
-// Splits an input into lines. The newline, or the other end that is asked for, is no part of a line, a carriage return stays, and a last line without a
-// newline counts.
+// Splits an input into lines. The newline, or the other end that is asked for, is no part of a line, a carriage return
+// stays, and a last line without a newline counts.
 class LineReader {
  public:
   explicit LineReader(Input input, char end = '\n') : input_(std::move(input)), end_(end) {}

@@ -38,8 +38,8 @@ class OutputFile {
   // The two steps of that, for several files.
   void giveName();
   void syncFolder();
-  // Gives the file that will be replaced a second name, ".bak" behind its own, and a number where that is taken. Returns
-  // it, or nothing where no file will be replaced, or one with the same content.
+  // Gives the file that will be replaced a second name, ".bak" behind its own, and a number where that is taken.
+  // Returns it, or nothing where no file will be replaced, or one with the same content.
   std::string keepOld();
 
  private:

@@ -99,7 +99,8 @@ struct Outcome {
 };
 
 // The new value takes the place of the only copy, so the server's own check has to accept it first, where it knows the
-// scheme. A dry run spares the work that is long on purpose; such values have a salt, for which some random bytes stand.
+// scheme. A dry run spares the work that is long on purpose; such values have a salt, for which some random bytes
+// stand.
 Status makeTarget(const Secret& clear, const Conversion& conversion, Secret& made) {
   const Scheme& target = conversion.target;
   if (target.reversible() && target.cuts(clear.size())) {

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Counters of a pass over an export. Each pass has a struct of them and a table with their names, by which they are added
-// up and shown.
+// Counters of a pass over an export. Each pass has a struct of them and a table with their names, by which they are
+// added up and shown.
 #pragma once
 
 #include <algorithm>

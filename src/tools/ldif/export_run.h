@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Runs a pass over a directory export: several threads work on batches of records, and what they make of them is delivered
-// in the order of the input.
+// Runs a pass over a directory export: several threads work on batches of records, and what they make of them is
+// delivered in the order of the input.
 #pragma once
 
 #include <cstdint>

@@ -21,11 +21,12 @@ const char* argon2Problem(const PayloadRule& rule, std::string_view payload);
 bool parseNumber(std::string_view text, std::uint32_t& number) noexcept;
 
 // Bytes of base64 with or without padding, "." standing for "+" as some programs write it; false when it is none.
-bool decodeAnyBase64(std::string_view text, Secret& bytes);
+bool decodeBase64(std::string_view text, Secret& bytes);
 
 bool decodeHex(std::string_view text, Secret& bytes);
 
-// Base64 without padding and with "." for "+".
+// Base64, and without padding and with "." for "+".
+void appendBase64(const Secret& bytes, Secret& out);
 void appendAdaptedBase64(const Secret& bytes, Secret& out);
 
 // The parts of a PBKDF2 payload, decoded, in any of the spellings: iterations$salt$hash; Dovecot's

@@ -1,13 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
-// A stored value says how much its check costs, and whoever wrote it may be hostile: each is held against a limit before
-// anything is computed.
+// A stored value says how much its check costs, and whoever wrote it may be hostile: each is held against a limit
+// before anything is computed.
 #include "schemes/foreign_values.h"
 
 #include <algorithm>
 #include <memory>
 #include <string>
 
-#include "base/base64.h"
 #include "base/random.h"
 #include "schemes/foreign_payloads.h"
 #include "schemes/hash_libraries.h"
@@ -112,7 +111,7 @@ Status openPlain(const StoredValue& value, const KeyRecord&, Secret& out) {
 }
 
 Status openBase64(const StoredValue& value, const KeyRecord&, Secret& out) {
-  return decodeAnyBase64(value.payload(), out) ? Status{} : kNotComputed;
+  return decodeBase64(value.payload(), out) ? Status{} : kNotComputed;
 }
 
 Status checkOpened(const StoredValue& value, const KeyRecord& key, const Secret& password) {
@@ -123,7 +122,7 @@ Status checkOpened(const StoredValue& value, const KeyRecord& key, const Secret&
 
 Status checkDigest(const StoredValue& value, const KeyRecord&, const Secret& password) {
   Secret stored;
-  if (!decodeAnyBase64(value.payload(), stored)) return kNotComputed;
+  if (!decodeBase64(value.payload(), stored)) return kNotComputed;
   const auto digestBytes = static_cast<size_t>(value.scheme().payload.least);
   Secret salted(password.view());
   salted.append(stored.view().substr(digestBytes));
@@ -195,7 +194,7 @@ Status makeSalted(const Scheme& scheme, const KeyRecord&, const Costs& costs, co
   digest.append(salt.view());
   out.clear();
   out.append(writtenTag(scheme));
-  appendBase64(digest.view(), out);
+  appendBase64(digest, out);
   return {};
 }
 

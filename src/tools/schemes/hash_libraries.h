@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The libraries that compute foreign schemes: OpenSSL's digests and key derivation, crypt(3), and Argon2. Each is opened
-// at the first value that needs it, so that nothing else pays for its start.
+// The libraries that compute foreign schemes: OpenSSL's digests and key derivation, crypt(3), and Argon2. Each is
+// opened at the first value that needs it, so that nothing else pays for its start.
 #pragma once
 
 #include <argon2.h>

@@ -15,8 +15,8 @@ class KeyRecord {
  public:
   explicit KeyRecord(AesKeyData* record = nullptr) noexcept : record_(record) {}
 
-  // Reads a stash file, once, and warns when others can read it; an empty path gives no record. Throws Failure: kIoError
-  // when the file cannot be read, kBadKey when it is not a stash file.
+  // Reads a stash file, once, and warns when others can read it; an empty path gives no record. Throws Failure:
+  // kIoError when the file cannot be read, kBadKey when it is not a stash file.
   static KeyRecord load(const std::string& path);
 
   AesKeyData* get() const noexcept { return record_.get(); }

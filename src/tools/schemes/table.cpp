@@ -36,8 +36,8 @@ constexpr PayloadRule scram(long bytes) {
 }
 
 // What new values cost: least, usual, most of rounds, memory in KiB, lanes, bytes of salt. The usual costs are those of
-// the servers that read the values: of slapd's argon2 module since 2.6, of 389 Directory Server since 2.4 for PBKDF2, of
-// crypt(3) itself.
+// the servers that read the values: of slapd's argon2 module since 2.6, of 389 Directory Server since 2.4 for PBKDF2,
+// of crypt(3) itself.
 constexpr CostRules kArgon2Costs{{1, 8, 1, 8}, {5, 7168, 1, 16}, {1000, 1048576, 64, 64}};
 constexpr CostRules kPbkdf2Costs{{1000, 0, 0, 8}, {100000, 0, 0, 16}, {10000000, 0, 0, 64}};
 constexpr CostRules kYescryptCosts{{1, 0, 0, 0}, {5, 0, 0, 0}, {11, 0, 0, 0}};
@@ -206,7 +206,8 @@ const std::initializer_list<Scheme> kSchemes = {
         crypted(22), kCrypt),
     row("des-crypt", "{DES-CRYPT}", "", kDesCrypt, "Dovecot", {cryptProblem, 0, 0, 0, "no crypt value"}, kCrypt),
     row("bigcrypt", "{CRYPT}", "", kDesCrypt, "slapd",
-        {bigcryptProblem, 0, 0, 0, "the payload is not 2 characters of salt and 11 for each 8 of the password"}, kCrypt),
+        {bigcryptProblem, 0, 0, 0, "the payload is not 2 characters of salt and 11 for each 8 of the password"},
+        kCrypt),
     row("bsdi-crypt", "{CRYPT}", "_", kDesCrypt, "passlib, mkpasswd", crypted(20), kCrypt),
     row("sunmd5", "{CRYPT}", "$md5", kSaltedFast, "mkpasswd", crypted(22), kCrypt),
     row("sha1-crypt", "{CRYPT}", "$sha1$", kStrong, "passlib", crypted(28), kCrypt),

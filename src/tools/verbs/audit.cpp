@@ -19,7 +19,8 @@ constexpr char kFooter[] =
 des-crypt, malformed, wrapped, salted-fast, no-password, unopened, unknown, broken. The number of a finding is one of
 entries, that of a scheme or strength one of values. No password is shown, nor any part of a value.
 Passwords are compared where they can be read: clear ones, masked ones, and AES values that --keys opens. Equal values
-of unsalted schemes, and of AES without keys, count as reused as well. One-way values are tried only with --check-hashes.
+of unsalted schemes, and of AES without keys, count as reused as well. One-way values are tried only with
+--check-hashes.
 The exit code is 0 when the policy of --fail-on and --accept is met or none is given, 1 when it is not met, and else 3
 when lines could not be judged or 4 when --keys does not open all values.)";
 

@@ -47,7 +47,7 @@ class StashFile {
 
  private:
   // All bytes, in as many steps as it takes.
-  template <class Step, class Data>
+  template <typename Step, typename Data>
   bool wholly(Step step, Data* data, size_t bytes) noexcept {
     while (bytes != 0) {
       const ssize_t count = step(descriptor_, data, bytes);

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // The traditional Unix crypt: DES applied 25 times to a block of zeros, the password as key, with an expansion that the
-// salt perturbs. The hash has a kernel of its own (crypt_hash.cpp); the one-bit-a-byte state that the interface promises
-// is filled from its results, and only _encrypt_r works from that state.
+// salt perturbs. The hash has a kernel of its own (crypt_hash.cpp); the one-bit-a-byte state that the interface
+// promises is filled from its results, and only _encrypt_r works from that state.
 #include "password_schemes.h"
 
 #include <cstring>

@@ -7,8 +7,8 @@
 
 #include <utility>
 
-// Leaves the XORs of a round in the tree in which they are bracketed. GCC would make a chain of them, for which the next
-// round waits: the hash takes a quarter longer.
+// Leaves the XORs of a round in the tree in which they are bracketed. GCC would make a chain of them, for which the
+// next round waits: the hash takes a quarter longer.
 #if defined(__GNUC__) && !defined(__clang__)
 #pragma GCC optimize("no-tree-reassoc")
 #endif

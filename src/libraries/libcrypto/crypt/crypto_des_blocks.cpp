@@ -3,8 +3,8 @@
 // processor idle; six blocks side by side fill it.
 #include "crypt/crypto_des.h"
 
-// Leaves the XORs of a round in the tree in which they are bracketed. GCC would make a chain of them, for which the next
-// round waits: a block takes a fifth longer.
+// Leaves the XORs of a round in the tree in which they are bracketed. GCC would make a chain of them, for which the
+// next round waits: a block takes a fifth longer.
 #if defined(__GNUC__) && !defined(__clang__)
 #pragma GCC optimize("no-tree-reassoc")
 #endif

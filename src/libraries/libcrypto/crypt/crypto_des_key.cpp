@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// The round keys of DES. Their bits are bits of the key, each in its place, so a table holds what four bits of the key add
-// to all round keys at once, and an OR of sixteen rows is the result. PC-1, the rotations and PC-2 are in the table.
+// The round keys of DES. Their bits are bits of the key, each in its place, so a table holds what four bits of the key
+// add to all round keys at once, and an OR of sixteen rows is the result. PC-1, the rotations and PC-2 are in the
+// table.
 #include "crypt/crypto_des.h"
 
 namespace ldappw {

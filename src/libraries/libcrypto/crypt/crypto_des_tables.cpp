@@ -99,7 +99,7 @@ constexpr WordPair expandedPair(unsigned byte, unsigned input) {
   return pair;
 }
 
-template <class Word, size_t kColumns>
+template <typename Word, size_t kColumns>
 constexpr DesTable<Word, kColumns> filled(Word (*entry)(unsigned row, unsigned column)) {
   DesTable<Word, kColumns> table{};
   for (unsigned row = 0; row < table.size(); ++row) {

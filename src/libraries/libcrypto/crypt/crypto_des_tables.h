@@ -8,7 +8,7 @@
 
 namespace ldappw {
 
-template <class Word, size_t kColumns>
+template <typename Word, size_t kColumns>
 using DesTable = std::array<std::array<Word, kColumns>, 8>;
 
 // Bit numbers count from 1, the most significant bit of the first byte.
@@ -22,9 +22,9 @@ extern const uint8_t kExpansion[48];
 // keeps the halves of a block. The input's six bits are in the order of the expansion.
 extern const DesTable<uint32_t, 64> Spbox;
 
-// The round keys lie in two halves: groups 1 to 4 come from the half C of the key, groups 5 to 8 from D. A word holds one
-// group a byte, from the top 1, 3, 2, 4 (5, 7, 6, 8), so that its 16-bit halves go into the words of a schedule as they
-// are, and groups that are four apart have the same place in both.
+// The round keys lie in two halves: groups 1 to 4 come from the half C of the key, groups 5 to 8 from D. A word holds
+// one group a byte, from the top 1, 3, 2, 4 (5, 7, 6, 8), so that its 16-bit halves go into the words of a schedule as
+// they are, and groups that are four apart have the same place in both.
 constexpr unsigned kGroupShifts[4] = {24, 8, 16, 0};
 using RoundWords = std::array<uint32_t, 16>;
 

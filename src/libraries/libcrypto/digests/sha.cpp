@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// SHA-1 (FIPS 180-1) in one call, without the crypto provider: the way for any processor, in which all rounds are written
-// out, for speed; and the choice between it and the faster one.
+// SHA-1 (FIPS 180-1) in one call, without the crypto provider: the way for any processor, in which all rounds are
+// written out, for speed; and the choice between it and the faster one.
 #include "digests/sha.h"
 
 #include <cstdint>

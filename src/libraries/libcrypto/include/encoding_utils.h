@@ -207,9 +207,9 @@ LDAPPW_API int ldapUnloadLib(void** handle) LDAPPW_NOEXCEPT;
 /* Returns the address of the symbol in the cell's library, or null, with the reason in dlerror as above. */
 LDAPPW_API void* ldapGetSymAddress(void** handle, const char* symbol) LDAPPW_NOEXCEPT;
 
-/* Appends "/usr/lib" to LD_LIBRARY_PATH unless it is an element of it already. Returns 0, or LDAPPW_NO_MEMORY or -1 with
- * the path as it was when memory runs out. With its name a path has at most 2048 characters: a longer one is cut. The
- * text outlives the library. For start-up: one thread only. */
+/* Appends "/usr/lib" to LD_LIBRARY_PATH unless it is an element of it already. Returns 0, or LDAPPW_NO_MEMORY or -1
+ * with the path as it was when memory runs out. With its name a path has at most 2048 characters: a longer one is cut.
+ * The text outlives the library. For start-up: one thread only. */
 LDAPPW_API int setDefLibpath(void) LDAPPW_NOEXCEPT;
 
 /* In a text of two-character SSL cipher codes whose first "0A" follows its first "09", puts another "0A" before that
@@ -221,8 +221,8 @@ LDAPPW_API void fixupCipherSpecs(char* specs) LDAPPW_NOEXCEPT;
 /*
  * getPassword prompts "Enter password ==> " on standard output and reads one line of at most 254 characters from the
  * descriptor of standard input, without echo where that is a terminal. Nothing of it stays in a stdio buffer: what the
- * caller's stdio has read ahead is not seen, and nothing behind the line is read. A program that reads from stdin before
- * calls setvbuf(stdin, NULL, _IONBF, 0) first, so that nothing is read ahead.
+ * caller's stdio has read ahead is not seen, and nothing behind the line is read. A program that reads from stdin
+ * before calls setvbuf(stdin, NULL, _IONBF, 0) first, so that nothing is read ahead.
  *
  * Returns the line without its last character, whatever that is, as a new text, empty at the end of input; null when
  * memory runs out. When echo cannot be switched off the process ends with errno as its exit status. SIGINT, SIGTERM,

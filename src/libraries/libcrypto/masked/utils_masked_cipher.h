@@ -19,8 +19,8 @@ bool isSelector(unsigned selector) noexcept;
 // Fills the buffer with non-zero bytes drawn from a generator seeded with the time.
 void setBackground(unsigned char* buffer, size_t n) noexcept;
 
-// The ciphers of one record. Its two parts are as a rule under one key, whose schedule is then built once. Data are whole
-// cipher blocks, selectors valid ones.
+// The ciphers of one record. Its two parts are as a rule under one key, whose schedule is then built once. Data are
+// whole cipher blocks, selectors valid ones.
 class RecordCipher {
  public:
   // Enciphers n bytes in place under a key that it draws, and stores the key's index.

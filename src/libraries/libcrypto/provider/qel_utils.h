@@ -9,7 +9,7 @@ namespace ldappw {
 
 // Calls an entry of the provider. One that is missing, as all are before the provider is loaded, fails as the provider
 // would: with 0 or null.
-template <class Result, class... Parameters, class... Arguments>
+template <typename Result, typename... Parameters, typename... Arguments>
 Result callEntry(Result (*entry)(Parameters...), Arguments... arguments) noexcept {
   return __builtin_expect(entry != nullptr, 1) ? entry(arguments...) : Result{};
 }
@@ -59,7 +59,7 @@ using InitContext = int (*)(void* qelCtx, void** context, const char* name, void
 using FreeContext = int (*)(void* qelCtx, void* context);
 
 // A cipher or digest context of the process-wide provider context, released when it goes.
-template <class Steps, InitContext kInit, FreeContext kFree>
+template <typename Steps, InitContext kInit, FreeContext kFree>
 class ContextOwner : public Steps {
  public:
   explicit ContextOwner(void* providerContext) noexcept { this->qelCtx = providerContext; }

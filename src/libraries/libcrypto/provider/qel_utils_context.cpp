@@ -116,8 +116,8 @@ void* newContext(const char* path) noexcept {
   return context;
 }
 
-// Makes the context the process's. Of several threads, or of a thread and a trace sink inside its loading, one is first;
-// the others have theirs cleaned up.
+// Makes the context the process's. Of several threads, or of a thread and a trace sink inside its loading, one is
+// first; the others have theirs cleaned up.
 void publishContext(void* context) noexcept {
   const NoFork unforked;
   void* none = nullptr;

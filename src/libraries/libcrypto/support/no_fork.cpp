@@ -3,7 +3,8 @@
 #include "support/no_fork.h"
 
 #include <pthread.h>
-#include <time.h>
+
+#include <ctime>
 
 #include "support/cancellation.h"
 
@@ -16,7 +17,7 @@ int busy = 0;             // sections under way
 int forking = 0;          // forks under way
 unsigned generation = 0;  // the number of forks from the first process to this one
 
-template <class T>
+template <typename T>
 T now(T& number) noexcept {
   return __atomic_load_n(&number, __ATOMIC_SEQ_CST);
 }

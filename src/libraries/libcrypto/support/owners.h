@@ -35,12 +35,12 @@ struct WipeText {
 };
 
 // Public data from malloc, and clear text from malloc.
-template <class T>
+template <typename T>
 using PlainOwner = std::unique_ptr<T, Free>;
 using SecretText = std::unique_ptr<char, WipeText>;
 
 // Memory; null when it has run out, which a result tells, and not the host's errno as well.
-template <class T>
+template <typename T>
 T* newBytes(size_t bytes, void* (*allocate)(size_t) = std::malloc) noexcept {
   const int before = errno;
   void* data = allocate(bytes);
@@ -57,7 +57,7 @@ inline char* newText(const char* text) noexcept {
 }
 
 // Zeroed memory. For small sizes malloc and a fill: glibc's calloc passes by the cache of the thread.
-template <class T>
+template <typename T>
 T* zeroedBytes(size_t bytes) noexcept {
   constexpr size_t kSmall = 1024;
   if (bytes > kSmall) return newBytes<T>(bytes, [](size_t size) { return std::calloc(size, 1); });
@@ -83,9 +83,9 @@ class SecretArray {
   unsigned char bytes_[kBytes];
 };
 
-// A buffer whose size is known when it is made; up to kInline bytes need no allocation. One for secrets is zeroed, since
-// who fills it may fill less than it claims, and wiped when it goes; one for public data is for those who write all of
-// it.
+// A buffer whose size is known when it is made; up to kInline bytes need no allocation. One for secrets is zeroed,
+// since who fills it may fill less than it claims, and wiped when it goes; one for public data is for those who write
+// all of it.
 template <size_t kInline, bool kSecret>
 class Buffer {
  public:
@@ -138,7 +138,7 @@ class TextCopy {
 };
 
 // Guards a caller's slot: every way out but keep() releases what the slot holds and nulls it. A null slot is nobody's.
-template <class T, class Release = Free>
+template <typename T, typename Release = Free>
 class OutGuard {
  public:
   explicit OutGuard(T** slot) noexcept : slot_(slot) {}

@@ -71,7 +71,7 @@ constexpr TraceInfo accessor(Module module, unsigned function, const char* name,
   return {{moduleId(module, function), kSmallLevel, kSmallMask}, name, failuresOf(module), arguments};
 }
 
-template <class... Pointers>
+template <typename... Pointers>
 constexpr bool anyNull(Pointers... pointers) {
   return ((pointers == nullptr) || ...);
 }
@@ -79,7 +79,7 @@ constexpr bool anyNull(Pointers... pointers) {
 class TracedCall {
  public:
   // The pointers are those that the entering line shows; they are put together only when there is a line to write.
-  template <class... Pointers>
+  template <typename... Pointers>
   explicit TracedCall(const TraceInfo& info, Pointers... arguments) noexcept : scope_(info) {
     static_assert(sizeof...(arguments) <= ArgumentNames::kMost);
     if (__builtin_expect(scope_.isOn(), 0) && scope_.debugOn() && info.lines == Lines::usual) {

@@ -78,7 +78,7 @@ class AnySymbols {
                       _mm_mullo_epi16(secondAndFourth, _mm_set1_epi32(0x01000010)));
 }
 
-template <class Symbols>
+template <typename Symbols>
 [[LDAPPW_KERNEL, gnu::target("sse4.1")]] void encode(const unsigned char* data, size_t bytes, const char* alphabet,
                                                      char* out) noexcept {
   const Symbols symbols(alphabet);
@@ -172,7 +172,7 @@ class AnyValues {
   return _mm_shuffle_epi8(groups, _mm_setr_epi8(2, 1, 0, 6, 5, 4, 10, 9, 8, 14, 13, 12, -1, -1, -1, -1));
 }
 
-template <class Values>
+template <typename Values>
 [[LDAPPW_KERNEL, gnu::target("sse4.1")]] DecodedText decode(const char* text, size_t length, const char* alphabet,
                                                             const Values& table, unsigned char* out) noexcept {
   const char* const last = text + length - kStepCharacters;
