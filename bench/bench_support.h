@@ -34,8 +34,8 @@ inline std::vector<Counted>& countedWorks() {
   return works;
 }
 
-// A piece of work, named <row>/ours, or the same work by a peer, named <row>/<peer>. scripts/bench prints the ratios
-// of each row, and bars.csv states what they must not exceed.
+// A piece of work, named <row>/ours, or the same work by a peer, named <row>/<peer>. scripts/measure/bench prints the
+// ratios of each row, and bars.csv states what they must not exceed.
 template <typename Work>
 benchmark::internal::Benchmark* measure(const std::string& name, Work work) {
   countedWorks().push_back({name, work});

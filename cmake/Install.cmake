@@ -14,8 +14,9 @@ file(RELATIVE_PATH LDAPPW_PC_TO_PREFIX /prefix/${CMAKE_INSTALL_LIBDIR}/pkgconfig
 configure_file(cmake/ldappw.pc.in ${CMAKE_BINARY_DIR}/ldappw.pc @ONLY)
 install(FILES ${CMAKE_BINARY_DIR}/ldappw.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT dev)
 
-# The manual of the library: a page a header, which scripts/make_manual.py makes, and a link for each operation on it.
-# Their suffix sets them apart from pages of the same names, of which systems have some. And an example to start from.
+# The manual of the library: a page a header, which scripts/make/make_manual.py makes, and a link for each operation on
+# it. Their suffix sets them apart from pages of the same names, of which systems have some. And an example to start
+# from.
 set(manual ${PROJECT_SOURCE_DIR}/docs/man)
 set(links ${CMAKE_BINARY_DIR}/man3)
 foreach(header IN LISTS LDAPPW_PUBLIC_HEADERS)

@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
-# The 32-bit x86 target on a 64-bit system: -m32, with the libraries of the private folder that scripts/sysroot-i386
-# unpacks.
+# The 32-bit x86 target on a 64-bit system: -m32, with the libraries of the private folder that
+# scripts/make/sysroot-i386 unpacks.
 set(CMAKE_SYSTEM_NAME Linux)
 set(CMAKE_SYSTEM_PROCESSOR i686)
 set(CMAKE_C_COMPILER gcc)

@@ -8,7 +8,7 @@ for set in A B C; do
   echo "SaltOfTest-$set" >salt
   run 'keys create' 0 keys create --salt-file salt --config $set.cfg --directory $set <<<"aSeedForTheTest-$set"
 done
-python3 "$root/scripts/make_sample.py" --entries 3000 --out sample
+python3 "$root/scripts/make/make_sample.py" --entries 3000 --out sample
 sed -i "s|^userpassword: x$|userpassword: X|I" sample  # x alone locks
 run 'to aes256' 0 ldif --to aes256 --new-keys B --in sample --allow-binary --out b
 
@@ -105,7 +105,7 @@ test_output_files() {
 
 # What has been written of change records when a signal comes is whole.
 test_stop_in_order() {
-  python3 "$root/scripts/make_sample.py" --entries 9 --out small
+  python3 "$root/scripts/make/make_sample.py" --entries 9 --out small
   mkfifo changes; (exec "$tool" ldif --to argon2id --changes --threads 1 --out stopped changes 2>err) &
   local command=$! rc
   exec 9>changes; cat small >&9

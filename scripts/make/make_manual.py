@@ -3,15 +3,17 @@
 """Makes the manual pages of the library, docs/man/<header>.3, from the public headers: what a header declares is the
 synopsis, what its comments say is the description.
 
-    scripts/make_manual.py           writes the pages again; a page whose text is the same keeps its date
-    scripts/make_manual.py --check   compares them with what would be written
+    scripts/make/make_manual.py           writes the pages again; a page whose text is the same keeps its date
+    scripts/make/make_manual.py --check   compares them with what would be written
 """
 import collections
 import datetime
+import pathlib
 import re
 import sys
 import textwrap
 
+sys.path.insert(0, str(pathlib.Path(__file__).resolve().parents[1] / "checks"))
 import check_exports
 
 PAGES = check_exports.ROOT / "docs/man"
@@ -280,7 +282,7 @@ def main():
     stale = []
     for header, (head, sections) in headers.items():
         path = PAGES / header.replace(".h", ".3")
-        start = '.\\" SPDX-License-Identifier: Apache-2.0\n.\\" Made from %s by scripts/make_manual.py.\n' % header
+        start = '.\\" SPDX-License-Identifier: Apache-2.0\n.\\" Made from %s by scripts/make/make_manual.py.\n' % header
         body = "\n".join(page_of(header, head, sections)) + "\n"
         now = path.read_text() if path.exists() else ""
         if re.sub(r"^\.Dd .*\n", "", now, flags=re.M) == start + body:
@@ -290,7 +292,7 @@ def main():
             today = datetime.date.today()
             path.write_text("%s.Dd %s %d, %d\n%s" % (start, today.strftime("%B"), today.day, today.year, body))
     if check and stale:
-        sys.exit("make_manual: not as the headers are: %s; run scripts/make_manual.py" % ", ".join(stale))
+        sys.exit("make_manual: not as the headers are: %s; run scripts/make/make_manual.py" % ", ".join(stale))
 
 
 if __name__ == "__main__":

@@ -2,9 +2,9 @@
 # SPDX-License-Identifier: Apache-2.0
 """Makes the sample exports: the people of an invented company, with clear passwords of many kinds.
 
-    scripts/make_sample.py                          writes samples/directory.ldif and samples/mixed.ldif again
-    scripts/make_sample.py --check                  compares them with what would be written
-    scripts/make_sample.py --entries 100000 --out F writes one larger directory of the same make
+    scripts/make/make_sample.py                          writes samples/directory.ldif and samples/mixed.ldif again
+    scripts/make/make_sample.py --check                  compares them with what would be written
+    scripts/make/make_sample.py --entries 100000 --out F writes one larger directory of the same make
 
 The same seed gives the same bytes.
 """
@@ -153,7 +153,7 @@ def main():
         with open(options.out, "w", encoding="utf-8", newline="") as file:
             file.writelines(directory(options.entries))
         return
-    samples = pathlib.Path(__file__).resolve().parent.parent / "samples"
+    samples = pathlib.Path(__file__).resolve().parents[2] / "samples"
     for name, text in (("directory.ldif", "".join(directory(options.entries))), ("mixed.ldif", mixed())):
         if not options.check:
             (samples / name).write_bytes(text.encode())

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Runs the trials; scripts/servers prepares and calls it. Exit code 1 when a check failed."""
+"""Runs the trials; scripts/trials/servers prepares and calls it. Exit code 1 when a check failed."""
 import argparse
 import sys
 
@@ -11,7 +11,7 @@ SERVERS = {"slapd": trials_of_slapd, "389": trials_of_389}
 
 
 def main():
-    parser = argparse.ArgumentParser(prog="scripts/servers")
+    parser = argparse.ArgumentParser(prog="scripts/trials/servers")
     parser.add_argument("--short", action="store_true", help="less load, fewer rounds")
     parser.add_argument("server", nargs="*", help="slapd, 389, or both when none is named")
     options = parser.parse_args()

@@ -15,7 +15,7 @@ import time
 
 import client
 
-ROOT = pathlib.Path(__file__).resolve().parents[2]
+ROOT = pathlib.Path(__file__).resolve().parents[3]
 BUILD = ROOT / "build/release"
 INSTALLED = "LDAPPW_INSTALLED" in os.environ  # the packages are tried, not what was built
 LDAPPW = "ldappw" if INSTALLED else BUILD / "bin/ldappw"

@@ -3,14 +3,14 @@
 """Sees that built files are hardened: guarded stacks, checked copies, marked jump targets, tables read-only after start,
 and no path of the machine that built them.
 
-    scripts/check_hardening.py BUILD-FOLDER...
+    scripts/checks/check_hardening.py BUILD-FOLDER...
 """
 import pathlib
 import re
 import subprocess
 import sys
 
-ROOT = pathlib.Path(__file__).resolve().parent.parent
+ROOT = pathlib.Path(__file__).resolve().parents[2]
 FILES = ("lib/libldappw.so.1", "lib/libdsutil.so.1", "lib/qel/qellib/libtresk7qels.so", "bin/ldappw")
 PLUGINS = ("lib/ldap/pw-ldappw.so", "lib/dirsrv/plugins/libldappw-pwdstorage.so")  # where their servers' headers are
 MARK = re.compile(r"x86 feature:.*\bIBT\b.*\bSHSTK\b")

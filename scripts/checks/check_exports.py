@@ -4,14 +4,14 @@
 that the product neither throws nor allocates with operator new, and the provider needs nothing that is newer than
 OpenSSL 3.0.0.
 
-    scripts/check_exports.py LIBRARY-FOLDER
+    scripts/checks/check_exports.py LIBRARY-FOLDER
 """
 import pathlib
 import re
 import subprocess
 import sys
 
-ROOT = pathlib.Path(__file__).resolve().parent.parent
+ROOT = pathlib.Path(__file__).resolve().parents[2]
 SOURCES = ROOT / "src/libraries/libcrypto/include"
 HEADERS = ("password_schemes.h", "encoding_utils.h", "crypto_provider.h", "aes_keys.h")
 FORBIDDEN_IMPORTS = re.compile(r"^(__cxa_throw|__cxa_allocate_exception|_Zn[wa][jm])$")

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Writes docs/performance.md and its two charts from the results of scripts/bench, which calls this with --write."""
+"""Writes docs/performance.md and its two charts from the results of scripts/measure/bench, which calls this with --write."""
 import collections
 import itertools
 import os
@@ -7,7 +7,7 @@ import pathlib
 import re
 import subprocess
 
-ROOT = pathlib.Path(__file__).resolve().parent.parent
+ROOT = pathlib.Path(__file__).resolve().parents[2]
 DOCS = ROOT / "docs"
 FEATURES = ("ssse3", "sse4_1", "avx2", "avx512f", "sha_ni", "aes")
 PACKAGES = ("g++", "libc6", "libssl3", "libnettle8", "libcrypt1")
@@ -46,7 +46,7 @@ MISSED = {
 
 TEXT = """# Performance
 
-Written by `scripts/bench --write`; not to be edited.
+Written by `scripts/measure/bench --write`; not to be edited.
 
 Each figure is our time as a multiple of the time that a peer takes for the same work in the same run; a bar is what the
 ratio must keep to. Where threads are compared it is the throughput of two over that of one. Absolute times are left
@@ -75,7 +75,7 @@ has no bars.
 - Loading is measured in new processes, each of which reports its processor time from opening the library to its first
   value.
 - Ratios are not tested for: a busy machine would decide. What the continuous integration compares are the instructions
-  that the library's own objects execute for a call, which repeat: `bench/counts.csv`, `scripts/bench --counts`.
+  that the library's own objects execute for a call, which repeat: `bench/counts.csv`, `scripts/measure/bench --counts`.
   They are counted under valgrind, which knows no SHA extensions, so that they are those of the plain SHA-1.
 - Processor features are chosen at run time: the SHA extensions for SHA-1, SSE4.1 for base64. Without them the plain
   code runs, which the tests compare with the other.

@@ -3,7 +3,7 @@
 """Sees that includes and calls follow the layers, that secrets are handled by the helpers made for them, and that sources
 keep to what this project has agreed on. Calls are read from object files, so a build comes first.
 
-    scripts/check_tree.py [BUILD-FOLDER]     (default: build/release)
+    scripts/checks/check_tree.py [BUILD-FOLDER]     (default: build/release)
 """
 import collections
 import pathlib
@@ -13,7 +13,7 @@ import sys
 
 import check_exports
 
-ROOT = pathlib.Path(__file__).resolve().parent.parent
+ROOT = pathlib.Path(__file__).resolve().parents[2]
 LIBRARIES = ROOT / "src/libraries"
 PUBLIC = {"password_schemes.h", "encoding_utils.h", "crypto_provider.h", "aes_keys.h"}
 PUBLIC_SYSTEM = {"stddef.h", "stdint.h"}
@@ -100,7 +100,7 @@ def layer(part, place):
 def missing_layer_faults(part):
     for path in files(part + "/*.cpp", part + "/*.h", part + "/*.S"):
         if path.parent.name != "include" and layer(part, path.relative_to(ROOT / part)) is None:
-            yield "%s: is in no layer of scripts/check_tree.py" % path.relative_to(ROOT)
+            yield "%s: is in no layer of scripts/checks/check_tree.py" % path.relative_to(ROOT)
 
 
 def layer_include_faults(part):

@@ -30,7 +30,7 @@ def derive(seed, salt, iterations, length):
 def main():
     draw = random.Random("ldappw key derivation")
     lines = [
-        "# Made by scripts/make_derivation_vectors.py with Python %d.%d's hashlib." % sys.version_info[:2],
+        "# Made by scripts/make/make_derivation_vectors.py with Python %d.%d's hashlib." % sys.version_info[:2],
         "# key: seed, salt, iterations, derived bytes (hexadecimal)",
     ]
     for iterations, length in [(1, 16), (2, 20), (3, 24), (3, 40), (7, 61), (1000, 32), (10000, 33)]:
@@ -40,7 +40,7 @@ def main():
     for seed, salt in [("abcdefghijkl", "saltsaltsalt"), ("~!" * 8, "!~!~!~!~!~!~"), ("s" * 1016, "another-salt")]:
         sync = base64.b64encode(derive(seed.encode(), salt.encode(), 3, len(seed))).decode()
         lines.append(f"record {seed} {salt} {sync} {derive(seed.encode(), salt.encode(), 10000, 32).hex()}")
-    target = pathlib.Path(__file__).parent.parent / "tests" / "data" / "derivation.vec"
+    target = pathlib.Path(__file__).resolve().parents[2] / "tests" / "data" / "derivation.vec"
     # A line of more than 120 columns goes on in lines that begin with two blanks.
     target.write_text("".join("\n  ".join(re.findall("^.{1,120}|.{1,118}", line)) + "\n" for line in lines))
 
