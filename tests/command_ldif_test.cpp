@@ -3,6 +3,7 @@
 #include <algorithm>
 
 #include "command.h"
+#include "ldif/key_ring.h"
 #include "ldif/record.h"
 
 using namespace test;
@@ -87,6 +88,32 @@ TEST(LogicalLines, FoldAt76) {
     Secret unfolded;
     tool::unfold(line, unfolded);
     EXPECT_EQ(unfolded.view(), text);
+  }
+}
+
+// Which key opens a value, and how surely, from the first on that may.
+TEST_F(Folder, KeyRingTellsKeysApart) {
+  using Result = tool::KeyRing::Opened::Result;
+  const tool::KeyRing ring({"d2", "", "dir", "d3"});
+  const size_t none = tool::KeyRing::kNoKey;
+  const std::tuple<const char*, size_t, Result, size_t, const char*> rows[] = {
+      {"<dir>", 0, Result::kText, 1, "secret"},
+      {"<d2>", 0, Result::kText, 0, "secret"},
+      {"<d3>", 1, Result::kText, 2, "secret"},
+      {"<d2>", 1, Result::kRefused, none, nullptr},
+      {"{AES256}6P54Co1SO95zcqBh0rx/RA==", 0, Result::kBytes, 1, "\xff\x30\x30\x30\x30\x31\x31\x33"},
+      {"{AES256}BaQx2owQTLzOjfK+1c2O0w==", 0, Result::kAmbiguous, 1, nullptr},
+      {"{AES256}BaQx2owQTLzOjfK+1c2O0w==", 1, Result::kBytes, 1, nullptr},
+      {"{CLEAR}\xff", 0, Result::kText, none, "\xff"}};
+  for (const auto& [text, first, result, key, opened] : rows) {
+    const Secret value(expanded(text, names()));
+    Secret clear;
+    const tool::KeyRing::Opened answer = ring.open(tool::examine(value), first, clear);
+    EXPECT_EQ(answer.result, result) << text;
+    EXPECT_TRUE(answer.key == key || result == Result::kAmbiguous) << text << answer.key;
+    EXPECT_TRUE(opened == nullptr || clear.view() == opened) << text;
+    EXPECT_EQ(answer.status(false).ok(), result == Result::kText) << text;
+    EXPECT_EQ(answer.status(true).ok(), result == Result::kText || result == Result::kBytes) << text;
   }
 }
 

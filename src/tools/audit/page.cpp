@@ -11,10 +11,10 @@
 #include <string_view>
 
 #include "audit/page_parts.h"
+#include "base/base64.h"
 #include "base/secret.h"
 #include "base/sha256.h"
 #include "base/text.h"
-#include "encoding_utils.h"
 
 namespace tool {
 namespace {
@@ -206,9 +206,9 @@ Html legendOf(const Strengths& strengths, std::uint64_t judged) {
 
 Html digestOf(std::string_view style) {
   const Sha256::Digest digest = Sha256().of({style});
-  const AllocatedText text(binaryBlobToBase64(digest.data(), static_cast<int>(digest.size())));
-  if (!text) throw std::bad_alloc();
-  return {text.get()};
+  Secret text;
+  appendBase64({reinterpret_cast<const char*>(digest.data()), digest.size()}, text);
+  return {text.c_str()};
 }
 
 Html startOf(const AuditReport& report, std::uint64_t judged) {

@@ -8,9 +8,9 @@
 #include <new>
 #include <string>
 
+#include "base/base64.h"
 #include "base/descriptor.h"
 #include "base/text.h"
-#include "encoding_utils.h"
 
 namespace tool {
 namespace {
@@ -71,10 +71,9 @@ Json& Json::text(std::string_view name, std::string_view value) {
 }
 
 Json& Json::base64(std::string_view name, std::string_view bytes) {
-  const auto* data = reinterpret_cast<const unsigned char*>(bytes.data());
-  const AllocatedText text(binaryBlobToBase64(data, static_cast<int>(bytes.size())));
-  if (!text) throw std::bad_alloc();
-  return begin(name, "\"").raw(text.get()).raw("\"");
+  Secret text;
+  appendBase64(bytes, text);
+  return begin(name, "\"").raw(text.view()).raw("\"");
 }
 
 Json& Json::number(std::string_view name, std::uint64_t value) {

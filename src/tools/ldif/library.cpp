@@ -2,38 +2,26 @@
 // Opening the LDAP client library.
 #include "ldif/library.h"
 
-#include <dlfcn.h>
-
-#include <cstring>
-#include <string>
-
-#include "base/failure.h"
+#include "base/loaded_library.h"
 
 namespace tool {
 namespace {
 
-template <typename Function>
-void resolve(void* library, const char* name, Function& function) {
-  void* address = library != nullptr ? dlsym(library, name) : nullptr;
-  if (address == nullptr) throw Failure(kInternal, std::string("directory exports cannot be read: ") + dlerror());
-  memcpy(&function, &address, sizeof function);
-}
-
-// What it writes to standard error of lines that it does not like is said here in other words.
-void silence(void* library) {
+// Keeps it from writing about lines to standard error: the command has messages of its own.
+void silence(const LoadedLibrary& library) {
   decltype(&ber_set_option) setOption = nullptr;
-  resolve(library, "ber_set_option", setOption);
+  library.resolve("ber_set_option", setOption);
   const BER_LOG_PRINT_FN keepQuiet = [](const char*) {};
   setOption(nullptr, LBER_OPT_LOG_PRINT_FN, reinterpret_cast<const void*>(keepQuiet));
 }
 
 LdifLibrary openLibrary() {
-  void* library = dlopen(LDAPPW_LDAP_SONAME, RTLD_NOW | RTLD_LOCAL);
+  const LoadedLibrary library(LDAPPW_LDAP_SONAME, "directory exports cannot be read");
   LdifLibrary functions{};
-  resolve(library, "ldif_parse_line2", functions.parseLine);
-  resolve(library, "ldif_sput_wrap", functions.putLine);
-  resolve(library, "ldif_is_not_printable", functions.isNotPrintable);
-  resolve(library, "ber_memfree", functions.release);
+  library.resolve("ldif_parse_line2", functions.parseLine);
+  library.resolve("ldif_sput_wrap", functions.putLine);
+  library.resolve("ldif_is_not_printable", functions.isNotPrintable);
+  library.resolve("ber_memfree", functions.release);
   silence(library);
   return functions;
 }

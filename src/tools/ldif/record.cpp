@@ -123,23 +123,28 @@ Secret PasswordLine::whole(const Secret& changed) const {
 void RecordWalker::startRecord() noexcept {
   dn_.clear();
   ++group_;
-  inEntry_ = strayed_ = change_ = modify_ = inBlock_ = deleting_ = false;
+  place_ = Place::kOutside;
 }
 
 // Outside an entry its dn is awaited, and the lines that frame an export or the answer to a search are let through.
 bool RecordWalker::beginsEntry(std::string_view name) {
-  if (sameName(name, "dn")) return inEntry_ = true;
+  if (sameName(name, "dn")) {
+    place_ = Place::kEntry;
+    return true;
+  }
   const bool frame = sameName(name, "version") || sameName(name, "search") || sameName(name, "result");
-  if (!frame && !strayed_) outside_.push_back(lineNumber_);
-  strayed_ = strayed_ || !frame;
+  if (!frame && place_ == Place::kOutside) {
+    outside_.push_back(lineNumber_);
+    place_ = Place::kStrayed;
+  }
   return false;
 }
 
 // Most lines are found to be none of ours without undoing their folding.
 bool RecordWalker::matters(std::string_view description) const noexcept {
   const std::string_view name = trimSpaces(description);
-  return !inEntry_ || modify_ || attributes_.find(name) != AttributeSet::kNone || sameName(name, "dn") ||
-         sameName(name, "changetype");
+  return place_ < Place::kEntry || modifies() || attributes_.find(name) != AttributeSet::kNone ||
+         sameName(name, "dn") || sameName(name, "changetype");
 }
 
 void RecordWalker::readName(std::string_view text) {
@@ -154,14 +159,11 @@ void RecordWalker::readName(std::string_view text) {
 // Follows the lines that say which record and which change the others belong to.
 void RecordWalker::readControl(std::string_view name, std::string_view text) {
   if (sameName(name, "dn")) return readName(text);
-  if (sameName(name, "changetype")) {
-    change_ = true;
-    modify_ = sameName(trimSpaces(text), "modify");
+  if (sameName(name, "changetype") && place_ < Place::kBlock) {
+    place_ = sameName(trimSpaces(text), "modify") ? Place::kModify : Place::kChange;
     return;
   }
-  if (!modify_ || inBlock_) return;
-  inBlock_ = true;
-  deleting_ = sameName(name, "delete");
+  if (place_ == Place::kModify) place_ = sameName(name, "delete") ? Place::kDeleting : Place::kBlock;
 }
 
 void RecordWalker::readPassword(std::string_view description) {
@@ -200,10 +202,38 @@ ValueForm RecordWalker::readValue(std::string_view text) {
   if (!text.empty() && text.front() == '<') return ValueForm::kUrl;
   const char* problem = valueProblem(text);
   const bool parsed = problem == nullptr && parseValue(text_, password_.value);
-  if (inBlock_ && deleting_) return ValueForm::kDeleted;
+  if (place_ == Place::kDeleting) return ValueForm::kDeleted;
   if (parsed) return ValueForm::kBytes;
   password_.problem = problem != nullptr ? problem : "the line cannot be parsed";
   return ValueForm::kBroken;
+}
+
+// Ends a block of a change record.
+void RecordWalker::endBlock() noexcept {
+  if (place_ > Place::kModify) place_ = Place::kModify;
+  ++group_;
+}
+
+void RecordWalker::readLine(std::string_view text) {
+  if (text.empty() || text.front() == '#') return;
+  size_t colon = text.find(':');
+  if (colon != kNone && !matters(text.substr(0, colon))) return;
+  Secret whole;
+  if (line_.folded()) {  // a fold can stand anywhere, within the name of an attribute too
+    unfold(line_, whole);
+    text = whole.view().substr(static_cast<size_t>(text.data() - line_.first.data()));
+    colon = text.find(':');
+  }
+  const std::string_view name = text.substr(0, colon);
+  if (place_ < Place::kEntry && !beginsEntry(trimSpaces(name))) return;
+  if (colon == kNone) {
+    if (text == "-") endBlock();
+    return;
+  }
+  const size_t found = attributes_.find(name);
+  if (found == AttributeSet::kNone) return readControl(trimSpaces(name), text.substr(colon + 1));
+  seen_ |= std::uint64_t{1} << found;
+  readPassword(name);
 }
 
 bool RecordWalker::next() {
@@ -213,33 +243,9 @@ bool RecordWalker::next() {
   nextLineNumber_ += line_.physicalLines;
   if (line_.blank()) startRecord();
   std::string_view text = line_.first;
-  if (lineNumber_ == 1 && text.substr(0, kByteOrderMark.size()) == kByteOrderMark) {
-    text.remove_prefix(kByteOrderMark.size());
-  }
-  if (text.empty() || text.front() == '#') return true;
-  size_t colon = text.find(':');
-  if (colon != kNone && !matters(text.substr(0, colon))) return true;
-  Secret whole;
-  if (line_.folded()) {  // a fold can stand anywhere, within the name of an attribute too
-    unfold(line_, whole);
-    text = whole.view().substr(static_cast<size_t>(text.data() - line_.first.data()));
-    colon = text.find(':');
-  }
-  const std::string_view name = text.substr(0, colon);
-  if (!inEntry_ && !beginsEntry(trimSpaces(name))) return true;
-  if (colon == kNone) {
-    if (text != "-") return true;
-    inBlock_ = false;
-    ++group_;
-    return true;
-  }
-  const size_t found = attributes_.find(name);
-  if (found == AttributeSet::kNone) {
-    readControl(trimSpaces(name), text.substr(colon + 1));
-    return true;
-  }
-  seen_ |= std::uint64_t{1} << found;
-  readPassword(name);
+  const bool marked = lineNumber_ == 1 && text.substr(0, kByteOrderMark.size()) == kByteOrderMark;
+  if (marked) text.remove_prefix(kByteOrderMark.size());
+  readLine(text);
   return true;
 }
 

@@ -66,12 +66,12 @@ class RecordWalker {
 
   bool atPassword() const noexcept { return atPassword_; }
   const PasswordLine& password() const noexcept { return password_; }
-  bool inChange() const noexcept { return change_; }  // the record is not an entry but a change of one
+  bool inChange() const noexcept { return place_ >= Place::kChange; }  // the record is not an entry but a change of one
   const LogicalLine& line() const noexcept { return line_; }
   std::uint64_t lineNumber() const noexcept { return lineNumber_; }
   const std::string& dn() const noexcept { return dn_; }  // decoded; empty when the record has none
   std::uint64_t entries() const noexcept { return entries_; }
-  bool modifies() const noexcept { return modify_; }  // the record changes an entry and does not describe it
+  bool modifies() const noexcept { return place_ >= Place::kModify; }  // it changes parts of an entry
   // Counts the entries, and the blocks of change records: equal values within one are refused by servers.
   std::uint64_t group() const noexcept { return group_; }
   // The first of each run of lines that belong to no entry; none of them is looked at for passwords.
@@ -80,8 +80,22 @@ class RecordWalker {
   std::uint64_t seen() const noexcept { return seen_; }
 
  private:
+  // Where in a record the next line stands. The order counts: all from kEntry on are in an entry, all from kChange on
+  // in a change record, and all from kModify on in one that modifies.
+  enum class Place {
+    kOutside,   // before the dn
+    kStrayed,   // the same, and the record has begun with another line, which has been noted
+    kEntry,     // behind the dn
+    kChange,    // behind a changetype
+    kModify,    // behind "changetype: modify", between blocks
+    kBlock,     // between "add: ..." or "replace: ..." and "-"
+    kDeleting,  // between "delete: ..." and "-"
+  };
+
   void startRecord() noexcept;
+  void readLine(std::string_view text);
   bool beginsEntry(std::string_view name);
+  void endBlock() noexcept;
   bool matters(std::string_view description) const noexcept;
   void readControl(std::string_view name, std::string_view text);
   void readName(std::string_view text);
@@ -102,12 +116,7 @@ class RecordWalker {
   std::string dn_;
   PasswordLine password_;
   bool atPassword_ = false;
-  bool inEntry_ = false;   // the record has begun with its dn
-  bool strayed_ = false;   // it has begun with something else, which has been noted
-  bool change_ = false;    // a record with a changetype
-  bool modify_ = false;    // a record with "changetype: modify"
-  bool inBlock_ = false;   // between "add: ..." and "-"
-  bool deleting_ = false;  // the block is a "delete: ..." one
+  Place place_ = Place::kOutside;
 };
 
 // Appends a line of an attribute, unfolded, as text or base64 as the value needs.

@@ -6,8 +6,8 @@
 #include <new>
 #include <string>
 
+#include "base/base64.h"
 #include "base/text.h"
-#include "encoding_utils.h"
 
 namespace tool {
 namespace {
@@ -84,13 +84,13 @@ bool parseDovecot(std::string_view payload, Pbkdf2Parts& parts) {
 bool parseUsual(std::string_view payload, Pbkdf2Parts& parts) {
   const std::string_view iterations = take(payload, '$');
   const std::string_view salt = take(payload, '$');
-  return parseNumber(iterations, parts.iterations) && decodeBase64(salt, parts.salt) &&
-         decodeBase64(payload, parts.hash);
+  return parseNumber(iterations, parts.iterations) && decodeAnyBase64(salt, parts.salt) &&
+         decodeAnyBase64(payload, parts.hash);
 }
 
 bool parsePacked(std::string_view payload, Pbkdf2Parts& parts) {
   Secret bytes;
-  if (!decodeBase64(payload, bytes) || bytes.size() <= sizeof parts.iterations + kOldSaltBytes) return false;
+  if (!decodeAnyBase64(payload, bytes) || bytes.size() <= sizeof parts.iterations + kOldSaltBytes) return false;
   for (size_t i = 0; i < sizeof parts.iterations; ++i) {
     parts.iterations = parts.iterations << 8 | static_cast<unsigned char>(bytes.view()[i]);
   }
@@ -107,21 +107,12 @@ bool parseNumber(std::string_view text, std::uint32_t& number) noexcept {
   return error == std::errc() && stopped == end;
 }
 
-bool decodeBase64(std::string_view text, Secret& bytes) {
-  bytes.clear();
+bool decodeAnyBase64(std::string_view text, Secret& bytes) {
   while (!text.empty() && text.back() == '=') text.remove_suffix(1);
   Secret usual(text);
   std::replace(usual.data(), usual.data() + usual.size(), '.', '+');
   while (usual.size() % 4 != 0) usual.append('=');
-  const long expected = base64Bytes(usual.view());
-  if (expected <= 0) return expected == 0;
-  unsigned int length = 0;
-  unsigned char* decoded = base64ToBinaryBlob(usual.c_str(), &length);
-  if (decoded == nullptr) throw std::bad_alloc();
-  bytes.append({reinterpret_cast<const char*>(decoded), length});
-  explicit_bzero(decoded, length);
-  free(decoded);
-  return length == static_cast<unsigned long>(expected);
+  return decodeBase64(usual.view(), bytes);
 }
 
 bool decodeHex(std::string_view text, Secret& bytes) {
@@ -136,16 +127,9 @@ bool decodeHex(std::string_view text, Secret& bytes) {
   return true;
 }
 
-void appendBase64(const Secret& bytes, Secret& out) {
-  const auto* data = reinterpret_cast<const unsigned char*>(bytes.c_str());
-  const AllocatedText text(binaryBlobToBase64(data, static_cast<int>(bytes.size())));
-  if (!text) throw std::bad_alloc();
-  out.append(text.get());
-}
-
 void appendAdaptedBase64(const Secret& bytes, Secret& out) {
   const size_t before = out.size();
-  appendBase64(bytes, out);
+  appendBase64(bytes.view(), out);
   while (out.view().back() == '=') out.resize(out.size() - 1);
   std::replace(out.data() + before, out.data() + out.size(), '+', '.');
 }
@@ -163,8 +147,8 @@ bool parseScram(std::string_view payload, Pbkdf2Parts& parts) {
   if (payload.size() > kMaxPayload) return false;
   const std::string_view iterations = take(payload, ',');
   const std::string_view salt = take(payload, ',');
-  return parseNumber(iterations, parts.iterations) && parts.iterations > 0 && decodeBase64(salt, parts.salt) &&
-         decodeBase64(take(payload, ','), parts.hash);
+  return parseNumber(iterations, parts.iterations) && parts.iterations > 0 && decodeAnyBase64(salt, parts.salt) &&
+         decodeAnyBase64(take(payload, ','), parts.hash);
 }
 
 bool pbkdf2CostsAreBounded(std::uint32_t iterations, size_t hashBytes) noexcept {
@@ -182,7 +166,7 @@ bool parseArgon2(std::string_view payload, Argon2Parts& parts) {
                      parseSetting(take(payload, ','), "t=", parts.passes) &&
                      parseSetting(take(payload, '$'), "p=", parts.lanes);
   Secret bytes;
-  return costs && decodeBase64(take(payload, '$'), bytes) && bytes.size() >= 8 && decodeBase64(payload, bytes) &&
+  return costs && decodeAnyBase64(take(payload, '$'), bytes) && bytes.size() >= 8 && decodeAnyBase64(payload, bytes) &&
          bytes.size() >= 4;
 }
 

@@ -21,12 +21,11 @@ const char* argon2Problem(const PayloadRule& rule, std::string_view payload);
 bool parseNumber(std::string_view text, std::uint32_t& number) noexcept;
 
 // Bytes of base64 with or without padding, "." standing for "+" as some programs write it; false when it is none.
-bool decodeBase64(std::string_view text, Secret& bytes);
+bool decodeAnyBase64(std::string_view text, Secret& bytes);
 
 bool decodeHex(std::string_view text, Secret& bytes);
 
-// Base64, and without padding and with "." for "+".
-void appendBase64(const Secret& bytes, Secret& out);
+// Base64 without padding and with "." for "+".
 void appendAdaptedBase64(const Secret& bytes, Secret& out);
 
 // The parts of a PBKDF2 payload, decoded, in any of the spellings: iterations$salt$hash; Dovecot's

@@ -7,6 +7,7 @@
 #include <memory>
 #include <string>
 
+#include "base/base64.h"
 #include "base/random.h"
 #include "schemes/foreign_payloads.h"
 #include "schemes/hash_libraries.h"
@@ -111,7 +112,7 @@ Status openPlain(const StoredValue& value, const KeyRecord&, Secret& out) {
 }
 
 Status openBase64(const StoredValue& value, const KeyRecord&, Secret& out) {
-  return decodeBase64(value.payload(), out) ? Status{} : kNotComputed;
+  return decodeAnyBase64(value.payload(), out) ? Status{} : kNotComputed;
 }
 
 Status checkOpened(const StoredValue& value, const KeyRecord& key, const Secret& password) {
@@ -122,7 +123,7 @@ Status checkOpened(const StoredValue& value, const KeyRecord& key, const Secret&
 
 Status checkDigest(const StoredValue& value, const KeyRecord&, const Secret& password) {
   Secret stored;
-  if (!decodeBase64(value.payload(), stored)) return kNotComputed;
+  if (!decodeAnyBase64(value.payload(), stored)) return kNotComputed;
   const auto digestBytes = static_cast<size_t>(value.scheme().payload.least);
   Secret salted(password.view());
   salted.append(stored.view().substr(digestBytes));
@@ -194,7 +195,7 @@ Status makeSalted(const Scheme& scheme, const KeyRecord&, const Costs& costs, co
   digest.append(salt.view());
   out.clear();
   out.append(writtenTag(scheme));
-  appendBase64(digest, out);
+  appendBase64(digest.view(), out);
   return {};
 }
 

@@ -1,33 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "schemes/hash_libraries.h"
 
-#include <dlfcn.h>
-
-#include <cstring>
-#include <string>
-
-#include "base/failure.h"
+#include "base/loaded_library.h"
 
 namespace tool {
 namespace {
 
-class Library {
- public:
-  explicit Library(const char* name) : handle_(dlopen(name, RTLD_NOW | RTLD_LOCAL)) {}  // stays open
-
-  template <typename Function>
-  void resolve(const char* name, Function& function) const {
-    void* address = handle_ != nullptr ? dlsym(handle_, name) : nullptr;
-    if (address == nullptr) throw Failure(kInternal, std::string("the scheme cannot be computed: ") + dlerror());
-    memcpy(&function, &address, sizeof function);
-  }
-
- private:
-  void* handle_;
-};
+constexpr char kProblem[] = "the scheme cannot be computed";
 
 DigestLibrary openDigests() {
-  const Library library(LDAPPW_CRYPTO_SONAME);
+  const LoadedLibrary library(LDAPPW_CRYPTO_SONAME, kProblem);
   DigestLibrary functions{};
   library.resolve("EVP_get_digestbyname", functions.byName);
   library.resolve("EVP_Digest", functions.digest);
@@ -37,7 +19,7 @@ DigestLibrary openDigests() {
 }
 
 CryptLibrary openCrypt() {
-  const Library library(LDAPPW_CRYPT_SONAME);
+  const LoadedLibrary library(LDAPPW_CRYPT_SONAME, kProblem);
   CryptLibrary functions{};
   library.resolve("crypt_rn", functions.hash);
   library.resolve("crypt_gensalt_rn", functions.makeSetting);
@@ -45,7 +27,7 @@ CryptLibrary openCrypt() {
 }
 
 Argon2Library openArgon2() {
-  const Library library(LDAPPW_ARGON2_SONAME);
+  const LoadedLibrary library(LDAPPW_ARGON2_SONAME, kProblem);
   Argon2Library functions{};
   library.resolve("argon2_hash", functions.hash);
   library.resolve("argon2_verify", functions.verify);

@@ -4,8 +4,8 @@
 #include <algorithm>
 #include <iterator>
 
+#include "base/base64.h"
 #include "base/text.h"
-#include "encoding_utils.h"
 #include "schemes/schemes.h"
 
 namespace tool {
@@ -34,14 +34,9 @@ bool isLocked(std::string_view text, bool payload) {
 }
 
 Secret decoded(std::string_view base64) {
-  unsigned bytes = 0;
-  const Secret copy(base64);
-  unsigned char* blob = base64Bytes(base64) > 0 ? base64ToBinaryBlob(copy.c_str(), &bytes) : nullptr;
-  if (blob == nullptr) return Secret();
-  Secret out({reinterpret_cast<const char*>(blob), bytes});
-  explicit_bzero(blob, bytes);
-  free(blob);
-  return out;
+  Secret bytes;
+  decodeBase64(base64, bytes);
+  return bytes;
 }
 
 }  // namespace
