@@ -2,10 +2,14 @@
 // The plug-ins of directory servers without a server: what they share, and the built files in a host that stands in for
 // slapd and for 389. Each host runs in a process of its own, since a plug-in starts once.
 #include <dlfcn.h>
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <lber.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
+#include <atomic>
 #include <cstdarg>
 #include <cstring>
 #include <fstream>
@@ -19,6 +23,9 @@
 #include "passwords.h"
 
 namespace {
+
+const char* swappedIn = nullptr;  // takes the place of swappedOut as soon as an open file is looked at
+const char* swappedOut = nullptr;
 
 using plugin::kSchemes;
 using plugin::Scheme;
@@ -186,6 +193,35 @@ TEST(KeyFile, WhatTheLogSays) {
   }
 }
 
+// What comes into a key file's place while it is loaded is not what was looked at, and a file that claims to be a long
+// one is not read.
+TEST(KeyFile, IsOpenedOnceAndReadNoFurtherThanAKeyFileGoes) {
+  const std::string path = testing::TempDir() + "integrations.first";
+  const std::string other = testing::TempDir() + "integrations.second";
+  const std::string& good = keys().content;
+  std::ofstream(path, std::ios::binary) << good;
+  std::ofstream(other, std::ios::binary) << std::string(good).replace(good.size() - 84, 1, "X");
+  ASSERT_EQ(chmod(path.c_str(), 0600), 0);
+  swappedIn = other.c_str();
+  swappedOut = path.c_str();
+  plugin::KeyReport report;
+  AesKeyData* data = plugin::loadKeyFile(library(), path.c_str(), report);
+  ASSERT_EQ(swappedIn, nullptr);
+  ASSERT_STREQ(report.problem, "");
+  EXPECT_STREQ(reinterpret_cast<char*>(data->cryptoSalt.data), "0123456789ab");
+  library().freeKeys(data);
+
+  constexpr off_t kSparse = off_t{6} << 30;
+  std::ofstream(path, std::ios::binary) << "\xff\xff\xff\x6f";  // the length of a sync text
+  ASSERT_EQ(truncate(path.c_str(), kSparse), 0);
+  EXPECT_EQ(plugin::loadKeyFile(library(), path.c_str(), report), nullptr);
+  EXPECT_EQ(report.problem, "key file " + path + ": not a whole key stash file");
+  rusage used{};
+  ASSERT_EQ(getrusage(RUSAGE_SELF, &used), 0);
+  EXPECT_LT(used.ru_maxrss, 1 << 20);  // KiB
+  unlink(path.c_str());
+}
+
 // ---- slapd ----
 
 using Check = int(const berval*, const berval*, const berval*, const char**);
@@ -276,21 +312,40 @@ TEST(SlapdDeathTest, ServesWhatItsArgumentsSay) {
 constexpr int kArgv = 6, kArgc = 7, kClose = 210, kEncode = 800, kCompare = 802, kName = 810;  // of slapi-plugin.h
 std::map<int, void*> block;
 
-[[noreturn]] void run389(const char* entry, std::vector<std::string> arguments) {
+using EntryPoint = int (*)(void*);
+
+EntryPoint startEntry(void* handle, const char* entry, std::vector<char*>& argv) {
+  block[kArgv] = argv.data();
+  block[kArgc] = reinterpret_cast<void*>(argv.size());
+  if (reinterpret_cast<EntryPoint>(dlsym(handle, entry))(&block) != 0) std::exit(1);
+  return reinterpret_cast<EntryPoint>(block[kClose]);
+}
+
+// An entry that is named second is closed while values of the first are checked, as a server does that has been told to
+// disable it.
+[[noreturn]] void run389(const char* entry, std::vector<std::string> arguments, const char* disabled) {
   alarm(60);
   void* handle = openPlugin(LDAPPW_389_PLUGIN);
   std::vector<char*> argv;
   for (std::string& argument : arguments) argv.push_back(argument.data());
-  block[kArgv] = argv.data();
-  block[kArgc] = reinterpret_cast<void*>(argv.size());
-  if (reinterpret_cast<int (*)(void*)>(dlsym(handle, entry))(&block) != 0) std::exit(1);
+  const EntryPoint closeOther = disabled == nullptr ? nullptr : startEntry(handle, disabled, argv);
+  const EntryPoint close = startEntry(handle, entry, argv);
   char* value = reinterpret_cast<char* (*)(const char*)>(block[kEncode])("horse");
   const auto compare = reinterpret_cast<int (*)(const char*, const char*)>(block[kCompare]);
   const auto* name = static_cast<const char*>(block[kName]);
   const char* payload = value == nullptr ? "horse" : std::strchr(value, '}') + 1;
+  std::atomic<bool> ends{false};
+  std::atomic<int> checks{0};
+  std::thread user([&] {
+    for (; !ends; ++checks) compare("horse", payload);
+  });
+  while (checks < 10) std::this_thread::yield();
+  if (closeOther != nullptr) closeOther(&block);
   std::fprintf(stderr, "[%s %s %d %d]\n", name, value == nullptr ? "none" : std::string(value, 6).c_str(),
                compare("horse", payload), compare(payload, payload));
-  reinterpret_cast<int (*)(void*)>(block[kClose])(&block);
+  close(&block);
+  ends = true;
+  user.join();
   std::free(value);
   std::exit(0);
 }
@@ -303,6 +358,7 @@ TEST(DirectoryServer389DeathTest, EachEntryPointIsAScheme) {
     std::vector<std::string> arguments;
     int code;
     const char* said;
+    const char* disabled = nullptr;
   } rows[] = {
       {"ldappw_qveil_init", {}, 0, "^\\[qVEIL .qVEIL 0 -1\\]"},
       {"ldappw_aes128_init", {file}, 0, "^\\[AES128 .AES12 0 -1\\]"},
@@ -312,11 +368,12 @@ TEST(DirectoryServer389DeathTest, EachEntryPointIsAScheme) {
        {},
        0,
        "no key file is given \\(keys=FILE\\); no value of .AES256. (.|\n)*256 none -1 -1\\]"},
+      {"ldappw_aes256_init", {file}, 0, "^\\[AES256 .AES25 0 -1\\]", "ldappw_aes128_init"},
       {"ldappw_vldl_init", {}, 0, "VLDL.: values of this scheme cannot be made\n\\[VLDL none -1 -1\\]"},
       {"ldappw_aes256_init", {file, file}, 1, "unknown or repeated argument \"keys=/.*\"; there is keys=FILE"},
   };
   for (const auto& row : rows)
-    EXPECT_EXIT(run389(row.entry, row.arguments), testing::ExitedWithCode(row.code), row.said);
+    EXPECT_EXIT(run389(row.entry, row.arguments, row.disabled), testing::ExitedWithCode(row.code), row.said);
 }
 #endif
 
@@ -329,6 +386,11 @@ void print(const char* format, va_list arguments) {
 // What the servers give to their plug-ins.
 #pragma GCC visibility push(default)
 extern "C" {
+int fstat(int fd, struct stat* found) noexcept {
+  const int rc = fstatat(fd, "", found, AT_EMPTY_PATH);
+  if (swappedIn != nullptr && std::rename(swappedIn, swappedOut) == 0) swappedIn = nullptr;
+  return rc;
+}
 int lutil_passwd_add(berval* scheme, Check* check, Hash* hash) {
   registered.push_back({scheme, check, hash});
   return 0;

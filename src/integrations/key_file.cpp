@@ -7,7 +7,9 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdint>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 
 #include "secret_bytes.h"
@@ -17,6 +19,7 @@ namespace {
 
 constexpr char kDamaged[] = "not a whole key stash file";
 constexpr int kSaltType = 1;  // of validateCryptoString
+constexpr off_t kMostBytes = 1 << 16;  // far more than a stash file has
 constexpr mode_t kOthers = S_IRWXG | S_IRWXO;
 
 class Descriptor {
@@ -34,19 +37,43 @@ class Descriptor {
   int fd_;
 };
 
-// Why the file cannot be loaded, or null.
-const char* fileProblem(const char* path, KeyReport& report) noexcept {
-  const Descriptor file(path);
-  struct stat found {};
+// Why the open file cannot be read, or null.
+const char* fileProblem(const Descriptor& file, const char* path, struct stat& found, KeyReport& report) noexcept {
   if (file.get() < 0 || fstat(file.get(), &found) != 0) return std::strerror(errno);
   if (S_ISDIR(found.st_mode)) return std::strerror(EISDIR);
   if (!S_ISREG(found.st_mode)) return "not a regular file";
   if (found.st_size == 0) return "the file is empty";
+  if (found.st_size > kMostBytes) return kDamaged;
   if ((found.st_mode & kOthers) != 0) {
     std::snprintf(report.warning, sizeof report.warning,
                   "key file %s: open to other users (mode %04o); its mode should be 0600", path,
                   static_cast<unsigned>(found.st_mode & 07777U));
   }
+  return nullptr;
+}
+
+void fill(SecBuffer& buffer, std::string_view& from) noexcept {
+  std::memcpy(buffer.data, from.data(), buffer.length);
+  from.remove_prefix(buffer.length);
+}
+
+// Takes the content apart. The library's own reader takes a path: what is behind it then need not be what was looked at
+// here.
+const char* parse(const Library& library, std::string_view content, AesKeyData*& keys) noexcept {
+  if (library.makeKeys(&keys) != LDAPPW_SUCCESS) return std::strerror(ENOMEM);
+  std::uint32_t syncBytes = 0;
+  if (content.size() < sizeof syncBytes) return kDamaged;
+  std::memcpy(&syncBytes, content.data(), sizeof syncBytes);
+  content.remove_prefix(sizeof syncBytes);
+  std::uint64_t needed = std::uint64_t{syncBytes} + keys->cryptoSalt.length;
+  for (const SecBuffer& key : keys->aesKeys) needed += key.length;
+  if (content.size() < needed) return kDamaged;
+  keys->cryptoSync.data = static_cast<unsigned char*>(std::calloc(size_t{syncBytes} + 1, 1));
+  if (keys->cryptoSync.data == nullptr) return std::strerror(ENOMEM);
+  keys->cryptoSync.length = syncBytes;
+  fill(keys->cryptoSync, content);
+  fill(keys->cryptoSalt, content);
+  for (SecBuffer& key : keys->aesKeys) fill(key, content);
   return nullptr;
 }
 
@@ -72,10 +99,19 @@ bool looksWhole(const Library& library, const AesKeyData& keys) noexcept {
   return true;
 }
 
-const char* loadProblem(const Library& library, const char* path, AesKeyData*& keys) noexcept {
-  const int code = library.loadKeys(path, &keys);
-  if (code == LDAPPW_NO_MEMORY) return std::strerror(ENOMEM);
-  if (code != LDAPPW_SUCCESS || !looksWhole(library, *keys)) return kDamaged;
+// Why there are no keys in the file, or null. It is opened once, and no more is read than it had then.
+const char* loadProblem(const Library& library, const char* path, AesKeyData*& keys, KeyReport& report) noexcept {
+  const Descriptor file(path);
+  struct stat found {};
+  if (const char* problem = fileProblem(file, path, found, report)) return problem;
+  SecretBytes content(static_cast<size_t>(found.st_size));
+  if (!content) return std::strerror(ENOMEM);
+  const ssize_t bytes = read(file.get(), content.data(), content.size());
+  if (bytes < 0) return std::strerror(errno);
+  const std::string_view whole(content.data(), static_cast<size_t>(bytes));
+  if (const char* problem = parse(library, whole, keys)) return problem;
+  if (!looksWhole(library, *keys)) return kDamaged;
+  library.nameCiphers();
   void* provider = nullptr;
   return library.startProvider(&provider) == LDAPPW_SUCCESS ? nullptr : "the crypto provider cannot be loaded";
 }
@@ -88,8 +124,7 @@ AesKeyData* loadKeyFile(const Library& library, const char* path, KeyReport& rep
     return nullptr;
   }
   AesKeyData* keys = nullptr;
-  const char* problem = fileProblem(path, report);
-  if (problem == nullptr) problem = loadProblem(library, path, keys);
+  const char* problem = loadProblem(library, path, keys, report);
   if (problem == nullptr) return keys;
   library.freeKeys(keys);
   std::snprintf(report.problem, sizeof report.problem, "key file %s: %s", path, problem);

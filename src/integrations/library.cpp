@@ -24,8 +24,9 @@ bool openLibrary(Library& library, const char*& problem) noexcept {
                         resolve(handle, "format_password", library.formatPassword) &&
                         resolve(handle, "verify_password", library.verifyPassword) &&
                         resolve(handle, "_morva_utils_decode_binary", library.unmask) &&
-                        resolve(handle, "setAESKeyData", library.loadKeys) &&
+                        resolve(handle, "initAesKeyData", library.makeKeys) &&
                         resolve(handle, "freeAesKeyData", library.freeKeys) &&
+                        resolve(handle, "setCipherNameGlobal", library.nameCiphers) &&
                         resolve(handle, "validateCryptoString", library.validateText) &&
                         resolve(handle, "initQelCrypto", library.startProvider);
   if (!complete) {

@@ -16,8 +16,9 @@ struct Library {
   decltype(&format_password) formatPassword;
   decltype(&verify_password) verifyPassword;
   int (*unmask)(char* text, unsigned char** out, int* outLength);  // _morva_utils_decode_binary, which is overloaded
-  decltype(&setAESKeyData) loadKeys;
+  decltype(&initAesKeyData) makeKeys;
   decltype(&freeAesKeyData) freeKeys;
+  decltype(&setCipherNameGlobal) nameCiphers;
   decltype(&validateCryptoString) validateText;
   decltype(&initQelCrypto) startProvider;
 };

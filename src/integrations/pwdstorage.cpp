@@ -1,11 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 // The password storage plug-in of 389 Directory Server: one entry point a scheme. Its manual is ldappw-389(5).
+#include <pthread.h>
 #include <slapi-plugin.h>
 
 #include <cstdarg>
 #include <cstdio>
 #include <cstring>
 #include <string_view>
+#include <utility>
 
 #include "encoding_utils.h"
 #include "key_file.h"
@@ -31,15 +33,32 @@ char purpose[] = "Password storage schemes of ldappw";
 char apiVersion[] = SLAPI_PLUGIN_VERSION_01;
 char schemeNames[][7] = {"qVEIL", "AES128", "AES192", "AES256", "VLDL"};  // the tags without their braces
 
-// All of it is set by the entry points, before the server has threads, and only read from then on.
+// The library is opened by the first entry point, before the server has threads. The keys of a scheme are set by its
+// entry point and go when it is closed, which a running server does to an entry that is disabled.
 struct Server {
   bool opened = false;
   Library library{};
   AesKeyData* keys[kSchemeCount] = {};  // each entry has its own argument
+  pthread_rwlock_t keysLock = PTHREAD_RWLOCK_INITIALIZER;
 };
 Server server;
 
-// The server knows the scheme by the function alone, so each scheme has its own.
+// Keeps the keys where they are while they are used.
+class KeysInUse {
+ public:
+  KeysInUse() noexcept { pthread_rwlock_rdlock(&server.keysLock); }
+  ~KeysInUse() { pthread_rwlock_unlock(&server.keysLock); }
+  KeysInUse(const KeysInUse&) = delete;
+  KeysInUse& operator=(const KeysInUse&) = delete;
+};
+
+void replaceKeys(SchemeIndex index, AesKeyData* keys) noexcept {
+  pthread_rwlock_wrlock(&server.keysLock);
+  AesKeyData* const old = std::exchange(server.keys[index], keys);
+  pthread_rwlock_unlock(&server.keysLock);
+  server.library.freeKeys(old);
+}
+
 // One line in the server's error log.
 __attribute__((format(printf, 2, 3))) void report(int level, const char* format, ...) noexcept {
   static char whole[] = "%s\n";
@@ -51,9 +70,11 @@ __attribute__((format(printf, 2, 3))) void report(int level, const char* format,
   slapi_log_error(level, subsystem, whole, line);
 }
 
+// The server knows the scheme by the function alone, so each scheme has its own.
 template <SchemeIndex kIndex>
 int compare(const char* presented, const char* payload) noexcept {
   if (presented == nullptr || payload == nullptr) return kError;
+  const KeysInUse used;
   return matches(kSchemes[kIndex], {server.library, server.keys[kIndex], payload, presented}) ? kMatch : kError;
 }
 
@@ -66,6 +87,7 @@ char* encode(const char* clear) noexcept {
   const char* problem = "no password is given";
   char* value = nullptr;
   if (clear != nullptr) {
+    const KeysInUse used;
     value = makeValue(server.library, kSchemes[kIndex], server.keys[kIndex], clear, allocate, problem);
   }
   if (value == nullptr) report(SLAPI_LOG_ERR, "%s: %s", kSchemes[kIndex].tag, problem);
@@ -90,11 +112,12 @@ bool takeArguments(Slapi_PBlock* block, const char*& keyFile) noexcept {
 
 void takeKeys(SchemeIndex index, const char* keyFile) noexcept {
   KeyReport found;
-  server.keys[index] = loadKeyFile(server.library, keyFile, found);
-  if (server.keys[index] == nullptr) {
+  AesKeyData* const keys = loadKeyFile(server.library, keyFile, found);
+  if (keys == nullptr) {
     report(SLAPI_LOG_ERR, "%s; no value of %s will match", found.problem, kSchemes[index].tag);
   }
   if (found.warning[0] != '\0') report(SLAPI_LOG_WARNING, "%s", found.warning);
+  replaceKeys(index, keys);
 }
 
 bool openOnce() noexcept {
@@ -104,11 +127,9 @@ bool openOnce() noexcept {
   return server.opened;
 }
 
-int closeAll(Slapi_PBlock* /*block*/) noexcept {
-  for (AesKeyData*& keys : server.keys) {
-    server.library.freeKeys(keys);
-    keys = nullptr;
-  }
+template <SchemeIndex kIndex>
+int closeScheme(Slapi_PBlock* /*block*/) noexcept {
+  replaceKeys(kIndex, nullptr);
   return kMatch;
 }
 
@@ -131,7 +152,7 @@ int start(Slapi_PBlock* block) noexcept {
   } parameters[] = {
       {SLAPI_PLUGIN_VERSION, apiVersion},
       {SLAPI_PLUGIN_DESCRIPTION, &description},
-      {SLAPI_PLUGIN_CLOSE_FN, asAddress(closeAll)},
+      {SLAPI_PLUGIN_CLOSE_FN, asAddress(closeScheme<kIndex>)},
       {SLAPI_PLUGIN_PWD_STORAGE_SCHEME_CMP_FN, asAddress(compare<kIndex>)},
       {SLAPI_PLUGIN_PWD_STORAGE_SCHEME_ENC_FN, asAddress(encode<kIndex>)},
       {SLAPI_PLUGIN_PWD_STORAGE_SCHEME_NAME, schemeNames[kIndex]},

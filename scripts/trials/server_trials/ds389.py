@@ -4,6 +4,7 @@ import os
 import pathlib
 import re
 import shutil
+import threading
 
 import client
 from common import (INSTALLED, LDAPPW, NOBODY, OWN, ROOT, SUFFIX, TOP, Server, bad_key_files, make_value, one_person,
@@ -170,6 +171,39 @@ def key_files(trials, folder, keys, short):
         print("\n".join(f"   ldappw-pwdstorage - {text}" for text in server.lines()[:1]))
 
 
+def disabled_entry(trials, folder, keys):
+    """A running server closes the plug-in of an entry that is disabled, while others bind under the other entries."""
+    schemes, password = ("aes128", "aes192", "aes256"), b"correct horse"
+    server = Server389(folder, folder / "server.stash")
+    trials.step("389: one entry disabled and enabled again while users bind", server.log)
+    server.load(TOP, *(one_person(scheme, make_value(scheme, password.decode(), keys)) for scheme in schemes))
+    codes, ends = [], threading.Event()
+
+    def bind_on():
+        with client.Connection(PORT) as user:
+            while not ends.is_set():
+                codes.append(user.bind(f"uid=aes256,{SUFFIX}", password))
+
+    with server, manager() as admin:
+        for attribute, value in ((b"nsslapd-enable-upgrade-hash", b"off"), (b"nsslapd-dynamic-plugins", b"on")):
+            trials.equal(admin.change("cn=config", attribute.decode(), value)[0], client.OK, f"{attribute} set")
+        threads = [threading.Thread(target=bind_on) for _ in range(4)]
+        for thread in threads:
+            thread.start()
+        for state in (b"off", b"on") * 3:
+            entry = "cn=AES128,cn=Password Storage Schemes,cn=plugins,cn=config"
+            trials.equal(admin.change(entry, "nsslapd-pluginEnabled", state)[0], client.OK, f"AES128 {state}")
+            for scheme in schemes[state == b"off":]:
+                trials.equal(client.bind(PORT, f"uid={scheme},{SUFFIX}", password), client.OK,
+                             f"{scheme} while AES128 is {state}")
+        ends.set()
+        for thread in threads:
+            thread.join()
+        trials.check(len(codes) > 100 and set(codes) == {client.OK}, f"{len(codes)} binds: {set(codes)}")
+        trials.equal(server.stop(), 0, "exit code")
+    trials.equal(server.lines(), [], "log lines")
+
+
 def refusals(trials, folder):
     server = Server389(folder, "/none")
     trials.step("389: an unknown argument", server.log)
@@ -188,5 +222,6 @@ def trials_of_389(trials, folder, keys, short):
     added_over_ldap(trials, folder, keys)
     if INSTALLED:
         return
+    disabled_entry(trials, folder, keys)
     key_files(trials, folder, keys, short)
     refusals(trials, folder)
