@@ -27,7 +27,8 @@ aes=$("$tool" format --scheme aes256 --keys dir <<<teatime99)
   printf 'dn: uid=eve,ou=Ops,dc=example,dc=org\nobjectClass: account\n\n'
   printf 'dn: uid=ida,ou=Ops,dc=example,dc=org\nuserPassword:\n\n'
   printf 'dn: uid=eve,ou=Ops,dc=example,dc=org\nchangetype: modify\nreplace: uid\nuid: eve\n-\n\n'
-  printf 'dn:: %s\n' "$(printf 'uid=<script>\33[1m\377@style@"&\342\200\256,ou=</td>,dc=example,dc=org' | b64)"
+  printf 'dn:: %s\n' "$(printf 'uid=<script>\33[1m\377@style@"&\342\200\256\330\234\342\200\213,%s' \
+    'ou=</td>,dc=example,dc=org' | b64)"
   printf 'userPassword%s\n' ':: *' ': {sha}broken' ': {X-teatime}99' ':< file:///x'; echo
 } >export
 printf 'letmein77\r\nhunter2xyz\n\n' >bad
@@ -86,7 +87,7 @@ test_text_and_page() {
   unshown text
   LC_ALL=C grep -qaE '[[:cntrl:]]|and 0 more' <(tr -d '\n' <out) && fail 'text: control characters, or a rest of none'
   same 'mode of a page' 600 "$(mode page)"
-  grep -qF 'uid=&lt;script&gt;\x1B[1m\xFF@style@&quot;&amp;\u202E,ou=&lt;/td&gt;,dc=example' page ||
+  grep -qF 'uid=&lt;script&gt;\x1B[1m\xFF@style@&quot;&amp;\u202E\u061C\u200B,ou=&lt;/td&gt;,dc=example' page ||
     fail 'page: the hostile DN is not there as text'
   python3 - page <<'PAGE' || fail 'page: markup'
 import base64, hashlib, html.parser, sys

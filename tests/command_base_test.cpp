@@ -3,6 +3,8 @@
 #include <zlib.h>
 #include <zstd.h>
 
+#include <ctime>
+
 #include "base/input.h"
 #include "base/text.h"
 #include "command.h"
@@ -33,7 +35,7 @@ TEST(LineReader, SplitsWhateverComesIn) {
   const TempFolder folder;
   for (const Lines& row : kLines) {
     putFile(folder.file("in"), row.input);
-    tool::LineReader reader(tool::Input(folder.file("in")), row.end);
+    tool::LineReader reader(tool::Input(folder.file("in")), {kLong.size(), "a test"}, row.end);
     EXPECT_FALSE(reader.lineBuffered());
     Secret line;
     for (size_t i = 0; i < row.lines.size(); ++i) {
@@ -45,6 +47,31 @@ TEST(LineReader, SplitsWhateverComesIn) {
     EXPECT_FALSE(reader.next(line) || reader.next(line));
     EXPECT_TRUE(line.empty() && reader.lineBuffered());
   }
+}
+
+// What no line ends is not gathered, wherever the limit lies in what is read at once.
+TEST(LineReader, EndsAtItsLimit) {
+  const TempFolder folder;
+  const std::string path = folder.file("in");
+  for (const size_t most : {size_t{0}, size_t{12}, size_t{65535}, size_t{65536}, size_t{150000}}) {
+    for (const char* end : {"", "\n", "\nmore"}) {
+      putFile(path, "\n" + std::string(most, 'x') + "\n" + std::string(most + 1, 'x') + end);
+      tool::LineReader reader(tool::Input(path), {most, "a test"});
+      Secret line;
+      ASSERT_TRUE(reader.next(line) && reader.next(line));
+      EXPECT_EQ(line.size(), most);
+      try {
+        reader.next(line);
+        ADD_FAILURE() << most;
+      } catch (const Failure& failure) {
+        EXPECT_EQ(failure.what(),
+                  path + ", line 3: more than the " + std::to_string(most) + " bytes that a test may have");
+      }
+    }
+  }
+  tool::LineReader endless(tool::Input("/dev/zero"), tool::kSeedLine);
+  Secret line;
+  EXPECT_THROW(endless.next(line), Failure);
 }
 
 std::string gzip(const std::string& bytes) {
@@ -99,7 +126,23 @@ TEST(Decompression, AnyLengthAndAnyCut) {
   }
 }
 
-// What a terminal may be shown: well-formed UTF-8 (RFC 3629) as it is, all else as \xNN.
+// A member or frame with nothing in it costs its own bytes, not a buffer.
+TEST(Decompression, NothingInAMember) {
+  const auto spent = [](const std::string& packed, size_t bytes) {
+    const std::clock_t before = std::clock();
+    EXPECT_EQ(readFrom(packed).size(), bytes);
+    return std::clock() - before + 1;
+  };
+  for (const auto& pack : {gzip, zstd}) {
+    const std::string one = pack("");
+    std::string empty;
+    for (int i = 0; i < 32768; ++i) empty += one;
+    const std::string text(size_t{1} << 22, 'x');
+    EXPECT_LE(spent(pack("dn: a\n") + empty + pack("cn: a\n"), 12), 5 * spent(pack(text), text.size()));
+  }
+}
+
+// What a reader may be shown: well-formed UTF-8 (RFC 3629) as it is but for what is not seen; all else as \xNN.
 TEST(Text, Printable) {
   const std::pair<std::string, std::string> rows[] = {
       {"", ""},
@@ -118,7 +161,15 @@ TEST(Text, Printable) {
     EXPECT_EQ(tool::printable(text), shown);
     EXPECT_EQ(tool::looksLikeText(text), shown == text) << shown;
   }
-  EXPECT_EQ(tool::printable("\xc2\x80\xc2\x9f"), "\\xC2\\x80\\xC2\\x9F");
+  const std::pair<std::string, std::string> unseen[] = {
+      {"\xc2\x80\xc2\x9f\xc2\xad", "\\u0080\\u009F\\u00AD"},
+      {"a\xd8\x9c\xd8\x9b", "a\\u061C\xd8\x9b"},  // turns the direction
+      {"\xe2\x80\x8a\xe2\x80\x8b\xe2\x80\x8f\xe2\x80\x90", "\xe2\x80\x8a\\u200B\\u200F\xe2\x80\x90"},  // no width
+      {"\xe2\x80\xa7\xe2\x80\xa8\xe2\x80\xae\xe2\x80\xaf", "\xe2\x80\xa7\\u2028\\u202E\xe2\x80\xaf"},
+      {"\xe2\x81\xa6\xe2\x81\xa9\xef\xbb\xbf\xe3\x85\xa4", "\\u2066\\u2069\\uFEFF\\u3164"},
+      {"\xf3\xa0\x81\x81\xf3\xa0\xbf\xbf\xf3\xa1\x80\x80", "\\uE0041\\uE0FFF\xf3\xa1\x80\x80"},
+  };
+  for (const auto& [text, shown] : unseen) EXPECT_EQ(tool::printable(text), shown);
   EXPECT_TRUE(tool::looksLikeText("\xc2\x80\xc2\x9f"));  // of control characters those of one byte count
 }
 
@@ -143,9 +194,9 @@ TEST(Costs, AreBounded) {
   }
   EXPECT_TRUE(tool::pbkdf2CostsAreBounded(10000000, 32) && tool::pbkdf2CostsAreBounded(20000000, 20));
   EXPECT_FALSE(tool::pbkdf2CostsAreBounded(10000001, 32) || tool::pbkdf2CostsAreBounded(20000001, 20));
-  EXPECT_TRUE(tool::argon2CostsAreBounded({1048576, 16, 64}) && tool::argon2CostsAreBounded({65536, 256, 1}));
-  EXPECT_FALSE(tool::argon2CostsAreBounded({1048577, 1, 1}) || tool::argon2CostsAreBounded({1048576, 17, 1}));
-  EXPECT_FALSE(tool::argon2CostsAreBounded({64, 1, 65}) || tool::argon2CostsAreBounded({65536, 257, 1}));
+  EXPECT_TRUE(tool::argon2CostsAreBounded({1048576, 4, 64}) && tool::argon2CostsAreBounded({65536, 64, 1}));
+  EXPECT_FALSE(tool::argon2CostsAreBounded({1048577, 1, 1}) || tool::argon2CostsAreBounded({1048576, 5, 1}));
+  EXPECT_FALSE(tool::argon2CostsAreBounded({64, 1, 65}) || tool::argon2CostsAreBounded({65536, 65, 1}));
 }
 
 }  // namespace

@@ -1,6 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 // Directory exports: conversions to the byte, the readers that they stand on, and resuming what was stopped.
+#include <fcntl.h>
+#include <sys/resource.h>
+
 #include <algorithm>
+#include <ctime>
 
 #include "command.h"
 #include "ldif/key_ring.h"
@@ -157,6 +161,106 @@ TEST_F(Folder, FindingsAndAttributesHaveLimits) {
   std::vector<std::string> arguments(65, "--attribute=a");
   arguments.insert(arguments.begin(), {"ldif", "--to", "sha", folder.file("in")});
   EXPECT_TRUE(matches(ran(arguments).err, "more than 64 attributes"));
+}
+
+// ---- Exports of somebody who wants the command to fail or to be blind ----
+
+std::string repeated(const char* line, size_t times) {
+  std::string text;
+  for (size_t i = 0; i < times; ++i) {
+    const std::string once = line;
+    const size_t place = once.find('%');
+    text += once.substr(0, place);
+    if (place != std::string::npos) text += std::to_string(i) + once.substr(place + 1);
+  }
+  return text;
+}
+
+struct Growth {
+  const char* name;
+  size_t longDn;      // so many bytes a line
+  const char* lines;  // one after the other, each with its number
+  const char* batch;  // likewise
+  const char* arguments;
+  size_t times;
+};
+const Growth kGrowth[] = {
+    {"equal values in changes", 0, "userPassword: p%\nuserPassword: p%\n", "", "ldif --to sha --changes in", 2500},
+    {"equal values in an export", 0, "userPassword: p%\nuserPassword: p%\n", "", "ldif --to sha in", 2500},
+    {"names and passwords", 0, "cn: p%x\nuserPassword: q%x\n", "", "audit in", 3000},
+    {"names and hashes", 0, "cn: p%\nuserPassword: {SMD5}wMhWRf3bkgrQqmBHRrz4CR5dBtQ=\n", "", "audit --check-hashes in",
+     500},
+    {"passwords for one entry", 0, "userPassword: p%\n", "cn=a\tq%\n", "verify --clear --batch batch --ldif in", 500},
+    {"lines below a long dn", 1, "cn: b\n", "", "audit in", 16000},
+    {"values below a long dn", 1, "userPassword: {SHA}5en6G6MezRroT3XKqkdPOmY/BfQ=\n", "cn=a\tq%\n",
+     "verify --batch batch --ldif in", 4000},
+};
+
+// Four times the input may take seven times as long; what looks at each pair takes sixteen times.
+TEST(HostileExports, CostGrowsWithTheInputAndNoFaster) {
+  const TempFolder folder;
+  std::filesystem::current_path(folder.file("."));
+  for (const Growth& row : kGrowth) {
+    const auto spent = [&](size_t times) {
+      putFile("in", "dn: cn=a" + std::string(row.longDn * times, 'x') + "\n" + repeated(row.lines, times));
+      putFile("batch", repeated(row.batch, times));
+      const std::clock_t before = std::clock();
+      ran(wordsOf(row.arguments, {}));
+      return std::clock() - before + CLOCKS_PER_SEC / 100;
+    };
+    EXPECT_LE(spent(4 * row.times), 7 * spent(row.times)) << row.name;
+  }
+  std::filesystem::current_path("/");
+}
+
+// The output of one entry can be thousands of times the entry, and so can what is said of it.
+[[noreturn]] void runInLittleMemory(const std::string& line, const std::vector<std::string>& arguments) {
+  putFile("in", "dn: cn=" + std::string(60000, 'x') + "\n" + repeated(line.c_str(), 6000));
+  const int null = open("/dev/null", O_RDWR);
+  dup2(null, STDOUT_FILENO);
+  const int answer = dup(STDERR_FILENO);
+  dup2(null, STDERR_FILENO);
+  std::vector<char*> pointers;
+  for (const std::string& argument : arguments) pointers.push_back(const_cast<char*>(argument.c_str()));
+  pointers.push_back(nullptr);
+  const int code = tool::runCommand(static_cast<int>(arguments.size()), pointers.data());
+  rusage used{};
+  getrusage(RUSAGE_SELF, &used);
+  dprintf(answer, "code %d, %s memory\n", code, used.ru_maxrss < 200 * 1024 ? "little" : "much");
+  _exit(0);
+}
+
+TEST(HostileExportsDeathTest, MemoryIsBounded) {
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+  GTEST_SKIP() << "what was released is kept by the sanitizer";
+#endif
+  testing::FLAGS_gtest_death_test_style = "threadsafe";
+  const TempFolder folder;
+  std::filesystem::current_path(folder.file("."));
+  EXPECT_EXIT(runInLittleMemory("userPassword: p%\n", {"ldappw", "ldif", "--to", "sha", "--changes", "in"}),
+              testing::ExitedWithCode(0), "code 0, little memory");
+  EXPECT_EXIT(runInLittleMemory("userPassword: {X}%\n", {"ldappw", "ldif", "--to", "sha", "in"}),
+              testing::ExitedWithCode(0), "code 3, little memory");
+  EXPECT_EXIT(runInLittleMemory("userPassword: p%\n", {"ldappw", "ldif", "--audit", "--verbose", "in"}),
+              testing::ExitedWithCode(0), "code 0, little memory");
+  std::filesystem::current_path("/");
+}
+
+TEST_F(Folder, LongDns) {
+  const TempFolder folder;
+  const std::string in = folder.file("in");
+  const std::string longest(65536, 'x');
+  putFile(in, "dn: " + longest + "\nuserPassword: {X}\n");
+  const Ran most = ran({"ldif", "--to", "sha", in});
+  EXPECT_TRUE(most.code == 3 && most.err.size() < 1500) << most.err;
+  putFile(in, "dn: " + longest + "x\nuserPassword: {X}\n");
+  EXPECT_TRUE(matches(ran({"ldif", "--to", "sha", in}).err, "^ldappw: the dn in line 1 is longer than 64 KiB\n"));
+  // Entries that begin alike are two, and have one password.
+  const std::string begin = "dn: cn=" + std::string(600, 'x');
+  putFile(in, begin + "1\nuserPassword: secret\n\n" + begin + "2\nuserPassword: secret\n");
+  EXPECT_TRUE(matches(ran({"audit", in}).out, "finding: reused: 2\n"));
+  putFile(in, begin + "1\nuserPassword: secret\n\n" + begin + "1\nuserPassword: secret\n");
+  EXPECT_FALSE(matches(ran({"audit", in}).out, "finding: reused"));
 }
 
 }  // namespace

@@ -60,6 +60,17 @@ test_short_audit() {
   grep -qE '^subtree|dc=' out && fail 'audit as text has more than counts'
 }
 
+# The next run names what is left, and not what another one is writing to.
+left_by_killed() {
+  echo >.old.AbCd12; flock --no-fork .old.AbCd12 sleep 600 &
+  local holder=$!
+  until_true grep -q " $holder " /proc/locks
+  run 'after a run that was killed' 0 ldif --to sha --in kept --out old --force
+  same 'after a run that was killed' 1 "$(grep -c 'warning: a run that was ended has left .*/[.]old[.]......$' err)"
+  kill $holder; cp kept old; rm .old.*
+}
+
+
 # Output files: refused or replaced, and never in part.
 test_output_files() {
   local signal writer command rc list
@@ -81,7 +92,7 @@ test_output_files() {
     kill -"$signal" $command; wait $command 2>/dev/null; rc=$?
     same "$signal: exit code" $((128 + $(kill -l "$signal"))) $rc
     kill $writer 2>/dev/null
-    [[ $signal != KILL ]] || rm .old.*  # nothing can tidy up after that
+    [[ $signal != KILL ]] || left_by_killed  # nothing can tidy up after that
     compgen -G '.old.*' && fail "$signal: a temporary file is left"
   done
   exec 9>&-

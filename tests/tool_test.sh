@@ -44,6 +44,7 @@ test_stash_files() {
 }
 
 preload() { HELD_SYNC=$1 LD_PRELOAD=$held ASAN_OPTIONS=${ASAN_OPTIONS:-}:verify_asan_link_order=0 "${@:2}"; }
+isWaiting() { [[ $(ps -o comm=,stat= "$1") == ldappw*S* ]]; }
 isStopped() { [[ $(ps -o stat= "$1") != [!T]* ]]; }
 
 # A run that is stopped when both temporary files are complete: whatever ends it, the stash files stay what they were.
@@ -84,10 +85,11 @@ test_runs_one_after_the_other() {
     "$(syncOf pair.cfg) $(syncOf pair)"
   same 'the files of the first run' "$(sed -n 's/.* sync: //p' first | xargs)" \
     "$(syncOf pair.cfg.bak) $(syncOf pair.bak)"
-  cp pair .pair.AbCd12; echo >.pair.AbCd13; cp pair pair.now
+  cp pair .pair.AbCd12; echo >.pair.AbCd13; mkfifo .pair.AbCd14; cp pair pair.now
   run 'a third run' 0 keys create --directory pair --force --seed-file seed
   said 'a third run' 'warning: a run.* has left .*/.pair.AbCd12, a whole stash file with the sync text '
   said 'a third run' 'AbCd13, no whole stash file'
+  said 'a third run, a pipe' 'has left .*/.pair.AbCd14$'; rm .pair.AbCd14
   said 'a third run' 'kept as [^ ]*/pair.bak2'; sameFile 'a third run' pair.now pair.bak2
   run 'the same again' 0 keys restore pair --force --seed-file seed --salt-file <(tail -c 84 pair | head -c 12)
   same 'the same again' '' "$(grep kept err)$(compgen -G 'pair.bak3')"
@@ -104,6 +106,31 @@ test_runs_one_after_the_other() {
   until_true isStopped $pid
   echo mine >late; kill -CONT $pid; wait $pid
   same 'a file that appears meanwhile is not replaced' '2 mine' "$? $(<late)"
+}
+
+# Others who may write to the folder, or read it, or the memory of processes of their own.
+test_other_users() {
+  echo mine >victim
+  preload swap "$tool" keys restore swapped --seed-file seed --salt-file salt >/dev/null 2>err
+  same 'a temporary file that is swapped' '5 mine' "$? $(<victim)"
+  said 'a temporary file that is swapped' 'swapped is not the file that was written: somebody else writes to its folder'
+  flock --no-fork "$work" sleep 600 &
+  local holder=$!
+  until_true grep -q " $holder " /proc/locks
+  timeout 60 "$tool" keys restore locked --seed-file seed --salt-file salt >out 2>err
+  same 'a folder that is locked' 5 $?
+  kill $holder
+  said 'a folder that is locked' "^ldappw: $work is locked by process $holder \(sleep\); nothing was written"
+  [ $UID = 0 ] || return
+  ln -s victim theirs; chown -h daemon theirs
+  run "another user's link" 5 keys restore theirs --force --seed-file seed --salt-file salt
+  same "another user's link" mine "$(<victim)"
+  # Root owns the memory, as the kernel shows it, of a process that is not to be dumped.
+  chmod 711 .
+  coproc setpriv --reuid=65534 --clear-groups "$tool" identify 2>/dev/null
+  until_true isWaiting $COPROC_PID
+  same 'no dump' 0 "$(stat -c %u /proc/$COPROC_PID/mem)"
+  eval "exec ${COPROC[1]}>&-"; wait
 }
 
 test_input_and_output() {

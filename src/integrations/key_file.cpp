@@ -18,7 +18,7 @@ namespace plugin {
 namespace {
 
 constexpr char kDamaged[] = "not a whole key stash file";
-constexpr int kSaltType = 1;  // of validateCryptoString
+constexpr int kSaltType = 1;           // of validateCryptoString
 constexpr off_t kMostBytes = 1 << 16;  // far more than a stash file has
 constexpr mode_t kOthers = S_IRWXG | S_IRWXO;
 

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // The ldappw command: what a process needs before its command line is read.
 #include <fcntl.h>
+#include <sys/prctl.h>
 #include <sys/resource.h>
 #include <unistd.h>
 
@@ -44,6 +45,7 @@ void prepareProcess([[maybe_unused]] char** argv) {
   signal(SIGXFSZ, SIG_IGN);  // a file that grows too large is an error like a full disk
   const struct rlimit noCore {};
   setrlimit(RLIMIT_CORE, &noCore);  // a core file would hold passwords and keys
+  prctl(PR_SET_DUMPABLE, 0);        // nor is it to reach a program that takes core files from the kernel
 }
 
 }  // namespace

@@ -2,9 +2,12 @@
 #include "audit/collector.h"
 
 #include <algorithm>
+#include <cstdio>
+#include <new>
 
 #include "base/input.h"
 #include "base/text.h"
+#include "schemes/foreign_values.h"
 #include "schemes/schemes.h"
 #include "schemes/values.h"
 
@@ -28,9 +31,11 @@ bool isHistory(std::string_view type) noexcept {
   return sameName(type, "pwdHistory") || sameName(type, "passwordHistory");
 }
 
-std::string keptDn(const std::string& dn) {
-  if (dn.empty()) return "(no dn)";
-  return dn.size() <= kMostDnBytes ? dn : dn.substr(0, kMostDnBytes - 3) + "...";
+Secret lowered(std::string_view text) {
+  Secret low(text);
+  std::transform(text.begin(), text.end(), low.data(),
+                 [](char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c; });
+  return low;
 }
 
 // The last RDNs of what an entry is in; equal for names that differ in case and in blanks behind commas.
@@ -94,7 +99,7 @@ std::vector<std::string> auditedNames() {
 }
 
 void AuditRules::loadKnownBad(const std::string& path) {
-  LineReader passwords{Input(path)};
+  LineReader passwords{Input(path), kPasswordLine};
   Sha256 sha256;
   Secret line;
   while (passwords.next(line)) {
@@ -120,8 +125,8 @@ Facts Collector::collect(RecordWalker& walker) {
 }
 
 void Collector::takeLine(const RecordWalker& walker) {
+  if (!inEntry_) entry_.dn = walker.dn();
   inEntry_ = true;
-  entry_.dn = walker.dn();
   const PasswordLine& line = walker.password();
   const std::string_view description = line.description;
   const std::string_view type = trimSpaces(description.substr(0, description.find(';')));
@@ -152,17 +157,19 @@ void Collector::finishEntry() {
   subtree.entries = 1;
   const std::string name = nameInDn(entry_.dn);
   if (!name.empty()) entry_.names.emplace_back(name);
+  for (const Secret& one : entry_.names) entry_.lowNames.insert(lowered(one.view()));
   for (const StoredLine& line : entry_.lines) {
     const Verdict verdict = judgeLine(line, subtree);
     keepFirst(firstProblem_, textOf(verdict.condition).code);
-    appendLine(rules_.lines, entry_.dn, line, verdict, out_);
+    appendLine(rules_.lines, entry_.dn, line, verdict, part_.out);
+    part_.spill();
   }
   if (entry_.account && !entry_.hasPassword) found(Finding::kNoPassword);
   if (entry_.account || entry_.hasPassword) {
     ++facts_.accounts;
     facts_.subtrees[subtreeOf(entry_.dn, rules_.subtreeDepth)].add(subtree);
   }
-  const std::string dn = entry_.findings.any() ? keptDn(entry_.dn) : "";
+  const std::string dn = entry_.findings.any() ? keptDn() : "";
   for (size_t i = 0; i < kFindingCount; ++i) {
     if (entry_.findings.test(i)) facts_.findings[i].note(dn, rules_.listed);
   }
@@ -243,22 +250,51 @@ Condition Collector::judgeCurrent(const Examined& value) {
 
 void Collector::judgePassword(std::string_view password) {
   if (password.empty()) return found(Finding::kEmpty);
-  const auto isName = [&](const Secret& name) { return sameName(name.view(), password); };
-  if (std::any_of(entry_.names.begin(), entry_.names.end(), isName)) found(Finding::kName);
+  if (entry_.lowNames.count(lowered(password)) > 0) found(Finding::kName);
   const Mark mark = rules_.markKey.of(sha256_, MarkKind::kPassword, password);
   if (std::binary_search(rules_.knownBad.begin(), rules_.knownBad.end(), mark)) found(Finding::kKnownBad);
   sight(mark);
 }
 
+// A value that cannot be checked may hide any password: one changed number in it is enough for that.
+bool Collector::matches(const Examined& value, const Secret& password) {
+  if (password.view().find('\0') != std::string_view::npos) return false;
+  const char* impossible = crypt3PasswordProblem(password.view());
+  Status status{kInternal, ""};
+  try {
+    status = checkValue(value, KeyRecord(), password);  // one-way values need no keys
+  } catch (const Failure&) {
+    // There is no library for it.
+  } catch (const std::bad_alloc&) {
+    // There is no memory for it.
+  }
+  const bool answered = status.code <= kNoMatch || (impossible != nullptr && status.text == std::string(impossible));
+  if (!answered) found(Finding::kUnchecked);
+  return status.ok();
+}
+
 void Collector::tryNames(const Examined& value) {
-  const KeyRecord none;  // one-way values need no keys
-  const auto matches = [&](const Secret& password) { return checkValue(value, none, password).ok(); };
-  if (std::any_of(entry_.names.begin(), entry_.names.end(), matches)) found(Finding::kName);
-  if (std::any_of(rules_.tried.begin(), rules_.tried.end(), matches)) found(Finding::kKnownBad);
+  constexpr size_t kMostNames = 32;  // tried: an entry with many of both would take names times values
+  const auto last = entry_.names.begin() + static_cast<std::ptrdiff_t>(std::min(entry_.names.size(), kMostNames));
+  const auto isMatch = [&](const Secret& password) { return matches(value, password); };
+  if (std::any_of(entry_.names.begin(), last, isMatch)) found(Finding::kName);
+  if (last != entry_.names.end()) found(Finding::kUnchecked);
+  if (std::any_of(rules_.tried.begin(), rules_.tried.end(), isMatch)) found(Finding::kKnownBad);
+}
+
+// A long DN is kept by its beginning and a digest: entries that begin alike would be one otherwise.
+std::string Collector::keptDn() {
+  constexpr size_t kDigestBytes = 16;
+  if (entry_.dn.empty()) return "(no dn)";
+  if (entry_.dn.size() <= kMostDnBytes) return entry_.dn;
+  char hex[2 * kDigestBytes + 1];
+  const Sha256::Digest digest = sha256_.of({entry_.dn});
+  for (size_t i = 0; i < kDigestBytes; ++i) snprintf(hex + 2 * i, 3, "%02x", static_cast<unsigned>(digest[i]));
+  return entry_.dn.substr(0, kMostDnBytes - 2 * sizeof hex) + "... (SHA-256 " + hex + ")";
 }
 
 void Collector::sight(const Mark& mark) {
-  if (!holds_) facts_.holders.push_back(keptDn(entry_.dn));
+  if (!holds_) facts_.holders.push_back(keptDn());
   holds_ = true;
   facts_.sightings.push_back({mark, facts_.holders.size() - 1});
 }

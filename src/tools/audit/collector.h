@@ -3,12 +3,14 @@
 #pragma once
 
 #include <bitset>
+#include <set>
 #include <string>
 #include <vector>
 
 #include "audit/facts.h"
 #include "audit/lines.h"
 #include "audit/marks.h"
+#include "ldif/export_run.h"
 #include "ldif/key_ring.h"
 #include "ldif/record.h"
 #include "schemes/examine.h"
@@ -38,8 +40,8 @@ std::vector<std::string> auditedNames();
 
 class Collector {
  public:
-  // The lines that the rules ask for are appended to out.
-  Collector(const AuditRules& rules, Secret& out) : rules_(rules), out_(out) {}
+  // The lines that the rules ask for are appended to the output of the part.
+  Collector(const AuditRules& rules, ExportPart& part) : rules_(rules), part_(part) {}
 
   Facts collect(RecordWalker& walker);
   // The code of the first value that is not fine.
@@ -48,7 +50,8 @@ class Collector {
  private:
   struct Entry {
     std::string dn;
-    std::vector<Secret> names;  // uid and cn
+    std::vector<Secret> names;           // uid and cn
+    std::set<Secret, ByBytes> lowNames;  // the same in lower case
     std::vector<StoredLine> lines;
     bool account = false;
     bool hasPassword = false;  // some are not at hand: behind a URL, or on a line that is not well formed
@@ -64,11 +67,13 @@ class Collector {
   Condition open(const Examined& value, Secret& password) const;
   void judgePassword(std::string_view password);
   void tryNames(const Examined& value);
+  bool matches(const Examined& value, const Secret& password);
+  std::string keptDn();
   void found(Finding finding) { entry_.findings.set(static_cast<size_t>(finding)); }
   void sight(const Mark& mark);
 
   const AuditRules& rules_;
-  Secret& out_;
+  ExportPart& part_;
   Facts facts_;
   Sha256 sha256_;
   Entry entry_;

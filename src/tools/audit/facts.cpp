@@ -47,6 +47,8 @@ const FindingText kFindings[] = {
      "find out which program wrote it, and whether the server can check it.", "ldappw identify"},
     {"broken", "low", "A line of the entry is not well formed.",
      "have the lines and the reasons listed, and mend the export.", "ldappw ldif --audit --verbose --in EXPORT"},
+    {"unchecked", "middle", "The value could not be checked: it asks for too much, or there is no library for it.",
+     "have the password set again, under a scheme at its usual costs.", "ldappw verify"},
     {"not-accepted", "middle", "The scheme is none of those that are accepted.",
      "convert what can be read, have the other passwords changed.",
      "ldappw ldif --to argon2id --keys STASH --changes --in EXPORT --out CHANGES"},

@@ -29,6 +29,7 @@ enum class Finding {
   kUnopened,
   kUnknown,
   kBroken,
+  kUnchecked,
   kNotAccepted
 };
 struct FindingText {

@@ -3,7 +3,6 @@
 
 #include <algorithm>
 #include <cstring>
-#include <functional>
 
 #include "audit/facts.h"
 #include "base/random.h"
@@ -44,12 +43,12 @@ size_t endOfRdn(std::string_view dn) noexcept {
 std::uint32_t DnStore::parentOf(std::string_view& dn) {
   const size_t end = endOfRdn(dn);
   if (end == std::string_view::npos) return 0;
-  const std::string parent(dn.substr(end));
+  const std::string_view parent = dn.substr(end);
   auto found = numbers_.find(parent);
   if (found == numbers_.end()) {
     if (parents_.size() == kMostParents) return 0;
     found = numbers_.emplace(parent, static_cast<std::uint32_t>(parents_.size())).first;
-    parents_.push_back(parent);
+    parents_.emplace_back(parent);
   }
   dn.remove_suffix(dn.size() - end);
   return found->second;
@@ -72,13 +71,18 @@ DnStore::Place DnStore::add(std::string_view dn) {
   return place;
 }
 
-std::string DnStore::at(Place place) const {
+std::pair<std::uint32_t, std::string_view> DnStore::keyAt(Place place) const noexcept {
   const char* from = blocks_[static_cast<size_t>(place / kBlockBytes)].get() + place % kBlockBytes;
   std::uint32_t parent = 0;
   std::uint16_t length = 0;
   memcpy(&parent, from, sizeof parent);
   memcpy(&length, from + sizeof parent, sizeof length);
-  return std::string(from + sizeof parent + sizeof length, length) + parents_[parent];
+  return {parent, {from + sizeof parent + sizeof length, length}};
+}
+
+std::string DnStore::at(Place place) const {
+  const auto [parent, rest] = keyAt(place);
+  return std::string(rest) + parents_[parent];
 }
 
 void Reuse::add(const Facts& batch) {
@@ -91,17 +95,13 @@ void Reuse::add(const Facts& batch) {
 // Where the entries of a run of equal marks are, in the order of the input. Copies of an entry, in one export or in
 // several, are one entry.
 std::vector<DnStore::Place> Reuse::membersOf(const Run& run) const {
-  std::vector<std::pair<size_t, DnStore::Place>> named;
-  named.reserve(run.last - run.first);
-  for (size_t i = run.first; i < run.last; ++i) {
-    named.emplace_back(std::hash<std::string>()(dns_.at(sightings_[i].second)), sightings_[i].second);
-  }
-  std::sort(named.begin(), named.end());
-  const auto sameName = [](const auto& a, const auto& b) { return a.first == b.first; };
-  named.erase(std::unique(named.begin(), named.end(), sameName), named.end());
   std::vector<DnStore::Place> places;
-  places.reserve(named.size());
-  for (const auto& one : named) places.push_back(one.second);
+  places.reserve(run.last - run.first);
+  for (size_t i = run.first; i < run.last; ++i) places.push_back(sightings_[i].second);
+  std::sort(places.begin(), places.end(),
+            [this](DnStore::Place a, DnStore::Place b) { return dns_.same(a, b) ? a < b : dns_.before(a, b); });
+  const auto sameName = [this](DnStore::Place a, DnStore::Place b) { return dns_.same(a, b); };
+  places.erase(std::unique(places.begin(), places.end(), sameName), places.end());
   std::sort(places.begin(), places.end());
   return places;
 }

@@ -5,10 +5,11 @@
 
 #include <cstdint>
 #include <deque>
+#include <functional>
+#include <map>
 #include <memory>
 #include <string>
 #include <string_view>
-#include <unordered_map>
 #include <utility>
 #include <vector>
 
@@ -41,16 +42,21 @@ class DnStore {
 
   Place add(std::string_view dn);
   std::string at(Place place) const;
+  // An order of DNs, equal ones beside each other: it compares the bytes themselves.
+  bool before(Place a, Place b) const noexcept { return keyAt(a) < keyAt(b); }
+  bool same(Place a, Place b) const noexcept { return keyAt(a) == keyAt(b); }
 
  private:
   static constexpr size_t kBlockBytes = size_t{1} << 20;
   static constexpr size_t kMostParents = size_t{1} << 16;
 
   std::uint32_t parentOf(std::string_view& dn);
+  // The number of the parent, and the rest. A DN is always cut at the same place.
+  std::pair<std::uint32_t, std::string_view> keyAt(Place place) const noexcept;
 
   std::vector<std::unique_ptr<char[]>> blocks_;
-  size_t used_ = kBlockBytes;  // of the last one
-  std::unordered_map<std::string, std::uint32_t> numbers_;
+  size_t used_ = kBlockBytes;                                  // of the last one
+  std::map<std::string, std::uint32_t, std::less<>> numbers_;  // sorted: an export fills it
   std::vector<std::string> parents_{""};
 };
 

@@ -27,33 +27,13 @@ struct Html {
 constexpr std::pair<char, const char*> kEscapes[] = {
     {'&', "&amp;"}, {'<', "&lt;"}, {'>', "&gt;"}, {'"', "&quot;"}, {'\'', "&#39;"}};
 
-// The number of a character of three bytes that turns the direction of writing, or 0: a name that holds one would be
-// read as another name.
-unsigned turningPoint(std::string_view character) noexcept {
-  if (character.size() != 3) return 0;
-  const auto bits = [&](size_t i) { return static_cast<unsigned char>(character[i]) & 0x3FU; };
-  const unsigned point = (bits(0) & 0xFU) << 12U | bits(1) << 6U | bits(2);
-  const bool turns = (point >= 0x200E && point <= 0x200F) || (point >= 0x202A && point <= 0x202E) ||
-                     (point >= 0x2066 && point <= 0x2069);
-  return turns ? point : 0;
-}
-
-// Control characters and bytes that are not UTF-8 are shown as \xNN, as a terminal is shown them.
+// What a reader would not see is shown as a terminal is shown it.
 Html escaped(std::string_view raw) {
   Html html;
-  const std::string shown = printable(raw);
-  for (std::string_view rest = shown; !rest.empty();) {
-    const std::string_view character = rest.substr(0, utf8Bytes(rest));
-    const auto* found = std::find_if(std::begin(kEscapes), std::end(kEscapes),
-                                     [&](const auto& row) { return row.first == character.front(); });
-    if (const unsigned point = turningPoint(character); point != 0) {
-      char code[16];
-      snprintf(code, sizeof code, "\\u%04X", point);
-      html.text += code;
-    } else {
-      html.text += found != std::end(kEscapes) ? found->second : character;
-    }
-    rest.remove_prefix(character.size());
+  for (const char c : printable(raw)) {
+    const auto* found =
+        std::find_if(std::begin(kEscapes), std::end(kEscapes), [c](const auto& row) { return row.first == c; });
+    found != std::end(kEscapes) ? html.text += found->second : html.text += c;
   }
   return html;
 }

@@ -16,14 +16,14 @@ ExitCode auditExport(const ExportOptions& source, const AuditRules& rules, Facts
                      Results& results) {
   ExportOptions audited = source;
   audited.others = auditedNames();
+  audited.write = [&](std::string_view lines) { results.write(lines); };
   Input input = openExport(audited);
   const auto work = [&](RecordWalker& walker, AuditPart& part) {
-    Collector collector(rules, part.out);
+    Collector collector(rules, part);
     part.facts = collector.collect(walker);
     if (rules.valuesAreProblems) keepFirst(part.exitCode, collector.firstProblem());
   };
   const auto deliver = [&](AuditPart& part) {
-    results.write(part.out.view());
     reuse.add(part.facts);
     facts.add(std::move(part.facts), rules.listed);
   };

@@ -60,19 +60,21 @@ class Gzip : public Decompressor {
   ~Gzip() override { inflateEnd(&stream_); }
 
   void decode(std::string_view& in, Secret& out, size_t bytes) override {
-    if (ended_ && !startNextMember(in)) return;
     const size_t before = out.size();
     out.resize(before + bytes);
-    stream_.next_in = reinterpret_cast<unsigned char*>(const_cast<char*>(in.data()));
-    stream_.avail_in = static_cast<unsigned>(in.size());
     stream_.next_out = reinterpret_cast<unsigned char*>(out.data() + before);
     stream_.avail_out = static_cast<unsigned>(bytes);
-    const int code = inflate(&stream_, Z_NO_FLUSH);
-    in.remove_prefix(in.size() - stream_.avail_in);
+    while (stream_.avail_out == bytes && (!ended_ || startNextMember(in))) {  // a member may be empty
+      stream_.next_in = reinterpret_cast<unsigned char*>(const_cast<char*>(in.data()));
+      stream_.avail_in = static_cast<unsigned>(in.size());
+      const int code = inflate(&stream_, Z_NO_FLUSH);
+      in.remove_prefix(in.size() - stream_.avail_in);
+      if (code == Z_MEM_ERROR) throw std::bad_alloc();
+      if (code != Z_OK && code != Z_STREAM_END && code != Z_BUF_ERROR) throw damaged("gzip");
+      ended_ = code == Z_STREAM_END;
+      if (!ended_) break;
+    }
     out.resize(before + bytes - stream_.avail_out);
-    if (code == Z_MEM_ERROR) throw std::bad_alloc();
-    if (code != Z_OK && code != Z_STREAM_END && code != Z_BUF_ERROR) throw damaged("gzip");
-    ended_ = code == Z_STREAM_END;
   }
   bool complete() const noexcept override { return ended_; }
 
@@ -101,10 +103,13 @@ class Zstd : public Decompressor {
     out.resize(before + bytes);
     ZSTD_inBuffer source{in.data(), in.size(), 0};
     ZSTD_outBuffer target{out.data() + before, bytes, 0};
-    const size_t code = ZSTD_decompressStream(context_.get(), &target, &source);
+    do {  // a frame may be empty
+      const size_t taken = source.pos;
+      const size_t code = ZSTD_decompressStream(context_.get(), &target, &source);
+      if (ZSTD_isError(code) != 0) throw damaged("zstd");
+      if (source.pos > taken || target.pos > 0) complete_ = code == 0;
+    } while (complete_ && target.pos == 0 && source.pos < source.size);
     out.resize(before + target.pos);
-    if (ZSTD_isError(code) != 0) throw damaged("zstd");
-    if (source.pos > 0 || target.pos > 0) complete_ = code == 0;
     in.remove_prefix(source.pos);
   }
   bool complete() const noexcept override { return complete_; }

@@ -2,9 +2,12 @@
 // Owning a file descriptor, and writing to one.
 #pragma once
 
+#include <cstddef>
 #include <string>
 #include <string_view>
 #include <utility>
+
+#include "base/secret.h"
 
 namespace tool {
 
@@ -29,6 +32,10 @@ class Descriptor {
 // Opens a path, closed in programs that are started and never a controlling terminal. Not valid after a failure
 // (errno).
 Descriptor openPath(const std::string& path, int flags) noexcept;
+
+// The beginning of a file, wherever it is read or written otherwise: so many bytes, or all of it. Throws Failure with
+// kIoError.
+Secret beginningOf(int fd, size_t bytes);
 
 // Writes all bytes; throws Failure with kIoError, in which name stands for the descriptor.
 void writeAll(int fd, std::string_view bytes, const std::string& name);

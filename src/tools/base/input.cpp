@@ -137,30 +137,39 @@ bool LineReader::fill() {
   return !ended_;
 }
 
+void LineReader::hand(size_t bytes, Secret& line) {
+  if (bytes > limit_.bytes) {
+    throw Failure(kBadValue, input_.name() + ", line " + std::to_string(lines_ + 1) + ": more than the " +
+                                 std::to_string(limit_.bytes) + " bytes that " + limit_.what + " may have");
+  }
+  ++lines_;
+  line.append(buffer_.view().substr(position_, bytes));
+}
+
 bool LineReader::next(Secret& line) {
   line.clear();
   size_t searched = position_;
   for (;;) {
     const size_t end = buffer_.view().find(end_, searched);
     if (end != std::string_view::npos) {
-      line.append(buffer_.view().substr(position_, end - position_));
+      hand(end - position_, line);
       position_ = end + 1;
       return true;
     }
     const size_t pending = buffer_.size() - position_;
-    if (!fill()) break;
+    if (pending > limit_.bytes || !fill()) break;
     searched = pending;
   }
   if (position_ == buffer_.size()) return false;
-  line.append(buffer_.view().substr(position_));
+  hand(buffer_.size() - position_, line);
   position_ = buffer_.size();
   return true;
 }
 
-Secret firstLine(const std::string& path, const char* what) {
-  LineReader lines{Input(path)};
+Secret firstLine(const std::string& path, LineLimit limit) {
+  LineReader lines{Input(path), limit};
   Secret line;
-  if (!lines.next(line)) throw Failure(kBadValue, std::string("there is no ") + what + " in " + path);
+  if (!lines.next(line)) throw Failure(kBadValue, path + ": there is no line to be " + limit.what);
   return line;
 }
 

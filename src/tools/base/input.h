@@ -53,28 +53,42 @@ class Input {
   const char* seems_ = "text";
 };
 
+// What a line may be: memory must not follow an input that has no lines in it.
+struct LineLimit {
+  size_t bytes;
+  const char* what;
+};
+constexpr LineLimit kValueLine{size_t{256} << 20, "a value"};
+constexpr LineLimit kPasswordLine{size_t{1} << 20, "a password"};
+constexpr LineLimit kSeedLine{1016, "a seed"};
+constexpr LineLimit kSaltLine{12, "a salt"};
+
 // Splits an input into lines. The newline, or the other end that is asked for, is no part of a line, a carriage return
 // stays, and a last line without a newline counts.
 class LineReader {
  public:
-  explicit LineReader(Input input, char end = '\n') : input_(std::move(input)), end_(end) {}
+  LineReader(Input input, LineLimit limit, char end = '\n') : input_(std::move(input)), limit_(limit), end_(end) {}
 
-  // Puts the next line into line; false at the end of the input.
+  // Puts the next line into line; false at the end of the input. Throws Failure with kBadValue for a line beyond the
+  // limit.
   bool next(Secret& line);
   // False when next() may have to wait for input: the moment to flush results.
   bool lineBuffered() const noexcept;
 
  private:
   bool fill();
+  void hand(size_t bytes, Secret& line);
 
   Input input_;
+  LineLimit limit_;
   char end_;
   Secret buffer_;
   size_t position_ = 0;
+  std::uint64_t lines_ = 0;
   bool ended_ = false;
 };
 
-// The first line of a file; throws Failure with kBadValue when there is none. what names it in the message.
-Secret firstLine(const std::string& path, const char* what);
+// The first line of a file; throws Failure with kBadValue when there is none.
+Secret firstLine(const std::string& path, LineLimit limit);
 
 }  // namespace tool

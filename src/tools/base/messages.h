@@ -24,6 +24,8 @@ class Repeated {
   ~Repeated() { finish(); }
 
   void add(const std::string& text, const std::string& kind);
+  // Counts more of a kind of which as many as are shown have been added.
+  void addUnshown(const std::string& kind, std::uint64_t count) { counts_[kind] += count; }
   void finish() noexcept;
 
  private:

@@ -9,26 +9,54 @@
 #include <string_view>
 
 #include "base/descriptor.h"
+#include "base/secret.h"
 #include "base/signals.h"
 
 namespace tool {
+
+// Where a file is to be: its folder, which is opened once, and its name there. Whoever may write to a folder above can
+// put another in its place afterwards, and nothing is written there.
+class Place {
+ public:
+  // Throws Failure: kUsage when the target exists and overwriting was not asked for, kIoError when it is no regular
+  // file or its folder cannot be opened. A target that is a symbolic link is followed where root or the process's own
+  // user has made it: another user's would lead the process to a file that this user cannot write.
+  Place(const std::string& target, bool overwrite);
+
+  const std::string& path() const noexcept { return path_; }  // for messages
+  const std::string& folderPath() const noexcept { return folderPath_; }
+  const std::string& name() const noexcept { return name_; }
+  int folder() const noexcept { return folder_.get(); }
+  bool overwrite() const noexcept { return overwrite_; }
+  // Opens a regular file in the folder, to be read, without waiting and without following a link. Not valid after a
+  // failure.
+  Descriptor open(const std::string& name) const noexcept;
+
+ private:
+  std::string path_;
+  std::string folderPath_;
+  std::string name_;
+  Descriptor folder_;
+  bool overwrite_;
+};
+
+// Warns of the temporary files for this place that runs which were killed have left; those of runs that go on are in
+// use. describe (may be null) says what the open file holds.
+void nameLeftovers(const Place& place, std::string (*describe)(int fd));
 
 // Every operation throws Failure: kUsage when the target exists and overwriting was not asked for, kIoError otherwise.
 // Used by one thread.
 class OutputFile {
  public:
-  // Makes the temporary file with the given mode. A target that is a symbolic link is followed; one that exists keeps
-  // its owner and group where the process may set them. Anything but a regular file is refused.
-  OutputFile(const std::string& target, mode_t mode, bool overwrite);
+  // Makes the temporary file with the given mode. A target that exists keeps its owner and group where the process may
+  // set them.
+  OutputFile(Place place, mode_t mode);
 
-  const std::string& target() const noexcept { return target_; }
-  const std::string& temporaryPath() const noexcept { return temporary_.path(); }
+  const std::string& target() const noexcept { return place_.path(); }
   int fd() const noexcept { return fd_.get(); }
 
   // Gives the file the mode and the access list of the one that it replaces, where there is one.
   void keepAccess();
-  // Throws when there is no room for so many bytes, for a writer that does not say why it fails.
-  void requireRoom(off_t bytes);
 
   void write(std::string_view bytes);
   // Brings the content to the disk. Nothing has appeared under the target's name yet.
@@ -39,17 +67,19 @@ class OutputFile {
   void giveName();
   void syncFolder();
   // Gives the file that will be replaced a second name, ".bak" behind its own, and a number where that is taken.
-  // Returns it, or nothing where no file will be replaced, or one with the same content.
+  // Returns its path, or nothing where no file will be replaced, or one with the same content.
   std::string keepOld();
+  // Takes both names back.
+  void undo() noexcept;
 
  private:
-  void resolveTarget(const std::string& target, bool overwrite);
-
-  std::string target_;
+  Place place_;
+  Descriptor old_;  // the file that is replaced
   TemporaryFile temporary_;
   Descriptor fd_;
-  bool overwrite_;
+  std::string kept_;
   bool synced_ = false;
+  bool named_ = false;
 };
 
 }  // namespace tool

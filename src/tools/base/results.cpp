@@ -39,17 +39,25 @@ Json& Json::raw(std::string_view text) {
   return *this;
 }
 
+void Json::escape(std::uint32_t point) {
+  if (point > 0xFFFF) {  // as a pair, which stands for 20 bits
+    escape(0xD800U + ((point - 0x10000U) >> 10));
+    return escape(0xDC00U + (point & 0x3FFU));
+  }
+  char code[7];
+  snprintf(code, sizeof code, "\\u%04x", static_cast<unsigned>(point & 0xFFFFU));
+  raw(code);
+}
+
 void Json::quote(std::string_view text) {
   raw("\"");
   while (!text.empty()) {
     const std::string_view character = text.substr(0, utf8Bytes(text));
-    const char last = character.back();
-    if (isControl(character)) {  // its last byte is its code
-      char escape[7];
-      snprintf(escape, sizeof escape, "\\u%04x", static_cast<unsigned>(static_cast<unsigned char>(last)));
-      raw(escape);
+    const std::uint32_t point = codePoint(character);
+    if (isUnseen(point)) {
+      escape(point);
     } else {
-      if (last == '"' || last == '\\') raw("\\");
+      if (point == '"' || point == '\\') raw("\\");
       raw(character);
     }
     text.remove_prefix(character.size());

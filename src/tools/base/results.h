@@ -25,7 +25,7 @@ class Results {
 };
 
 // Builds a JSON object in memory that is wiped: a JSON library's buffers are not. Text that is not well-formed UTF-8 is
-// given as printable() shows it; control characters are escaped, so that a terminal can be shown all of it.
+// given as printable() shows it; what is not seen is escaped, so that a terminal can be shown all of it.
 class Json {
  public:
   Json& text(std::string_view name, std::string_view value);
@@ -50,6 +50,7 @@ class Json {
   Json& begin(std::string_view name, std::string_view value);
   Json& raw(std::string_view text);
   void quote(std::string_view text);
+  void escape(std::uint32_t point);
 
   Secret text_{"{"};
 };

@@ -21,7 +21,8 @@ constexpr int kFileSlots = 4;
 
 struct FileSlot {
   volatile sig_atomic_t used;
-  char path[PATH_MAX];
+  int folder;
+  char name[NAME_MAX + 1];
 };
 
 struct TerminalState {
@@ -48,7 +49,7 @@ sigset_t endingSet() noexcept {
 
 void undoAll() noexcept {
   for (FileSlot& slot : fileSlots) {
-    if (slot.used != 0) unlink(slot.path);
+    if (slot.used != 0) unlinkat(slot.folder, slot.name, 0);
   }
   if (terminal.quiet != 0) tcsetattr(terminal.fd, TCSANOW, &terminal.normal);
 }
@@ -110,32 +111,34 @@ SignalBlock::~SignalBlock() {
   pthread_sigmask(SIG_SETMASK, &before_, nullptr);
 }
 
-TemporaryFile::TemporaryFile(std::string path) noexcept : path_(std::move(path)) {
-  if (path_.size() >= PATH_MAX) return;
+TemporaryFile::TemporaryFile(int folder, std::string name) noexcept : folder_(folder), name_(std::move(name)) {
+  if (name_.size() > NAME_MAX) return;
   for (int i = 0; i < kFileSlots && slot_ < 0; ++i) {
     if (fileSlots[i].used == 0) slot_ = i;
   }
   if (slot_ < 0) return;
-  memcpy(fileSlots[slot_].path, path_.c_str(), path_.size() + 1);
+  fileSlots[slot_].folder = folder_;
+  memcpy(fileSlots[slot_].name, name_.c_str(), name_.size() + 1);
   fileSlots[slot_].used = 1;
   handleEndings();
 }
 
 TemporaryFile& TemporaryFile::operator=(TemporaryFile&& other) noexcept {
-  std::swap(path_, other.path_);
+  std::swap(folder_, other.folder_);
+  std::swap(name_, other.name_);
   std::swap(slot_, other.slot_);
   return *this;
 }
 
 TemporaryFile::~TemporaryFile() {
-  if (!path_.empty()) unlink(path_.c_str());
+  if (!name_.empty()) unlinkat(folder_, name_.c_str(), 0);
   forget();
 }
 
 void TemporaryFile::forget() noexcept {
   if (slot_ >= 0) fileSlots[slot_].used = 0;
   slot_ = -1;
-  path_.clear();
+  name_.clear();
 }
 
 QuietTerminal::QuietTerminal(int fd, const termios& normal, int promptFd, const char* prompt) {

@@ -22,21 +22,23 @@ class SignalBlock {
   sigset_t before_;
 };
 
-// A file that is removed on destruction and when a signal ends the process, where its path is not too long for that and
-// not too many others are waiting for it. Made while signals are held back, so that none finds the file unknown.
+// A file that is removed on destruction and when a signal ends the process, where not too many others are waiting for
+// that. Made while signals are held back, so that none finds the file unknown.
 class TemporaryFile {
  public:
   TemporaryFile() noexcept = default;
-  explicit TemporaryFile(std::string path) noexcept;
+  // The folder stays the caller's, and open.
+  TemporaryFile(int folder, std::string name) noexcept;
   TemporaryFile(const TemporaryFile&) = delete;
   TemporaryFile& operator=(TemporaryFile&& other) noexcept;
   ~TemporaryFile();
 
-  const std::string& path() const noexcept { return path_; }
+  const std::string& name() const noexcept { return name_; }
   void forget() noexcept;  // it has another name now
 
  private:
-  std::string path_;
+  int folder_ = -1;
+  std::string name_;
   int slot_ = -1;
 };
 

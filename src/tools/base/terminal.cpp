@@ -45,7 +45,7 @@ char readByte(Secret& byte) {
   return byte.view().front();
 }
 
-Secret promptSecret(const char* prompt) {
+Secret promptSecret(const char* prompt, LineLimit limit) {
   termios normal;
   if (tcgetattr(kInput, &normal) != 0) throw ioFailure("the terminal's mode is not known");
   const Descriptor own = openPath("/dev/tty", O_WRONLY);
@@ -56,19 +56,21 @@ Secret promptSecret(const char* prompt) {
   {
     const QuietTerminal quiet(kInput, normal, promptFd, prompt);
     tryWrite(promptFd, prompt);  // without a prompt the answer can be typed all the same
-    while (key == Key::kByte) key = edit(normal, readByte(byte), line);
+    while (key == Key::kByte && line.size() <= limit.bytes) key = edit(normal, readByte(byte), line);
   }
   tryWrite(promptFd, "\n");
+  if (line.size() > limit.bytes) throw Failure(kBadValue, std::string("that is too long for ") + limit.what);
   if (key == Key::kEndOfInput) throw Failure(kUsage, "nothing was entered");
   return line;
 }
 
 }  // namespace
 
-SecretSource::SecretSource(const std::string& path, char end)
+SecretSource::SecretSource(const std::string& path, LineLimit limit, char end)
     : interactive_((path.empty() || path == "-") && isatty(kInput) == 1),
+      limit_(limit),
       name_(Input::nameOf(path)),
-      lines_(Input(path), end) {}
+      lines_(Input(path), limit, end) {}
 
 // What a line has from the system that it comes from, and nobody types.
 void SecretSource::warnOfStrayBytes(const Secret& line) {
@@ -87,7 +89,7 @@ bool SecretSource::next(const char* prompt, Secret& out) {
     warnOfStrayBytes(out);
     return true;
   }
-  out = promptSecret(prompt);
+  out = promptSecret(prompt, limit_);
   return true;
 }
 

@@ -16,12 +16,13 @@ namespace tool {
 class SecretSource {
  public:
   // An empty path, or "-", means standard input.
-  explicit SecretSource(const std::string& path, char end = '\n');
+  explicit SecretSource(const std::string& path, LineLimit limit = kPasswordLine, char end = '\n');
 
   bool interactive() const noexcept { return interactive_; }
-  // The next secret, or false at the end. At a terminal, prompt (a static text) asks for it and a line of any length is
-  // read without echo. Throws Failure: kUsage when the terminal's input ends without a line, kIoError otherwise. A line
-  // that ends in a carriage return, or begins with a byte order mark, is taken as it is, with a warning.
+  // The next secret, or false at the end. At a terminal, prompt (a static text) asks for it and a line is read without
+  // echo. Throws Failure: kUsage when the terminal's input ends without a line, kBadValue for a line beyond the limit,
+  // kIoError otherwise. A line that ends in a carriage return, or begins with a byte order mark, is taken as it is, with
+  // a warning.
   bool next(const char* prompt, Secret& out);
   // The same where there has to be one: what names it in the message.
   Secret require(const char* prompt, const char* what);
@@ -34,6 +35,7 @@ class SecretSource {
   void warnOfStrayBytes(const Secret& line);
 
   bool interactive_;
+  LineLimit limit_;
   std::string name_;
   LineReader lines_;
   std::uint64_t number_ = 0;

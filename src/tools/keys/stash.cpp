@@ -3,22 +3,16 @@
 
 #include <sys/stat.h>
 
-#include <cstdint>
+#include <utility>
 
 #include "base/failure.h"
 #include "base/input.h"
 #include "base/messages.h"
+#include "crypto_provider.h"
 #include "keys/stash_folder.h"
 
 namespace tool {
 namespace {
-
-// The size that the stash file format gives to a record.
-off_t stashBytes(const KeyRecord& record) {
-  size_t bytes = sizeof(std::uint32_t) + record.sync().size() + record.salt().size();
-  for (const SecBuffer& key : record.get()->aesKeys) bytes += key.length;
-  return static_cast<off_t>(bytes);
-}
 
 bool acceptable(const Secret& text, int type) {
   return text.view().find('\0') == std::string_view::npos && validateCryptoString(text.c_str(), type) == LDAPPW_SUCCESS;
@@ -37,7 +31,7 @@ void requireSalt(const Secret& salt) {
 }
 
 Secret readSaltFile(const std::string& path) {
-  Secret salt = firstLine(path, "salt");
+  Secret salt = firstLine(path, kSaltLine);
   requireSalt(salt);
   return salt;
 }
@@ -50,6 +44,22 @@ KeyRecord deriveRecord(const Secret& seed, std::string_view salt) {
   return record;
 }
 
+KeyRecord drawRecord() {
+  struct Contexts {
+    ~Contexts() { freeQelDigest(provider, digest); }
+    void* provider = nullptr;
+    void* digest = nullptr;
+    void* algorithm = nullptr;
+  } contexts;
+  requireDone(initQelCrypto(&contexts.provider), "the crypto provider");
+  requireDone(initQelDigest(contexts.provider, &contexts.digest, "SHA1", &contexts.algorithm), "SHA1");
+  AesKeyData* made = nullptr;
+  const int code = genKeyDataVal(contexts.provider, contexts.digest, contexts.algorithm, nullptr, nullptr, &made);
+  KeyRecord record(made);
+  requireDone(code, "the keys could not be drawn");
+  return record;
+}
+
 void requireDone(int code, const std::string& what) {
   if (code == LDAPPW_SUCCESS) return;
   if (code == LDAPPW_NO_MEMORY) throw Failure(kInternal, what + ": out of memory");
@@ -57,33 +67,21 @@ void requireDone(int code, const std::string& what) {
   throw Failure(kInternal, what + ": the library failed with code " + std::to_string(code));
 }
 
-void requireWritten(int code, const std::string& what) {
-  if (code == LDAPPW_OPERATIONS_ERROR) throw Failure(kIoError, what + " could not be written; nothing was replaced");
-  requireDone(code, what);
-}
-
-KeyRecord readBack(const OutputFile& file) {
-  AesKeyData* loaded = nullptr;
-  const int code = setAESKeyData(file.temporaryPath().c_str(), &loaded);
-  KeyRecord record(loaded);
-  struct stat written {};
+void writeStash(OutputFile& file, const KeyRecord& record) {
+  const Secret content = record.content();
+  file.write(content.view());
   struct stat made {};
-  const bool whole = code == LDAPPW_SUCCESS && stat(file.temporaryPath().c_str(), &written) == 0 &&
-                     fstat(file.fd(), &made) == 0 && written.st_dev == made.st_dev && written.st_ino == made.st_ino &&
-                     (made.st_mode & 07777) == kStashMode && made.st_size == stashBytes(record);
+  const bool whole = fstat(file.fd(), &made) == 0 && (made.st_mode & 07777) == kStashMode &&
+                     equalBytes(beginningOf(file.fd(), content.size() + 1).view(), content.view());
   if (!whole) throw Failure(kIoError, file.target() + " could not be written whole; nothing was replaced");
-  return record;
 }
 
 KeyRecord makeDirectoryStash(const std::string& path, bool force, const Secret& seed, const Secret& salt) {
-  const StashFolders locked({path});
-  OutputFile file(path, kStashMode, force);
-  file.requireRoom(kStashRoom);
-  requireWritten(restoreKeyStashFile(file.temporaryPath().c_str(), seed.c_str(), salt.c_str()), path);
-  KeyRecord record = readBack(file);
-  if (!sameRecord(record, deriveRecord(seed, salt.view()))) {
-    throw Failure(kIoError, path + " could not be written whole; nothing was replaced");
-  }
+  Place place(path, force);
+  const StashFolders locked({&place});
+  OutputFile file(std::move(place), kStashMode);
+  KeyRecord record = deriveRecord(seed, salt.view());
+  writeStash(file, record);
   file.sync();
   const std::string kept = file.keepOld();
   file.commit();

@@ -14,7 +14,6 @@
 namespace tool {
 
 constexpr mode_t kStashMode = 0600;
-constexpr off_t kStashRoom = 2048;  // bytes, more than any stash file has
 
 // Throws Failure (kBadValue) unless the text is acceptable as a seed or a salt.
 void requireSeed(const Secret& seed);
@@ -24,18 +23,16 @@ void requireSalt(const Secret& salt);
 Secret readSaltFile(const std::string& path);
 
 KeyRecord deriveRecord(const Secret& seed, std::string_view salt);
+// Of a random seed and salt, as the configuration's is.
+KeyRecord drawRecord();
 
-// Throw the Failure that a library code stands for; nothing for success. what begins its message. requireWritten is for
-// a code from writing a file: a failed file operation and a failed provider have one code, and the provider was asked
-// before.
+// Throws the Failure that a library code stands for; nothing for success. what begins its message.
 void requireDone(int code, const std::string& what);
-void requireWritten(int code, const std::string& what);
 
 // Makes a directory's stash file; the one that it replaces is kept under another name.
 KeyRecord makeDirectoryStash(const std::string& path, bool force, const Secret& seed, const Secret& salt);
 
-// Reads what the library has written to the temporary file. Throws Failure unless that is still the file that was made
-// for it, closed to others and of the size of its record.
-KeyRecord readBack(const OutputFile& file);
+// Writes a record's stash file and reads it back. Throws Failure when it is not whole or not closed to others.
+void writeStash(OutputFile& file, const KeyRecord& record);
 
 }  // namespace tool

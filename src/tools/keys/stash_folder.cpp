@@ -1,13 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
-// Locks on the folders themselves, which leave no lock file behind, and the search for left temporary files.
+// Locks on the folders themselves, which leave no lock file behind.
 #include "keys/stash_folder.h"
 
-#include <fcntl.h>
 #include <sys/file.h>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
 
 #include <algorithm>
 #include <cerrno>
-#include <filesystem>
+#include <chrono>
+#include <cstdio>
+#include <fstream>
+#include <string>
+#include <thread>
 
 #include "base/failure.h"
 #include "base/messages.h"
@@ -16,55 +21,54 @@
 namespace tool {
 namespace {
 
-constexpr size_t kDrawnCharacters = 6;  // at the end of a temporary file's name
+constexpr int kTries = 50;
+constexpr std::chrono::milliseconds kBetweenTries{100};
+
+// Who has locked the folder, as /proc/locks lists it: "1: FLOCK ADVISORY WRITE 4711 08:01:1234 0 EOF".
+std::string holderOf(int folder) {
+  struct stat locked {};
+  std::ifstream locks("/proc/locks");
+  std::string line;
+  while (fstat(folder, &locked) == 0 && std::getline(locks, line)) {
+    int process = 0;
+    unsigned major = 0;
+    unsigned minor = 0;
+    unsigned long long number = 0;
+    if (sscanf(line.c_str(), "%*d: FLOCK %*s %*s %d %x:%x:%llu", &process, &major, &minor, &number) != 4) continue;
+    if (number != locked.st_ino || makedev(major, minor) != locked.st_dev || process <= 0) continue;
+    std::string name = "?";
+    std::getline(std::ifstream("/proc/" + std::to_string(process) + "/comm"), name);
+    return "process " + std::to_string(process) + " (" + name + ")";
+  }
+  return "a process that cannot be seen from here";
+}
 
 // Some file systems have no locks: there the runs of a careful administrator come one after the other.
-void lock(const Descriptor& folder, const std::string& path) {
-  int result = flock(folder.get(), LOCK_EX | LOCK_NB);
-  if (result != 0 && errno == EWOULDBLOCK) {
-    message("waiting for another run that makes stash files in " + path);
-    do {
-      result = flock(folder.get(), LOCK_EX);
-    } while (result != 0 && errno == EINTR);
+void lock(const Place& place) {
+  for (int i = 0; i < kTries; ++i) {
+    if (flock(place.folder(), LOCK_EX | LOCK_NB) == 0 || errno != EWOULDBLOCK) return;
+    if (i == 0) message("waiting for another run that makes stash files in " + place.folderPath());
+    std::this_thread::sleep_for(kBetweenTries);
   }
+  throw Failure(kIoError, place.folderPath() + " is locked by " + holderOf(place.folder()) + "; nothing was written");
 }
 
-std::string describe(const std::string& path) {
-  try {
-    return "a whole stash file with the sync text " + std::string(KeyRecord::load(path).sync());
-  } catch (const Failure&) {
-    return "no whole stash file";
-  }
-}
-
-void nameLeftovers(const std::filesystem::path& folder, const std::string& name) {
-  const std::string beginning = "." + name + ".";
-  std::error_code error;
-  for (std::filesystem::directory_iterator entry(folder, error), end; !error && entry != end; entry.increment(error)) {
-    const std::string found = entry->path().filename();
-    if (found.size() != beginning.size() + kDrawnCharacters || found.compare(0, beginning.size(), beginning) != 0)
-      continue;
-    warning("a run that was ended has left " + entry->path().string() + ", " + describe(entry->path()));
-  }
+std::string describe(int fd) {
+  constexpr size_t kMostBytes = size_t{1} << 16;
+  const KeyRecord record = KeyRecord::parse(beginningOf(fd, kMostBytes));
+  return record ? "a whole stash file with the sync text " + std::string(record.sync()) : "no whole stash file";
 }
 
 }  // namespace
 
-StashFolders::StashFolders(const std::vector<std::string>& files) {
-  std::vector<std::filesystem::path> paths;
-  for (const std::string& file : files) {
-    std::error_code error;
-    const std::filesystem::path whole = std::filesystem::weakly_canonical(std::filesystem::absolute(file), error);
-    if (!error && !whole.filename().empty()) paths.push_back(whole);
-  }
-  std::sort(paths.begin(), paths.end());  // in one order, so that two runs do not wait for each other
-  std::string last;
-  for (const std::filesystem::path& path : paths) {
-    const std::string folder = path.parent_path();
-    if (folder != last) folders_.push_back(openPath(folder, O_RDONLY | O_DIRECTORY));
-    if (folder != last && folders_.back().valid()) lock(folders_.back(), folder);
-    last = folder;
-    nameLeftovers(folder, path.filename());
+StashFolders::StashFolders(std::vector<const Place*> places) {
+  // In one order, so that two runs do not wait for each other.
+  std::sort(places.begin(), places.end(), [](const Place* a, const Place* b) { return a->path() < b->path(); });
+  const Place* last = nullptr;
+  for (const Place* place : places) {
+    if (last == nullptr || place->folderPath() != last->folderPath()) lock(*place);
+    last = place;
+    nameLeftovers(*place, describe);
   }
 }
 

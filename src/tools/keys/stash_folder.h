@@ -3,21 +3,18 @@
 // before it could tidy up, has left there.
 #pragma once
 
-#include <string>
 #include <vector>
 
-#include "base/descriptor.h"
+#include "base/output_file.h"
 
 namespace tool {
 
-// Locks the folders of stash files to be made; they are unlocked when the object or the process ends. Waits for another
-// run, with a message. Throws Failure (kIoError) for a folder that cannot be opened.
+// Locks the folders of stash files to be made; they are unlocked when the places go, or the process ends. Another run
+// is waited for with a message, and not for long: whoever may read a folder can lock it for ever. Throws Failure
+// (kIoError) that says who holds the lock.
 class StashFolders {
  public:
-  explicit StashFolders(const std::vector<std::string>& files);
-
- private:
-  std::vector<Descriptor> folders_;
+  explicit StashFolders(std::vector<const Place*> places);
 };
 
 }  // namespace tool

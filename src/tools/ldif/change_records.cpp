@@ -1,7 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ldif/change_records.h"
 
-#include <algorithm>
 #include <utility>
 
 #include "base/input.h"
@@ -12,52 +11,46 @@ namespace {
 
 constexpr std::string_view kRecordEnd = "\n\n";
 
-Secret keyOf(const RecordWalker& walker, const Secret& old) {
-  Secret key(walker.dn());
-  key.append('\0');
-  key.append(walker.password().description);
-  key.append('\0');
-  key.append(old.view());
-  return key;
-}
-
 }  // namespace
 
-void ChangeWriter::startEntry(const RecordWalker& walker, Secret& out) {
+void ChangeWriter::startEntry(const RecordWalker& walker, ExportPart& part) {
   if (entry_ == walker.entries()) return;
-  flush(out);
+  flush(part);
   entry_ = walker.entries();
   dn_ = walker.dn();
 }
 
-ChangeWriter::Change* ChangeWriter::find(const RecordWalker& walker, const Secret& made) noexcept {
-  const auto found = std::find_if(changes_.begin(), changes_.end(), [&](const Change& change) {
-    return sameName(change.description, walker.password().description) && change.made.view() == made.view();
-  });
-  return found != changes_.end() ? &*found : nullptr;
+ChangeWriter::Change* ChangeWriter::find(const RecordWalker& walker, const Secret& made) {
+  const auto found = places_.find(keyOf(walker.password().description, made.view()));
+  return found != places_.end() ? &changes_[found->second] : nullptr;
 }
 
-void ChangeWriter::replace(const RecordWalker& walker, const Secret& old, const Secret& made, Secret& out) {
-  startEntry(walker, out);
-  changes_.push_back({walker.password().description, {}, Secret(made.view()), true});
-  changes_.back().olds.emplace_back(old.view());
+ChangeWriter::Change& ChangeWriter::add(const RecordWalker& walker, const Secret& made, bool adds) {
+  const std::string& description = walker.password().description;
+  places_.emplace(keyOf(description, made.view()), changes_.size());
+  changes_.push_back({description, {}, Secret(made.view()), adds});
+  return changes_.back();
 }
 
-void ChangeWriter::drop(const RecordWalker& walker, const Secret& old, const Secret& made, bool isNew, Secret& out) {
-  startEntry(walker, out);
+void ChangeWriter::replace(const RecordWalker& walker, const Secret& old, const Secret& made, ExportPart& part) {
+  startEntry(walker, part);
+  add(walker, made, true).olds.emplace_back(old.view());
+}
+
+void ChangeWriter::drop(const RecordWalker& walker, const Secret& old, const Secret& made, bool isNew,
+                        ExportPart& part) {
+  startEntry(walker, part);
   Change* change = find(walker, made);
   if (!isNew) {
     if (change != nullptr) change->adds = false;
     return;
   }
-  if (change == nullptr) {
-    changes_.push_back({walker.password().description, {}, Secret(made.view()), false});
-    change = &changes_.back();
-  }
+  if (change == nullptr) change = &add(walker, made, false);
   change->olds.emplace_back(old.view());
 }
 
-void ChangeWriter::flush(Secret& out) {
+void ChangeWriter::flush(ExportPart& part) {
+  Secret& out = part.out;
   for (const Change& change : changes_) {
     appendAttribute("dn", Secret(dn_), out);
     out.append("changetype: modify\ndelete: " + change.description + '\n');
@@ -69,8 +62,10 @@ void ChangeWriter::flush(Secret& out) {
       out.append("-\n");
     }
     out.append('\n');
+    part.spill();
   }
   changes_.clear();
+  places_.clear();
 }
 
 void EarlierChanges::load(const std::string& path, const AttributeSet& attributes) {
@@ -82,24 +77,27 @@ void EarlierChanges::load(const std::string& path, const AttributeSet& attribute
     batch.text.resize(end != std::string_view::npos ? end + kRecordEnd.size() : 0);
     RecordWalker walker(batch, attributes);
     std::vector<Secret> keys;
+    Values* values = nullptr;
     std::uint64_t record = 0;
     while (walker.next()) {
       if (!walker.atPassword()) continue;
-      if (walker.entries() != record) keys.clear();
+      if (walker.entries() != record) {
+        keys.clear();
+        values = &entries_[walker.dn()];
+      }
       record = walker.entries();
       const PasswordLine& password = walker.password();
-      if (password.form == ValueForm::kDeleted) keys.push_back(keyOf(walker, password.value));
+      if (password.form == ValueForm::kDeleted) keys.push_back(keyOf(password.description, password.value.view()));
       if (password.form != ValueForm::kBytes) continue;
-      for (Secret& key : keys) values_[std::move(key)] = password.whole(password.value);
+      for (Secret& key : keys) (*values)[std::move(key)] = password.whole(password.value);
       keys.clear();
     }
   }
 }
 
-const Secret* EarlierChanges::find(const RecordWalker& walker, const Secret& old) const {
-  if (values_.empty()) return nullptr;
-  const auto found = values_.find(keyOf(walker, old));
-  return found != values_.end() ? &found->second : nullptr;
+const EarlierChanges::Values* EarlierChanges::of(const std::string& dn) const {
+  const auto found = entries_.find(dn);
+  return found != entries_.end() ? &found->second : nullptr;
 }
 
 }  // namespace tool

@@ -5,12 +5,11 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <functional>
+#include <map>
 #include <string>
-#include <string_view>
-#include <unordered_map>
 #include <vector>
 
+#include "ldif/export_run.h"
 #include "ldif/record.h"
 
 namespace tool {
@@ -18,11 +17,11 @@ namespace tool {
 // The changes of one entry after the other.
 class ChangeWriter {
  public:
-  // old becomes made. Records of the entry before are written to out.
-  void replace(const RecordWalker& walker, const Secret& old, const Secret& made, Secret& out);
+  // old becomes made. Records of the entry before are written to part.
+  void replace(const RecordWalker& walker, const Secret& old, const Secret& made, ExportPart& part);
   // old comes to made, which the entry has already: old goes. Not isNew: old is made itself, which need not be added.
-  void drop(const RecordWalker& walker, const Secret& old, const Secret& made, bool isNew, Secret& out);
-  void flush(Secret& out);
+  void drop(const RecordWalker& walker, const Secret& old, const Secret& made, bool isNew, ExportPart& part);
+  void flush(ExportPart& part);
 
  private:
   struct Change {
@@ -31,12 +30,14 @@ class ChangeWriter {
     Secret made;
     bool adds;
   };
-  void startEntry(const RecordWalker& walker, Secret& out);
-  Change* find(const RecordWalker& walker, const Secret& made) noexcept;
+  void startEntry(const RecordWalker& walker, ExportPart& part);
+  Change& add(const RecordWalker& walker, const Secret& made, bool adds);
+  Change* find(const RecordWalker& walker, const Secret& made);
 
   std::uint64_t entry_ = 0;
   std::string dn_;
   std::vector<Change> changes_;
+  std::map<Secret, size_t, ByBytes> places_;  // of the first change to a value of an attribute
 };
 
 // New values by what they are for, of change records that an earlier run has written.
@@ -44,16 +45,12 @@ class EarlierChanges {
  public:
   // Records of which the end is missing do not count. Throws Failure.
   void load(const std::string& path, const AttributeSet& attributes);
-  bool empty() const noexcept { return values_.empty(); }
-  // The new value for old in the entry and attribute of the walker, or null.
-  const Secret* find(const RecordWalker& walker, const Secret& old) const;
+  // The new values of an entry, by attribute and old value; null when there are none.
+  using Values = std::map<Secret, Secret, ByBytes>;
+  const Values* of(const std::string& dn) const;
 
  private:
-  struct SameBytes {
-    size_t operator()(const Secret& key) const noexcept { return std::hash<std::string_view>{}(key.view()); }
-    bool operator()(const Secret& a, const Secret& b) const noexcept { return a.view() == b.view(); }
-  };
-  std::unordered_map<Secret, Secret, SameBytes, SameBytes> values_;  // the old values are secrets too
+  std::map<std::string, Values> entries_;
 };
 
 }  // namespace tool

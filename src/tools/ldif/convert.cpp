@@ -6,9 +6,8 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <functional>
+#include <map>
 #include <optional>
-#include <unordered_map>
 #include <utility>
 
 #include "base/messages.h"
@@ -179,13 +178,17 @@ Outcome outcomeWithout(const PasswordLine& password) {
   return {kKept[static_cast<size_t>(password.form)], {}};
 }
 
-Outcome outcomeOf(const RecordWalker& walker, const Examined& value, const Conversion& conversion, Secret& made) {
+// earlier has the values that an earlier run has made for the entry, or is null.
+Outcome outcomeOf(const RecordWalker& walker, const Examined& value, const Conversion& conversion,
+                  const EarlierChanges::Values* earlier, Secret& made) {
   const PasswordLine& password = walker.password();
   if (conversion.options.changes && (walker.inChange() || walker.dn().empty() || walker.dn().front() == ':')) {
     return {&Counts::failed, {kBadValue, "no change can be written for a change record, or without a well-formed dn"}};
   }
-  if (const Secret* earlier = conversion.earlier.find(walker, password.whole(password.value))) {
-    made = Secret(earlier->view().substr(password.history.size()));
+  EarlierChanges::Values::const_iterator known;
+  if (earlier != nullptr) known = earlier->find(keyOf(password.description, password.whole(password.value).view()));
+  if (earlier != nullptr && known != earlier->end()) {
+    made = Secret(known->second.view().substr(password.history.size()));
     if (!password.history.empty()) made = Secret(made.view().substr(made.view().find('#') + 1));
     const StoredValue taken(made);
     if (&taken.scheme() == &conversion.target && taken.problem() == nullptr) return {&Counts::resumed, {}};
@@ -198,26 +201,14 @@ class EntryValues {
  public:
   // True when an equal value stands in the entry already and one of the two is new.
   bool repeats(const RecordWalker& walker, const Secret& value, bool changed) {
-    if (group_ != walker.group()) values_.clear();
+    if (group_ != walker.group()) changed_.clear();
     group_ = walker.group();
-    const std::string& name = walker.password().description;
-    const size_t hash = std::hash<std::string_view>()(value.view());
-    const auto equal = values_.equal_range(hash);
-    const bool found = std::any_of(equal.first, equal.second, [&](const auto& row) {
-      const Value& other = row.second;
-      return (changed || other.changed) && sameName(other.name, name) && other.value.view() == value.view();
-    });
-    if (!found) values_.emplace(hash, Value{name, Secret(value.view()), changed});
-    return found;
+    const auto [found, isFirst] = changed_.emplace(keyOf(walker.password().description, value.view()), changed);
+    return !isFirst && (changed || found->second);
   }
 
  private:
-  struct Value {
-    std::string name;
-    Secret value;
-    bool changed;
-  };
-  std::unordered_multimap<size_t, Value> values_;
+  std::map<Secret, bool, ByBytes> changed_;
   std::uint64_t group_ = 0;
 };
 
@@ -239,8 +230,13 @@ class Converter {
   Converter(const Conversion& conversion, ConversionPart& part) : conversion_(conversion), part_(part) {}
 
   void all(RecordWalker& walker) {
-    while (walker.next()) walker.atPassword() ? convert(walker) : keep(walker);
-    changes_.flush(part_.out);
+    while (walker.next()) {
+      if (walker.entries() != entry_) earlier_ = conversion_.earlier.of(walker.dn());
+      entry_ = walker.entries();
+      walker.atPassword() ? convert(walker) : keep(walker);
+      part_.spill();
+    }
+    changes_.flush(part_);
   }
 
  private:
@@ -254,7 +250,7 @@ class Converter {
     const PasswordLine& password = walker.password();
     std::optional<Examined> value;
     if (password.form == ValueForm::kBytes) value = examine(password.value);
-    const Outcome outcome = value ? outcomeOf(walker, *value, conversion_, made) : outcomeWithout(password);
+    const Outcome outcome = value ? outcomeOf(walker, *value, conversion_, earlier_, made) : outcomeWithout(password);
     const bool changed = isChanged(outcome.counter);
     Counts& counts = part_.counts;
     ++counts.values;
@@ -276,13 +272,15 @@ class Converter {
     }
     if (!changed && !repeated) return;
     const Secret old = password.whole(password.value);
-    repeated ? changes_.drop(walker, old, whole, changed, part_.out) : changes_.replace(walker, old, whole, part_.out);
+    repeated ? changes_.drop(walker, old, whole, changed, part_) : changes_.replace(walker, old, whole, part_);
   }
 
   const Conversion& conversion_;
   ConversionPart& part_;
   EntryValues values_;
   ChangeWriter changes_;
+  const EarlierChanges::Values* earlier_ = nullptr;  // of the entry
+  std::uint64_t entry_ = 0;
 };
 
 const Scheme& targetOf(const LdifOptions& options) {
@@ -374,19 +372,23 @@ ExitCode convertExport(const LdifOptions& options) {
   if (!options.resume.empty()) conversion.earlier.load(options.resume, AttributeSet(options.source.attributes));
   std::optional<OutputFile> file;
   if (options.out != "-" && !options.dryRun) {
-    file.emplace(options.out, kNewFileMode, options.force);
+    Place place(options.out, options.force);
+    nameLeftovers(place, nullptr);
+    file.emplace(std::move(place), kNewFileMode);
     file->keepAccess();
   }
   std::optional<GracefulStop> stop;  // what has been written of changes is whole, what of an export is not
   if (options.changes) stop.emplace();
   ConversionPart sum;
   const auto deliver = [&](const ConversionPart& part) {
-    file ? file->write(part.out.view()) : writeAll(STDOUT_FILENO, part.out.view(), "standard output");
     addCounts(sum.counts, part.counts, kNames);
     sum.plan.add(part.plan, kPlanNames);
   };
   ExportOptions source = options.source;
   source.resultsOnStdout = !file;
+  source.write = [&](std::string_view bytes) {
+    file ? file->write(bytes) : writeAll(STDOUT_FILENO, bytes, "standard output");
+  };
   source.costly = isCostly(conversion.target);
   const ExportSum whole = runExport<ConversionPart>(
       input, source, [&](RecordWalker& walker, ConversionPart& part) { Converter(conversion, part).all(walker); },

@@ -96,6 +96,7 @@ class ExportRun::State {
         reader_(input, options.costly ? kCostlyBatchBytes : RecordReader::kBatchBytes),
         attributes_(options.attributes, options.others),
         progress_(input.fd(), options.resultsOnStdout, options.progress),
+        write_(options.write),
         threads_(options.threads > 0 ? options.threads : std::max(1U, std::thread::hardware_concurrency())) {}
 
   const AttributeSet& attributes() const noexcept { return attributes_; }
@@ -124,15 +125,26 @@ class ExportRun::State {
     return true;
   }
 
+  void spill(const Batch& batch, ExportPart& part) {
+    std::unique_lock<std::mutex> lock(output_);
+    turn_.wait(lock, [&] { return failure_ || due_ == batch.number; });
+    if (!failure_ && write_) write_(part.out.view());
+    part.out.clear();
+  }
+
   bool hand(const Batch& batch, const RecordWalker& walker, ExportPart& part, const std::function<void()>& deliver) {
     constexpr char kOutside[] = "lines that belong to no entry";
     for (const std::uint64_t line : walker.outside()) part.report(line, "", kBadValue, kOutside);
     std::unique_lock<std::mutex> lock(output_);
     turn_.wait(lock, [&] { return failure_ || due_ == batch.number; });
     if (failure_) return false;
+    if (write_) write_(part.out.view());
     deliver();
     if (!part.messages.empty()) progress_.hide();
     for (const ExportPart::Message& one : part.messages) messages_.add(one.text, one.kind);
+    for (const auto& [kind, count] : part.reported) {
+      if (count > kMostOfAKind) messages_.addUnshown(kind, count - kMostOfAKind);
+    }
     if (batch.number == 0 && batch.text.view().substr(0, kByteOrderMark.size()) == kByteOrderMark) {
       warning(input_.name() + " begins with a byte order mark, which LDIF does not have");
     }
@@ -182,6 +194,7 @@ class ExportRun::State {
   RecordReader reader_;
   const AttributeSet attributes_;
   Progress progress_;
+  const std::function<void(std::string_view)> write_;
   const unsigned threads_;
   std::mutex reading_;
   std::mutex output_;
@@ -209,14 +222,24 @@ bool ExportRun::take(Batch& batch) {
   return state_->take(batch);
 }
 
+void ExportRun::spill(const Batch& batch, ExportPart& part) {
+  state_->spill(batch, part);
+}
+
 bool ExportRun::hand(const Batch& batch, const RecordWalker& walker, ExportPart& part,
                      const std::function<void()>& deliver) {
   return state_->hand(batch, walker, part, deliver);
 }
 
+void ExportPart::spill() {
+  constexpr size_t kMuch = size_t{4} << 20;
+  if (out.size() >= kMuch && early) early();
+}
+
 void ExportPart::report(std::uint64_t line, const std::string& dn, ExitCode code, const std::string& text) {
-  messages.push_back({"line " + std::to_string(line) + ": " + (dn.empty() ? "(no dn)" : dn) + ": " + text, text});
   keepFirst(exitCode, code);
+  if (++reported[text] > kMostOfAKind) return;
+  messages.push_back({"line " + std::to_string(line) + ": " + shownDn(dn) + ": " + text, text});
 }
 
 Input openExport(const ExportOptions& options) {

@@ -5,8 +5,10 @@
 
 #include <cstdint>
 #include <functional>
+#include <map>
 #include <memory>
 #include <string>
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -24,9 +26,13 @@ struct ExportPart {
   };
 
   Secret out;
-  std::vector<Message> messages;
-  ExitCode exitCode = kSuccess;  // of the first problem
+  std::vector<Message> messages;                  // the first of each kind
+  std::map<std::string, std::uint64_t> reported;  // all, by kind
+  ExitCode exitCode = kSuccess;                   // of the first problem
+  std::function<void()> early;                    // writes the output so far, when its turn has come
 
+  // Writes the output so far when it is much: an entry can come to far more than it takes in the export.
+  void spill();
   // Reports a problem with a value of an entry.
   void report(std::uint64_t line, const std::string& dn, ExitCode code, const std::string& text);
 };
@@ -37,13 +43,14 @@ struct ExportSum {
 };
 
 struct ExportOptions {
-  std::string in = "-";                 // "-" for standard input
-  std::vector<std::string> attributes;  // none: those of AttributeSet
-  std::vector<std::string> others;      // attributes that hold no passwords and are stopped at all the same
-  unsigned threads = 0;                 // 0: one a processor
-  bool resultsOnStdout = false;         // the progress line stays away from them
-  bool progress = false;                // progress also where standard error is no terminal
-  bool costly = false;                  // values are expensive: use small batches
+  std::string in = "-";                         // "-" for standard input
+  std::vector<std::string> attributes;          // none: those of AttributeSet
+  std::vector<std::string> others;              // attributes that hold no passwords and are stopped at all the same
+  unsigned threads = 0;                         // 0: one a processor
+  bool resultsOnStdout = false;                 // the progress line stays away from them
+  bool progress = false;                        // progress also where standard error is no terminal
+  bool costly = false;                          // values are expensive: use small batches
+  std::function<void(std::string_view)> write;  // takes the output of the parts, in order and in pieces
 };
 
 // Opens the export, compressed or not, and the library that its lines need. Throws Failure.
@@ -60,8 +67,10 @@ class ExportRun {
   const AttributeSet& attributes() const noexcept;
   // Runs loop on each thread. If one throws, all stop and this rethrows.
   ExportSum all(const std::function<void()>& loop);
-  // For a loop: the next batch, false at the end; and the turn of a batch, false after a failure.
+  // For a loop: the next batch, false at the end; output of a batch before its end; and the turn of a batch, false
+  // after a failure.
   bool take(Batch& batch);
+  void spill(const Batch& batch, ExportPart& part);
   bool hand(const Batch& batch, const RecordWalker& walker, ExportPart& part, const std::function<void()>& deliver);
 
  private:
@@ -81,6 +90,7 @@ ExportSum runExport(Input& input, const ExportOptions& options, const Work& work
     while (run.take(batch)) {
       Part part;
       part.out = std::move(memory);
+      part.early = [&] { run.spill(batch, part); };
       RecordWalker walker(batch, run.attributes());
       work(walker, part);
       if (!run.hand(batch, walker, part, [&] { deliver(part); })) return;

@@ -113,6 +113,20 @@ size_t AttributeSet::find(std::string_view description) const noexcept {
   return kNone;
 }
 
+std::string shownDn(const std::string& dn) {
+  constexpr size_t kMostShown = 512;
+  if (dn.empty()) return "(no dn)";
+  return dn.size() <= kMostShown ? dn : dn.substr(0, kMostShown) + "...";
+}
+
+Secret keyOf(std::string_view description, std::string_view value) {
+  Secret key;
+  for (const char c : description) key.append(c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c);
+  key.append('\0');
+  key.append(value);
+  return key;
+}
+
 Secret PasswordLine::whole(const Secret& changed) const {
   Secret text(history);
   if (!history.empty()) text.append(std::to_string(changed.size()) + "#");
@@ -150,10 +164,16 @@ bool RecordWalker::matters(std::string_view description) const noexcept {
 void RecordWalker::readName(std::string_view text) {
   ++entries_;
   dn_.assign(trimSpaces(text));
-  if (text.empty() || text.front() != ':') return;
+  if (text.empty() || text.front() != ':') return requireShortDn();
   unfold(line_, text_);
   Secret decoded;
   if (valueProblem(text) == nullptr && parseValue(text_, decoded)) dn_.assign(decoded.view());
+  requireShortDn();
+}
+
+void RecordWalker::requireShortDn() const {
+  if (dn_.size() <= kLongestDn) return;
+  throw Failure(kBadValue, "the dn in line " + std::to_string(lineNumber_) + " is longer than 64 KiB");
 }
 
 // Follows the lines that say which record and which change the others belong to.

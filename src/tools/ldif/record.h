@@ -35,6 +35,20 @@ class AttributeSet {
   size_t given_;
 };
 
+// A longer DN is refused, like a record that is too large: it is repeated wherever its entry is named.
+constexpr size_t kLongestDn = size_t{64} << 10;
+
+// A DN as messages name it: cut where it is long.
+std::string shownDn(const std::string& dn);
+
+// The order of secrets in a sorted table. An export fills such tables, and whoever writes it can choose keys that an
+// unkeyed hash puts into one place.
+struct ByBytes {
+  bool operator()(const Secret& a, const Secret& b) const noexcept { return a.view() < b.view(); }
+};
+// The key of a value under an attribute, whose case does not count.
+Secret keyOf(std::string_view description, std::string_view value);
+
 enum class ValueForm {
   kBytes,         // the value is there
   kUrl,           // "attribute:< url": the value is elsewhere
@@ -102,6 +116,8 @@ class RecordWalker {
   void readPassword(std::string_view description);
   ValueForm readValue(std::string_view text);
   ValueForm readFields(std::string_view type);
+
+  void requireShortDn() const;
 
   std::string_view rest_;
   const AttributeSet& attributes_;

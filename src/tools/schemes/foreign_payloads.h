@@ -50,6 +50,8 @@ struct Argon2Parts {
 bool parseArgon2(std::string_view payload, Argon2Parts& parts);
 bool argon2CostsAreBounded(const Argon2Parts& parts) noexcept;
 
+// The memory that crypt(3) takes for a value, in bytes; the most there is for one whose costs cannot be read.
+std::uint64_t cryptMemory(std::string_view value) noexcept;
 // Costs as crypt(3) reads them in a value; those that cannot be read count as unbounded.
 bool cryptCostsAreBounded(std::string_view value) noexcept;
 

@@ -11,6 +11,7 @@
 #include "base/random.h"
 #include "schemes/foreign_payloads.h"
 #include "schemes/hash_libraries.h"
+#include "schemes/memory_budget.h"
 #include "schemes/schemes.h"
 
 namespace tool {
@@ -22,6 +23,7 @@ constexpr Status kTooCostly{kBadValue, "the value asks for more time or memory t
 constexpr Status kNotComputed{kBadValue, "the value cannot be computed: its settings are not accepted"};
 constexpr Status kNotMade{kInternal, "the value could not be made"};
 constexpr Status kNoMemory{kInternal, "out of memory"};
+constexpr Status kNoBudget{kBadValue, "a value of these costs takes more memory than all may (--memory-limit)"};
 
 constexpr size_t kHashBytes = 32;         // of Argon2
 constexpr size_t kCryptRandomBytes = 16;  // of which crypt(3) makes a salt
@@ -99,6 +101,8 @@ const char* crypt3(const Secret& password, const char* setting, CryptState& stat
 Status checkAsCrypt(const Secret& stored, const Secret& password) {
   if (const char* problem = crypt3PasswordProblem(password.view())) return {kBadValue, problem};
   if (!cryptCostsAreBounded(stored.view())) return kTooCostly;
+  const MemoryShare memory(cryptMemory(stored.view()));
+  if (!memory.granted()) return kTooCostly;
   const auto state = std::make_unique<CryptState>();
   const char* computed = crypt3(password, stored.c_str(), *state);
   return computed != nullptr ? answer(computed, stored.view()) : kNotComputed;
@@ -178,6 +182,8 @@ Status checkArgon2(const StoredValue& value, const KeyRecord&, const Secret& pas
   Argon2Parts parts;
   if (!parseArgon2(value.payload(), parts)) return kNotComputed;
   if (!argon2CostsAreBounded(parts)) return kTooCostly;
+  const MemoryShare memory(std::uint64_t{parts.memoryKib} << 10);
+  if (!memory.granted()) return kTooCostly;
   const Secret stored(value.payload());
   const auto type = static_cast<argon2_type>(*value.scheme().algorithm - '0');
   const int code = argon2Library().verify(stored.c_str(), password.c_str(), password.size(), type);
@@ -221,6 +227,8 @@ Status makeCrypt3(const Scheme& scheme, const KeyRecord&, const Costs& costs, co
                                  static_cast<int>(sizeof setting)) == nullptr) {
     return kNotMade;
   }
+  const MemoryShare memory(cryptMemory(setting));
+  if (!memory.granted()) return kNoBudget;
   const auto state = std::make_unique<CryptState>();
   const char* computed = crypt3(password, setting, *state);
   if (computed == nullptr) return kNotMade;
@@ -234,6 +242,8 @@ Status makeArgon2(const Scheme& scheme, const KeyRecord&, const Costs& costs, co
   constexpr size_t kLongestText = 512;
   constexpr std::uint32_t kLeastKibOfLane = 8;
   if (costs.memoryKib / kLeastKibOfLane < costs.parallelism) return {kBadValue, "Argon2 needs 8 KiB of memory a lane"};
+  const MemoryShare memory(std::uint64_t{costs.memoryKib} << 10);
+  if (!memory.granted()) return kNoBudget;
   const Secret salt = drawSalt(costs.saltBytes);
   Secret hash;
   Secret text;

@@ -14,6 +14,7 @@
 #include <iterator>
 #include <new>
 #include <optional>
+#include <utility>
 
 #include "base/failure.h"
 #include "base/input.h"
@@ -56,30 +57,6 @@ void fill(SecBuffer& buffer, std::string_view& from) {
   from.remove_prefix(buffer.length);
 }
 
-// Takes a stash file apart; gives no record for one that is too short. The library's own reader takes a path, and would
-// open a pipe a second time.
-KeyRecord parse(const Secret& file) {
-  AesKeyData* made = nullptr;
-  if (initAesKeyData(&made) != LDAPPW_SUCCESS) throw std::bad_alloc();
-  KeyRecord record(made);
-  std::string_view rest = file.view();
-  std::uint64_t syncBytes = 0;
-  for (size_t i = 0; i < kLengthBytes && i < rest.size(); ++i) {
-    syncBytes |= std::uint64_t{static_cast<unsigned char>(rest[i])} << (8 * i);
-  }
-  std::uint64_t needed = kLengthBytes + syncBytes + made->cryptoSalt.length;
-  for (const SecBuffer& key : made->aesKeys) needed += key.length;
-  if (rest.size() < needed) return KeyRecord();
-  rest.remove_prefix(kLengthBytes);
-  made->cryptoSync.data = static_cast<unsigned char*>(calloc(static_cast<size_t>(syncBytes) + 1, 1));
-  if (made->cryptoSync.data == nullptr) throw std::bad_alloc();
-  made->cryptoSync.length = static_cast<std::uint32_t>(syncBytes);
-  fill(made->cryptoSync, rest);
-  fill(made->cryptoSalt, rest);
-  for (SecBuffer& key : made->aesKeys) fill(key, rest);
-  return record;
-}
-
 }  // namespace
 
 void allowKeysGroup(const std::string& name) {
@@ -111,9 +88,43 @@ KeyRecord KeyRecord::load(const std::string& path) {
   while (bytes.size() < kReadBytes && file.more(bytes, kReadBytes)) {
   }
   KeyRecord record = parse(bytes);
-  if (!record || !looksLikeStash(record)) throw Failure(kBadKey, file.name() + " is not a whole key stash file");
+  if (!record) throw Failure(kBadKey, file.name() + " is not a whole key stash file");
   setCipherNameGlobal();
   return record;
+}
+
+// The library's own reader and writer take paths: a pipe would be opened a second time, and what is behind a path may
+// change between two looks at it.
+KeyRecord KeyRecord::parse(const Secret& content) {
+  AesKeyData* made = nullptr;
+  if (initAesKeyData(&made) != LDAPPW_SUCCESS) throw std::bad_alloc();
+  KeyRecord record(made);
+  std::string_view rest = content.view();
+  std::uint64_t syncBytes = 0;
+  for (size_t i = 0; i < kLengthBytes && i < rest.size(); ++i) {
+    syncBytes |= std::uint64_t{static_cast<unsigned char>(rest[i])} << (8 * i);
+  }
+  std::uint64_t needed = kLengthBytes + syncBytes + made->cryptoSalt.length;
+  for (const SecBuffer& key : made->aesKeys) needed += key.length;
+  if (rest.size() < needed) return KeyRecord();
+  rest.remove_prefix(kLengthBytes);
+  made->cryptoSync.data = static_cast<unsigned char*>(calloc(static_cast<size_t>(syncBytes) + 1, 1));
+  if (made->cryptoSync.data == nullptr) throw std::bad_alloc();
+  made->cryptoSync.length = static_cast<std::uint32_t>(syncBytes);
+  fill(made->cryptoSync, rest);
+  fill(made->cryptoSalt, rest);
+  for (SecBuffer& key : made->aesKeys) fill(key, rest);
+  return looksLikeStash(record) ? std::move(record) : KeyRecord();
+}
+
+Secret KeyRecord::content() const {
+  Secret content;
+  const auto bytes = static_cast<std::uint32_t>(sync().size());
+  for (size_t i = 0; i < kLengthBytes; ++i) content.append(static_cast<char>(bytes >> (8 * i) & 0xFFU));
+  content.append(sync());
+  content.append(salt());
+  for (const SecBuffer& key : record_->aesKeys) content.append(viewOf(key));
+  return content;
 }
 
 std::string_view KeyRecord::sync() const noexcept {

@@ -7,6 +7,7 @@
 #include <string_view>
 
 #include "aes_keys.h"
+#include "base/secret.h"
 
 namespace tool {
 
@@ -18,6 +19,10 @@ class KeyRecord {
   // Reads a stash file, once, and warns when others can read it; an empty path gives no record. Throws Failure:
   // kIoError when the file cannot be read, kBadKey when it is not a stash file.
   static KeyRecord load(const std::string& path);
+  // Takes the content of a stash file apart; no record when it is none.
+  static KeyRecord parse(const Secret& content);
+  // The content of the record's stash file.
+  Secret content() const;
 
   AesKeyData* get() const noexcept { return record_.get(); }
   explicit operator bool() const noexcept { return record_ != nullptr; }

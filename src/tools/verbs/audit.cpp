@@ -16,8 +16,8 @@ namespace {
 
 constexpr char kFooter[] =
     R"(Findings, as --fail-on takes them: clear, known-bad, name-as-password, empty, reused, reversible, unsalted,
-des-crypt, malformed, wrapped, salted-fast, no-password, unopened, unknown, broken. The number of a finding is one of
-entries, that of a scheme or strength one of values. No password is shown, nor any part of a value.
+des-crypt, malformed, wrapped, salted-fast, no-password, unopened, unknown, broken, unchecked. The number of a finding is
+one of entries, that of a scheme or strength one of values. No password is shown, nor any part of a value.
 Passwords are compared where they can be read: clear ones, masked ones, and AES values that --keys opens. Equal values
 of unsalted schemes, and of AES without keys, count as reused as well. One-way values are tried only with
 --check-hashes.
@@ -73,6 +73,7 @@ std::bitset<kFindingCount> forbiddenBy(const Options& options) {
     forbidden.set(static_cast<size_t>(found - kFindings));
   }
   if (!options.accept.empty()) forbidden.set(kByAccept);
+  if (forbidden.any()) forbidden.set(static_cast<size_t>(Finding::kUnchecked));  // whatever it hides
   return forbidden;
 }
 
@@ -137,7 +138,11 @@ ExitCode run(const Options& options) {
   AuditRules rules;
   setRules(options, rules);
   std::optional<OutputFile> page;
-  if (!options.html.empty() && options.html != "-") page.emplace(options.html, kPageMode, options.force);
+  if (!options.html.empty() && options.html != "-") {
+    Place place(options.html, options.force);
+    nameLeftovers(place, nullptr);
+    page.emplace(std::move(place), kPageMode);
+  }
   Reuse reuse;
   Results results;
   ExitCode reading = kSuccess;
@@ -171,6 +176,7 @@ void setUpAudit(CLI::App& verb, ExitCode& exitCode) {
   addOption(verb, "--subtree-depth", options->subtreeDepth, "RDNs that name a subtree (default: 3)");
   const Argument attributes = addValues(verb, "--attribute", "an attribute that holds passwords");
   addFlag(verb, "--allow-binary", options->allowBinary, "accept values that open into bytes that are not text");
+  addMemoryLimit(verb);
   addOption(verb, "--threads", options->source.threads, "threads to work with (default: one a processor)")
       .between(1, 256);
   addFlag(verb, "--json", options->json, "the report as a JSON object");

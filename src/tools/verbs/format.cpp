@@ -101,7 +101,7 @@ ExitCode format(const Options& options) {
     maker.results.flush();
     return maker.exitCode();
   }
-  SecretSource passwords(options.passwordFile, options.end);
+  SecretSource passwords(options.passwordFile, kPasswordLine, options.end);
   Secret password = passwords.requireTwice("Password: ", "Password again: ", "password");
   size_t index = 1;
   do {

@@ -2,11 +2,9 @@
 // ldappw keys create: makes the two stash files.
 #include "verbs/keys.h"
 
-#include <unistd.h>
-
-#include <cstdio>
 #include <filesystem>
-#include <vector>
+#include <string>
+#include <utility>
 
 #include "base/messages.h"
 #include "base/signals.h"
@@ -37,7 +35,7 @@ bool sameFile(const std::string& a, const std::string& b) {
 }
 
 Secret askSeed(const std::string& seedFile) {
-  SecretSource source(seedFile);
+  SecretSource source(seedFile, kSeedLine);
   if (source.interactive()) message(kSeedAdvice);
   Secret seed = source.requireTwice("Seed: ", "Seed again: ", "seed");
   requireSeed(seed);
@@ -71,49 +69,29 @@ void showCreated(const Options& options, const KeyRecord* config, const KeyRecor
   message(kWriteDown);
 }
 
-// Names old files that are kept under a second name, unless the run fails.
-class KeptFiles {
- public:
-  void add(OutputFile& file) { names_.push_back(file.keepOld()); }
-  // Takes the new file of the directory back, where it has its name already.
-  void undo(const std::string& target) {
-    if (!target.empty()) names_[0].empty() ? unlink(target.c_str()) : rename(names_[0].c_str(), target.c_str());
-    for (const std::string& name : names_) {
-      if (!name.empty()) unlink(name.c_str());
-    }
-  }
-  void show() const {
-    for (const std::string& name : names_) {
-      if (!name.empty()) message("the old file is kept as " + name);
-    }
-  }
-
- private:
-  std::vector<std::string> names_;
-};
-
 // Both or none: no signal comes in between.
 void commitBoth(OutputFile& config, OutputFile& directory) {
   config.sync();
   directory.sync();
-  KeptFiles kept;
+  std::string kept[2];
   {
     const SignalBlock block;
-    kept.add(directory);
-    kept.add(config);
-    std::string named;
     try {
+      kept[0] = directory.keepOld();
+      kept[1] = config.keepOld();
       directory.giveName();
-      named = directory.target();
       config.giveName();
     } catch (const Failure&) {
-      kept.undo(named);
+      config.undo();
+      directory.undo();
       throw;
     }
   }
   directory.syncFolder();
   config.syncFolder();
-  kept.show();
+  for (const std::string& name : kept) {
+    if (!name.empty()) message("the old file is kept as " + name);
+  }
 }
 
 ExitCode createDirectory(const Options& options, const Secret& seed, const Secret& salt) {
@@ -124,23 +102,16 @@ ExitCode createDirectory(const Options& options, const Secret& seed, const Secre
 
 ExitCode createBoth(const Options& options, const Secret& seed, const Secret& salt) {
   const Failure sameTarget(kUsage, "--config and --directory are the same file");
-  const StashFolders locked({options.config, options.directory});
-  OutputFile config(options.config, kStashMode, options.force);
-  OutputFile directory(options.directory, kStashMode, options.force);
-  if (config.target() == directory.target()) throw sameTarget;
-  config.requireRoom(kStashRoom);
-  directory.requireRoom(kStashRoom);
-  char* syncText = nullptr;
-  const int code = createKeyStashFiles(config.temporaryPath().c_str(), directory.temporaryPath().c_str(), seed.c_str(),
-                                       &syncText, salt.empty() ? nullptr : salt.c_str());
-  const AllocatedText sync(syncText);
-  requireWritten(code, "the stash file " + options.config + " or " + options.directory);
-  const KeyRecord configRecord = readBack(config);
-  const KeyRecord directoryRecord = readBack(directory);
-  if (!sync || configRecord.sync() != sync.get() ||
-      !sameRecord(directoryRecord, deriveRecord(seed, directoryRecord.salt()))) {
-    throw Failure(kIoError, "the stash files do not hold what was to be written; nothing was replaced");
-  }
+  Place configPlace(options.config, options.force);
+  Place directoryPlace(options.directory, options.force);
+  if (configPlace.path() == directoryPlace.path()) throw sameTarget;
+  const StashFolders locked({&configPlace, &directoryPlace});
+  OutputFile config(std::move(configPlace), kStashMode);
+  OutputFile directory(std::move(directoryPlace), kStashMode);
+  const KeyRecord configRecord = drawRecord();
+  const KeyRecord directoryRecord = deriveRecord(seed, salt.view());
+  writeStash(config, configRecord);
+  writeStash(directory, directoryRecord);
   commitBoth(config, directory);
   showCreated(options, &configRecord, directoryRecord);
   return kSuccess;
@@ -156,7 +127,7 @@ ExitCode create(const Options& options) {
   Secret salt;
   if (!options.saltFile.empty()) salt = readSaltFile(options.saltFile);
   const Secret seed = askSeed(options.seedFile);
-  if (alone && salt.empty()) salt = drawSalt();
+  if (salt.empty()) salt = drawSalt();
   return (alone ? createDirectory : createBoth)(options, seed, salt);
 }
 

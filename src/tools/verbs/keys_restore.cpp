@@ -16,7 +16,7 @@ struct Options : SeedOptions {
 
 Secret readSalt(const Options& options, SecretSource& seedSource) {
   if (!options.saltFile.empty()) return readSaltFile(options.saltFile);
-  SecretSource input("");
+  SecretSource input("", kSaltLine);
   SecretSource& source = options.seedFile.empty() ? seedSource : input;
   Secret salt = source.require("Salt: ", "salt");
   requireSalt(salt);
@@ -32,7 +32,7 @@ bool syncMatches(const KeyRecord& record, const std::string& sync) {
 ExitCode restore(const Options& options) {
   refuseSecrets(options.secrets, "seed");
   requireProvider();
-  SecretSource source(options.seedFile);
+  SecretSource source(options.seedFile, kSeedLine);
   const Secret seed = source.require("Seed: ", "seed");
   requireSeed(seed);
   const Secret salt = readSalt(options, source);

@@ -84,6 +84,7 @@ void setUpLdif(CLI::App& verb, ExitCode& exitCode) {
   addFlag(verb, "--allow-clear", options->allowClear, "allow --to clear");
   addFlag(verb, "--allow-binary", options->allowBinary,
           "accept values that open into bytes that are not text; a wrong key gives such bytes now and then");
+  addMemoryLimit(verb);
   addOption(verb, "--threads", options->source.threads, "threads to work with (default: one a processor)")
       .between(1, 256);
   addFlag(verb, "--verbose", options->verbose, "in an audit, report every value");

@@ -8,6 +8,7 @@
 
 #include "base/input.h"
 #include "schemes/key_record.h"
+#include "schemes/memory_budget.h"
 
 namespace tool {
 
@@ -118,6 +119,12 @@ void addCosts(CLI::App& verb, Costs& costs) {
   }
 }
 
+void addMemoryLimit(CLI::App& verb) {
+  verb.add_option_function<std::uint32_t>("--memory-limit", setMemoryLimit,
+                                          "MiB for costly values, of all threads (default: a quarter of the machine's)")
+      ->check(CLI::Range(1U, UINT32_MAX));
+}
+
 // A value list of the parser's own would split a value that is wrapped in brackets and drop "{}".
 Argument addValues(CLI::App& verb, const std::string& name, const std::string& help) {
   constexpr int kMany = 1 << 20;
@@ -138,7 +145,7 @@ void forEachValue(const Argument& given, char end, Results& results, const Value
     work(Secret(value), index, "value " + std::to_string(index));
   }
   if (given.empty()) {
-    LineReader lines(Input(), end);
+    LineReader lines(Input(), kValueLine, end);
     Secret value;
     while (lines.next(value)) {
       ++index;

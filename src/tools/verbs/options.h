@@ -83,6 +83,9 @@ Argument addKeys(CLI::App& verb, const std::string& name, std::vector<std::strin
 // The options for what new values cost.
 void addCosts(CLI::App& verb, Costs& costs);
 
+// --memory-limit, for the values of costly schemes that are worked on at once.
+void addMemoryLimit(CLI::App& verb);
+
 // Any number of positional values.
 Argument addValues(CLI::App& verb, const std::string& name, const std::string& help);
 

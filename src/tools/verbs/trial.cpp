@@ -143,7 +143,7 @@ std::optional<Candidate> candidateOf(const RecordWalker& walker, const KeyRecord
   Secret opened;
   if (kind == Kind::kClear) {
     ++counts.clear;
-    return Candidate{walker.lineNumber(), walker.dn(), Secret(password.value.view())};
+    return Candidate{walker.lineNumber(), shownDn(walker.dn()), Secret(password.value.view())};
   }
   ++(kind != Kind::kReversible ? counts.others : openValue(value, keys, opened).ok() ? counts.read : counts.unread);
   return std::nullopt;

@@ -28,7 +28,7 @@ Secret storedValue(const Options& options) {
     throw Failure(kUsage, "give either a VALUE or --value-file");
   }
   if (!options.value.empty()) return Secret(options.value.results().front());
-  return firstLine(options.valueFile, "value");
+  return firstLine(options.valueFile, kValueLine);
 }
 
 void warnOfCut(const Scheme& scheme, const Secret& password) {

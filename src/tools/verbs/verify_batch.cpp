@@ -3,8 +3,9 @@
 // come by in the export, on whatever thread it does.
 #include "verbs/verify_batch.h"
 
+#include <map>
 #include <mutex>
-#include <unordered_map>
+#include <string>
 #include <vector>
 
 #include "base/input.h"
@@ -63,7 +64,7 @@ class Answers {
 // Calls work with what stands before and after the first tab of each record, or with nothing where there is no tab.
 template <typename Work>
 void forEachRecord(const BatchOptions& options, Work work) {
-  LineReader lines(Input(options.file), options.null ? '\0' : '\n');
+  LineReader lines(Input(options.file), kValueLine, options.null ? '\0' : '\n');
   Secret line;
   while (lines.next(line)) {
     const size_t tab = line.view().find('\t');
@@ -85,6 +86,8 @@ ExitCode checkValues(const BatchOptions& options, const KeyRecord& key) {
 #ifdef LDAPPW_WITH_LDIF
 constexpr Status kNoEntry{kBadValue, "the export has no such entry"};
 constexpr Status kNoPassword{kBadValue, "the entry has no password"};
+constexpr size_t kMostPasswords = 100;  // each is tried on each value of the entry
+constexpr Status kTooMany{kBadValue, "the batch has more than 100 passwords for this entry"};
 
 // DNs as they are compared: without regard to case, and to blanks beside the separators.
 std::string plainName(std::string_view dn) {
@@ -111,20 +114,27 @@ struct Answer {
 
 class Waiting {
  public:
+  using Places = std::multimap<std::string, size_t>;  // sorted: a batch fills it
+  using Range = std::pair<Places::const_iterator, Places::const_iterator>;
+
   explicit Waiting(const BatchOptions& options) {
     forEachRecord(options, [&](const Secret& dn, const Secret& password, bool whole, bool) {
-      if (whole) places_.emplace(plainName(dn.view()), passwords_.size());
+      const std::string name = plainName(dn.view());
+      const bool waits = whole && places_.count(name) < kMostPasswords;
+      if (waits) places_.emplace(name, passwords_.size());
       passwords_.emplace_back(password.view());
-      answers_.push_back({Known::kNothing, whole ? kNoEntry : kNoTab});
+      answers_.push_back({Known::kNothing, waits ? kNoEntry : whole ? kTooMany : kNoTab});
     });
   }
 
-  void meet(const std::string& dn) {
-    if (places_.count(plainName(dn)) > 0)
-      settle(plainName(dn), [](const Secret&) { return Answer{Known::kEntry, kNoPassword}; });
+  // The records for an entry that has come by.
+  Range enter(const std::string& dn) {
+    const Range range = places_.equal_range(plainName(dn));
+    settle(range, [](const Secret&) { return Answer{Known::kEntry, kNoPassword}; });
+    return range;
   }
-  void meet(const std::string& dn, const Secret& value, const KeyRecord& key, bool clear) {
-    settle(plainName(dn), [&](const Secret& password) {
+  void meet(const Range& range, const Secret& value, const KeyRecord& key, bool clear) {
+    settle(range, [&](const Secret& password) {
       const Status status = check(value, key, password, clear);
       const Known known = status.ok() ? Known::kMatch : status.code == kNoMatch ? Known::kNoMatch : Known::kProblem;
       return Answer{known, status};
@@ -135,9 +145,8 @@ class Waiting {
 
  private:
   template <typename Find>
-  void settle(const std::string& name, Find find) {
-    const auto places = places_.equal_range(name);
-    for (auto place = places.first; place != places.second; ++place) {
+  void settle(const Range& range, Find find) {
+    for (auto place = range.first; place != range.second; ++place) {
       const Answer found = find(passwords_[place->second]);
       const std::lock_guard<std::mutex> lock(mutex_);
       Answer& answer = answers_[place->second];
@@ -145,7 +154,7 @@ class Waiting {
     }
   }
 
-  std::unordered_multimap<std::string, size_t> places_;
+  Places places_;
   std::vector<Secret> passwords_;
   std::vector<Answer> answers_;
   std::mutex mutex_;
@@ -158,12 +167,13 @@ ExitCode checkEntries(const BatchOptions& options, const KeyRecord& key) {
   Input input = openExport(source);
   const auto work = [&](RecordWalker& walker, ExportPart&) {
     std::uint64_t entries = 0;
+    Waiting::Range range;
     while (walker.next()) {
-      if (walker.entries() > entries) waiting.meet(walker.dn());
+      if (walker.entries() > entries) range = waiting.enter(walker.dn());
       entries = walker.entries();
       const bool current = walker.atPassword() && walker.password().history.empty();
       if (current && walker.password().form == ValueForm::kBytes) {
-        waiting.meet(walker.dn(), walker.password().value, key, options.clear);
+        waiting.meet(range, walker.password().value, key, options.clear);
       }
     }
   };
