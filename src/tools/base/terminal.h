@@ -21,8 +21,8 @@ class SecretSource {
   bool interactive() const noexcept { return interactive_; }
   // The next secret, or false at the end. At a terminal, prompt (a static text) asks for it and a line is read without
   // echo. Throws Failure: kUsage when the terminal's input ends without a line, kBadValue for a line beyond the limit,
-  // kIoError otherwise. A line that ends in a carriage return, or begins with a byte order mark, is taken as it is, with
-  // a warning.
+  // kIoError otherwise. A line that ends in a carriage return, or begins with a byte order mark, is taken as it is,
+  // with a warning.
   bool next(const char* prompt, Secret& out);
   // The same where there has to be one: what names it in the message.
   Secret require(const char* prompt, const char* what);
