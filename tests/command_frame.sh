@@ -37,16 +37,6 @@ check() {
   [[ $text =~ ^($pattern)$ ]] || fail "$name: printed '$text'"
 }
 
-# rows: standard input has lines "name|code|pattern|arguments", the arguments quoted as for the shell; each is a check,
-# with the line "secret" as its input.
-rows() {
-  local name code pattern arguments
-  while IFS='|' read -r name code pattern arguments; do
-    eval "set -- $arguments"
-    check "$name" "$code" "$pattern" "$@" <<<secret
-  done
-}
-
 same() { [ "$2" = "$3" ] || fail "$1: '$3', not '$2'"; }                             # NAME EXPECTED GOT
 sameFile() { cmp -s "$2" "$3" || fail "$1: $(diff -a "$2" "$3" | head -5 | cut -c -200)"; }  # NAME EXPECTED GOT
 said() { grep -qaE -- "$2" err || fail "$1: '$2' was not said but '$(head -c 300 err)'"; }   # NAME PATTERN

@@ -80,7 +80,7 @@ TEST(RecordWalker, FindsPasswords) {
 }
 
 TEST(LogicalLines, FoldAt76) {
-  for (const size_t bytes : {0, 75, 76, 77, 151, 152, 300}) {
+  for (const size_t bytes : std::vector<size_t>{0, 75, 76, 77, 151, 152, 300}) {
     const std::string text(bytes, 'x');
     Secret folded;
     tool::foldInto(text, "\r\n", folded);

@@ -106,7 +106,7 @@ TEST_F(Folder, ManyValues) {
   std::istringstream made(ran({"format", "--scheme", "crypt"}, values.substr(0, 3300)).out);
   std::set<char> salts[2];
   for (std::string value; std::getline(made, value);) {
-    for (const size_t i : {0, 1}) salts[i].insert(value[7 + i]);
+    for (const size_t i : {size_t{0}, size_t{1}}) salts[i].insert(value[7 + i]);
   }
   EXPECT_GT(std::min(salts[0].size(), salts[1].size()), 30U);  // of 64 characters, in 100 draws
 }

@@ -121,6 +121,8 @@ test_stop_in_order() {
   local command=$! rc
   exec 9>changes; cat small >&9
   until_true compgen -G '.stopped.*'
+  waitsForInput() { [[ $(ps -o stat= $command) == S* ]]; }  # and is ready for signals
+  until_true waitsForInput
   kill -TERM $command; cat small >&9; exec 9>&-; wait $command; rc=$?
   same 'a stop in order' "143 $(grep -c '^dn' stopped) 1" \
     "$rc $(grep -c '^add: ' stopped) $(grep -c 'stopped before the end' err)"
