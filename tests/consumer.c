@@ -13,25 +13,6 @@
 #include "encoding_utils.h"
 #include "password_schemes.h"
 
-/* Offsets and sizes of the public records, with pointers of 4 and of 8 bytes. */
-#define LAYOUT(what, with4, with8) _Static_assert((what) == (sizeof(void*) == 8 ? (with8) : (with4)), #what)
-LAYOUT(sizeof(SecBuffer), 8, 16);
-LAYOUT(offsetof(SecBuffer, data), 0, 0);
-LAYOUT(offsetof(SecBuffer, length), 4, 8);
-LAYOUT(sizeof(AesKeyData), 40, 80);
-LAYOUT(offsetof(AesKeyData, cryptoSync), 0, 0);
-LAYOUT(offsetof(AesKeyData, cryptoSalt), 8, 16);
-LAYOUT(offsetof(AesKeyData, aesKeys), 16, 32);
-LAYOUT(sizeof(QelStatus), 268, 268);
-LAYOUT(offsetof(QelStatus, minRC), 4, 4);
-LAYOUT(offsetof(QelStatus, desc), 8, 8);
-LAYOUT(sizeof(sha_digest), 20, 20);
-LAYOUT(sizeof(ldappw_crypt_data), 898, 898);
-LAYOUT(_Alignof(ldappw_crypt_data), 1, 1);
-LAYOUT(offsetof(ldappw_crypt_data, KS), 48, 48);
-LAYOUT(offsetof(ldappw_crypt_data, block), 816, 816);
-LAYOUT(offsetof(ldappw_crypt_data, iobuf), 882, 882);
-
 #define CHECK(condition)                                                    \
   do {                                                                      \
     if (!(condition)) {                                                     \

@@ -169,18 +169,4 @@ TEST(SaltedAndUnsalted, FailAsTheyPromise) {
   EXPECT_EQ(out, kept);
 }
 
-TEST(SaltedAndUnsalted, WriteTheirLinesAboutEnteringAndLeaving) {
-  char* out = nullptr;
-  const TraceCapture trace;
-  saltedHashEncrypt("secret", &out, nullptr);
-  saltedHashVerify("secret", "secret", nullptr);
-  unsaltedHashEncrypt("SHA1", nullptr, &out);
-  EXPECT_EQ(outlineOf(trace),
-            ">saltedHashEncrypt: Entering. clear = #, out = #, digestName = (nil)\n"
-            "Error - saltedHashEncrypt: Invalid parameter. rc = 1\nsaltedHashEncrypt: Leaving. rc = 1\n<"
-            ">saltedHashVerify: Entering. clear = #, stored = #, digestName = (nil)\n"
-            "Error - saltedHashVerify: Invalid parameter. rc = 1\nsaltedHashVerify: Leaving. rc = 1\n<"
-            ">unsaltedHashEncrypt: Leaving. rc=1\n<");
-}
-
 }  // namespace

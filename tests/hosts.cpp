@@ -102,10 +102,20 @@ void useTheOthers() {
   std::free(back);
 }
 
+void changeSink() {
+  ldtr_set_sink([](const ldtr_record*, void*) {}, nullptr);
+}
+
+// The trace gets another sink meanwhile, again and again.
 void worksInThreads() {
+  changeSink();
+  trcEvents = LDTR_EVENT_DEBUG;
   inThreads(16, [](unsigned number) {
     useTheOthers();
-    for (unsigned round = 0; round < 200; ++round) useEachScheme(number + round);
+    for (unsigned round = 0; round < 200; ++round) {
+      useEachScheme(number + round);
+      changeSink();
+    }
   });
 }
 

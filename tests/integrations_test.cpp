@@ -243,7 +243,7 @@ berval bervalOf(std::string& text) {
   return {text.size(), text.data()};
 }
 
-// Loads the module as slapd does, stores and checks one password under each scheme from several threads, and ends.
+// Loads the module as slapd does, stores and checks one password under each scheme, and ends.
 [[noreturn]] void runSlapd(std::vector<std::string> arguments) {
   alarm(60);
   void* handle = openPlugin(LDAPPW_SLAPD_MODULE);
@@ -251,31 +251,19 @@ berval bervalOf(std::string& text) {
   for (std::string& argument : arguments) argv.push_back(argument.data());
   const int started =
       reinterpret_cast<int (*)(int, char**)>(dlsym(handle, "init_module"))(static_cast<int>(argv.size()), argv.data());
-  const auto work = [] {
-    for (const Registered& row : registered) {
-      std::string password = "horse";
-      const berval clear = bervalOf(password);
-      const char* text = nullptr;
-      berval value{};
-      if (row.hash == nullptr) {
-        std::fprintf(stderr, "[%s cannot be made %d]\n", row.name->bv_val,
-                     row.check(row.name, &clear, &clear, nullptr));
-      } else if (row.hash(row.name, &clear, &value, &text) != 0) {
-        std::string known = make(*plugin::findScheme(row.name->bv_val), password, keys().data).substr(row.name->bv_len);
-        const berval payload = bervalOf(known);
-        std::fprintf(stderr, "[%s: %s %d]\n", row.name->bv_val, text, row.check(row.name, &payload, &clear, nullptr));
-      } else {
-        const berval payload{value.bv_len - row.name->bv_len, value.bv_val + row.name->bv_len};
-        std::fprintf(stderr, "[%s %d %d]\n", row.name->bv_val, row.check(row.name, &payload, &clear, nullptr),
-                     row.check(row.name, &payload, &value, nullptr));
-        ber_memfree(value.bv_val);
-      }
-    }
-  };
-  std::vector<std::thread> threads;
-  for (int i = 1; i < 4; ++i) threads.emplace_back(work);
-  work();
-  for (std::thread& thread : threads) thread.join();
+  for (const Registered& row : registered) {
+    std::string password = "horse", known = password;
+    const berval clear = bervalOf(password);
+    const char* text = "cannot be made";
+    berval value{};
+    const bool isMade = row.hash != nullptr && row.hash(row.name, &clear, &value, &text) == 0;
+    if (row.hash != nullptr) known = make(*plugin::findScheme(row.name->bv_val), password, keys().data);
+    std::string payload = (isMade ? value.bv_val : known).substr(row.hash != nullptr ? row.name->bv_len : 0);
+    const berval stored = bervalOf(payload);
+    std::fprintf(stderr, "[%s %s %d]\n", row.name->bv_val, isMade ? "made" : text,
+                 row.check(row.name, &stored, &clear, nullptr));
+    ber_memfree(value.bv_val);
+  }
   reinterpret_cast<int (*)()>(dlsym(handle, "term_module"))();
   std::exit(started == 0 ? 0 : 1);
 }
@@ -288,20 +276,13 @@ TEST(SlapdDeathTest, ServesWhatItsArgumentsSay) {
     int code;
     const char* said;
   } rows[] = {
-      {{file}, 0, "\\[.qVEIL. 0 -1\\](.|\n)*\\[.AES256. 0 -1\\](.|\n)*\\[.VLDL. cannot be made -1\\]"},
-      {{file, "schemes=SSHA,{crypt},md5,sha"},
-       0,
-       "\\[.qVEIL.: this scheme is not served -1\\](.|\n)*\\[.SSHA. 0 -1\\]"},
+      {{file}, 0, "\\[.qVEIL. made 0\\](.|\n)*\\[.AES256. made 0\\](.|\n)*\\[.VLDL. cannot be made -1\\]"},
+      {{file, "schemes=SSHA,{crypt},md5,"}, 0, "\\[.qVEIL. this scheme is not served -1\\](.|\n)*\\[.SSHA. made 0\\]"},
       {{"keys=/"},
        0,
-       "file /: Is a directory; no value of .*(.|\n)*\\[.qVEIL. 0 -1\\](.|\n)*.AES128.: the server has no keys for "
-       "this "
-       "scheme -1\\]"},
-      {{"keys="}, 0, "file : No such file or directory; no value of"},
-      {{"schemes=qveil,"}, 0, "\\[.qVEIL. 0 -1\\]"},
+       "file /: Is a directory; no value of .*(.|\n)*.AES128. the server has no keys for this scheme -1\\]"},
       {{"schemes="}, 1, "unknown scheme \"\" in schemes="},
       {{"schemes=qveil", "schemes=sha"}, 1, "unknown or repeated argument \"schemes=sha\"; there are keys=FILE and"},
-      {{"Keys=x"}, 1, "unknown or repeated argument \"Keys=x\""},
   };
   for (const auto& row : rows) EXPECT_EXIT(runSlapd(row.arguments), testing::ExitedWithCode(row.code), row.said);
 }
@@ -363,7 +344,6 @@ TEST(DirectoryServer389DeathTest, EachEntryPointIsAScheme) {
       {"ldappw_qveil_init", {}, 0, "^\\[qVEIL .qVEIL 0 -1\\]"},
       {"ldappw_aes128_init", {file}, 0, "^\\[AES128 .AES12 0 -1\\]"},
       {"ldappw_aes192_init", {file}, 0, "^\\[AES192 .AES19 0 -1\\]"},
-      {"ldappw_aes256_init", {file}, 0, "^\\[AES256 .AES25 0 -1\\]"},
       {"ldappw_aes256_init",
        {},
        0,

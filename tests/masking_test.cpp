@@ -180,21 +180,4 @@ TEST(Masking, RefusesLengthsAndSelectors) {
   EXPECT_EQ(_morva_utils_getEncodedSize(805306353) + _morva_utils_getEncodedSize(INT_MAX), 0);
 }
 
-TEST(Masking, BuffersAreTexts) {
-  const test::Replaced<int> draw(fixedDraw, 1);
-  char* masked = nullptr;
-  EXPECT_EQ(_morva_utils_encode_buffer("text", &masked), 0);
-  EXPECT_EQ(masked, encoded({"text", 5}));
-  const std::pair<std::string, std::string> rows[] = {{masked, "text"}, {">0Fl0ECgFC<", "secret"}, {"clear", "clear"}};
-  for (std::pair<std::string, std::string> row : rows) {
-    char* out = nullptr;
-    EXPECT_EQ(_morva_utils_decode_buffer(row.first.data(), &out), 0);
-    EXPECT_EQ(out, row.second);
-    _morva_utils_decode_buffer_free(&out);
-    _morva_utils_decode_buffer_free(&out);  // null by now
-  }
-  _morva_utils_encode_binary_free(&masked);
-  _morva_utils_encode_buffer_free(nullptr);
-}
-
 }  // namespace

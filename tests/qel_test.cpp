@@ -347,59 +347,49 @@ TEST_F(Qel, EveryEntryRefusesForeignHandles) {
   }
   EXPECT_EQ(QEL_Cleanup(other.ctx, &lastStatus), 0);
   EXPECT_EQ(lastStatus.minRC, 2);
-  EXPECT_STREQ(lastStatus.desc, "a handle is not live in this provider context, or of another kind");
 }
 
 TEST_F(Qel, EveryMisuseHasItsReason) {
-  const std::string unknown = "3 not an algorithm's name", state = "5 the context needs an init for this step";
-  const std::string noOutput = "1 there is no output", noKey = "1 the key or its initial vector is null";
-  const std::string keyLength = "4 the cipher has no keys of this length", noBuffer = "1 the buffer is null";
-  const std::string longName(5000, 'S'), noWhole = "11 the last block is not whole";
-  const auto refusal = [this](bool worked) {
-    const std::string why = worked ? "" : std::to_string(reason()) + " " + lastStatus.desc;
-    return why;
-  };
-  EXPECT_EQ(refusal(h.finds(nullptr)), "1 not an algorithm's name");
-  EXPECT_EQ(refusal(h.finds(longName.c_str())), unknown);
-  EXPECT_EQ(refusal(h.finds("") || h.finds("SHA") || h.finds("AES-128-ECB")), unknown);
-  EXPECT_EQ(refusal(QEL_EVP_MD_size(h.ctx, nullptr) != 0), "1 a handle is null");
-  EXPECT_EQ(refusal(h.update(secret)), state);
-  EXPECT_EQ(refusal(h.digestInit() && h.update(nullptr)), "1 the data is null");
-  EXPECT_EQ(refusal(QEL_EVP_DigestFinal(h.ctx, h.digestCtx, nullptr, nullptr)), noOutput);
-  EXPECT_EQ(refusal(h.digestFinal() && h.digestFinal()), state);
-  EXPECT_EQ(refusal(h.digestInit() && h.freshDigest() && h.digestFinal()), state);
-  EXPECT_EQ(refusal(QEL_EVP_CIPHER_CTX_cipher(h.ctx, h.cipherCtx) != nullptr),
-            "5 the cipher context has no cipher yet");
-  EXPECT_EQ(refusal(QEL_EVP_DecryptInit(h.ctx, h.cipherCtx, h.cipher, secret, nullptr)), noKey);
-  EXPECT_EQ(refusal(h.encryptInit() && h.decrypt(1)), state);
-  EXPECT_EQ(refusal(h.encrypt(-1) || h.encrypt(INT_MAX)), "4 the input length cannot be served");
-  EXPECT_EQ(refusal(QEL_EVP_EncryptInit(h.ctx, h.cipherCtx, h.cipher, nullptr, secret)), noKey);
-  EXPECT_EQ(refusal(h.encrypt(1)), state);
+  const std::string longName(5000, 'S');
+  const auto refusal = [this](bool worked) { return worked ? 0 : reason(); };
+  EXPECT_EQ(refusal(h.finds(nullptr)), 1);
+  EXPECT_EQ(refusal(h.finds(longName.c_str())), 3);
+  EXPECT_EQ(refusal(h.finds("") || h.finds("SHA") || h.finds("AES-128-ECB")), 3);
+  EXPECT_EQ(refusal(QEL_EVP_MD_size(h.ctx, nullptr) != 0), 1);
+  EXPECT_EQ(refusal(h.update(secret)), 5);
+  EXPECT_EQ(refusal(h.digestInit() && h.update(nullptr)), 1);
+  EXPECT_EQ(refusal(QEL_EVP_DigestFinal(h.ctx, h.digestCtx, nullptr, nullptr)), 1);
+  EXPECT_EQ(refusal(h.digestFinal() && h.digestFinal()), 5);
+  EXPECT_EQ(refusal(h.digestInit() && h.freshDigest() && h.digestFinal()), 5);
+  EXPECT_EQ(refusal(QEL_EVP_CIPHER_CTX_cipher(h.ctx, h.cipherCtx) != nullptr), 5);
+  EXPECT_EQ(refusal(QEL_EVP_DecryptInit(h.ctx, h.cipherCtx, h.cipher, secret, nullptr)), 1);
+  EXPECT_EQ(refusal(h.encryptInit() && h.decrypt(1)), 5);
+  EXPECT_EQ(refusal(h.encrypt(-1) || h.encrypt(INT_MAX)), 4);
+  EXPECT_EQ(refusal(QEL_EVP_EncryptInit(h.ctx, h.cipherCtx, h.cipher, nullptr, secret)), 1);
+  EXPECT_EQ(refusal(h.encrypt(1)), 5);
   ASSERT_TRUE(h.encryptInit());
-  EXPECT_EQ(refusal(QEL_EVP_EncryptUpdate(h.ctx, h.cipherCtx, nullptr, &outLength, out, 1)), noOutput);
-  EXPECT_EQ(refusal(QEL_EVP_EncryptUpdate(h.ctx, h.cipherCtx, out, &outLength, nullptr, 1)), "1 the input is null");
-  EXPECT_EQ(refusal(QEL_EVP_EncryptFinal(h.ctx, h.cipherCtx, out, nullptr)), noOutput);
-  EXPECT_EQ(refusal(h.encryptFinal() && h.encrypt(1)), state);
-  EXPECT_EQ(refusal(h.encryptInit() && h.setKeyLength(16)), keyLength);
-  EXPECT_EQ(refusal(h.freshCipher() && h.setKeyLength(16) && h.encryptInit()),
-            "4 the cipher has no keys of the length that was set");
-  EXPECT_EQ(refusal(h.setKeyLength(65) || h.setKeyLength(0)), keyLength);
-  EXPECT_EQ(refusal(h.setValue(2, "on") || h.setValue(-1, "on")), "7 no such value");
-  EXPECT_EQ(refusal(h.setValue(QEL_VALUE_STRICT, nullptr)), "1 the value is null");
-  EXPECT_EQ(refusal(h.setValue(QEL_VALUE_STRICT, "ON")), "8 the value is neither on nor off");
-  EXPECT_EQ(refusal(h.setValue(QEL_VALUE_LOAD_PATH, longName.c_str())), "6 the value is too long");
-  EXPECT_EQ(refusal(QEL_GetValue(h.ctx, nullptr, QEL_VALUE_STRICT, text, 2)), "9 the value is longer");
-  EXPECT_EQ(refusal(QEL_GetValue(h.ctx, nullptr, 2, text, 9)), "7 no such value");
-  EXPECT_EQ(refusal(QEL_GetValue(h.ctx, nullptr, QEL_VALUE_STRICT, nullptr, 9)), noBuffer);
-  EXPECT_EQ(refusal(QEL_GetStatus(h.ctx, nullptr)), "1 the status record is null");
-  EXPECT_EQ(refusal(QEL_RAND_bytes(h.ctx, out, -1)), "4 the count is negative");
-  EXPECT_EQ(refusal(QEL_RAND_bytes(h.ctx, reinterpret_cast<unsigned char*>(1), 20)), "12 the random generator failed");
-  EXPECT_EQ(refusal(QEL_RAND_seed(h.ctx, nullptr, 1)), noBuffer);
-  EXPECT_EQ(refusal(h.freshCipher() && h.setPadding(0) && h.encryptInit() && h.encrypt(5) && h.encryptFinal()),
-            noWhole);
-  EXPECT_EQ(refusal(h.decryptInit() && h.decrypt(17) && h.decryptFinal()), noWhole);
-  EXPECT_EQ(refusal(h.setPadding(1) && h.decryptInit() && h.decrypt(17) && h.decryptFinal()), noWhole);
-  EXPECT_EQ(refusal(h.decryptInit() && h.decryptFinal()), noWhole);
+  EXPECT_EQ(refusal(QEL_EVP_EncryptUpdate(h.ctx, h.cipherCtx, nullptr, &outLength, out, 1)), 1);
+  EXPECT_EQ(refusal(QEL_EVP_EncryptUpdate(h.ctx, h.cipherCtx, out, &outLength, nullptr, 1)), 1);
+  EXPECT_EQ(refusal(QEL_EVP_EncryptFinal(h.ctx, h.cipherCtx, out, nullptr)), 1);
+  EXPECT_EQ(refusal(h.encryptFinal() && h.encrypt(1)), 5);
+  EXPECT_EQ(refusal(h.encryptInit() && h.setKeyLength(16)), 4);
+  EXPECT_EQ(refusal(h.freshCipher() && h.setKeyLength(16) && h.encryptInit()), 4);
+  EXPECT_EQ(refusal(h.setKeyLength(65) || h.setKeyLength(0)), 4);
+  EXPECT_EQ(refusal(h.setValue(2, "on") || h.setValue(-1, "on")), 7);
+  EXPECT_EQ(refusal(h.setValue(QEL_VALUE_STRICT, nullptr)), 1);
+  EXPECT_EQ(refusal(h.setValue(QEL_VALUE_STRICT, "ON")), 8);
+  EXPECT_EQ(refusal(h.setValue(QEL_VALUE_LOAD_PATH, longName.c_str())), 6);
+  EXPECT_EQ(refusal(QEL_GetValue(h.ctx, nullptr, QEL_VALUE_STRICT, text, 2)), 9);
+  EXPECT_EQ(refusal(QEL_GetValue(h.ctx, nullptr, 2, text, 9)), 7);
+  EXPECT_EQ(refusal(QEL_GetValue(h.ctx, nullptr, QEL_VALUE_STRICT, nullptr, 9)), 1);
+  EXPECT_EQ(refusal(QEL_GetStatus(h.ctx, nullptr)), 1);
+  EXPECT_EQ(refusal(QEL_RAND_bytes(h.ctx, out, -1)), 4);
+  EXPECT_EQ(refusal(QEL_RAND_bytes(h.ctx, reinterpret_cast<unsigned char*>(1), 20)), 12);
+  EXPECT_EQ(refusal(QEL_RAND_seed(h.ctx, nullptr, 1)), 1);
+  EXPECT_EQ(refusal(h.freshCipher() && h.setPadding(0) && h.encryptInit() && h.encrypt(5) && h.encryptFinal()), 11);
+  EXPECT_EQ(refusal(h.decryptInit() && h.decrypt(17) && h.decryptFinal()), 11);
+  EXPECT_EQ(refusal(h.setPadding(1) && h.decryptInit() && h.decrypt(17) && h.decryptFinal()), 11);
+  EXPECT_EQ(refusal(h.decryptInit() && h.decryptFinal()), 11);
 }
 
 // With what the context holds back, and how far the output lies behind the input: what would overwrite input that is

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a process has left in its memory when it exits: nothing of a password, a seed or a key. Each case is a program
-// of its own, either the command or this one with the case's name, which gets its secrets through a pipe and is stopped
-// as it exits; then all memory that it could write is searched, and so is what it has logged with everything traced.
+// What a process has left in its memory when it exits: nothing of a password, a seed or a key. Each case is a
+// run of the command, or of this program as the control, which gets its secrets through a pipe and is stopped as it
+// exits; then all memory that it could write is searched, and so is what it has logged with everything traced.
 #include <fcntl.h>
 #include <sys/ptrace.h>
 #include <sys/wait.h>
@@ -18,10 +18,10 @@
 #include <random>
 #include <sstream>
 #include <string>
-#include <utility>
 #include <vector>
 
-#include "crypto_provider.h"
+#include "aes_keys.h"
+#include "encoding_utils.h"
 #include "password_schemes.h"
 
 namespace {
@@ -29,122 +29,12 @@ namespace {
 using Words = std::vector<std::string>;
 
 constexpr size_t kSecretBytes = 24;
-constexpr char kConfig[] = "cfg.stash", kDirectory[] = "dir.stash", kMade[] = "made.stash", kLog[] = "log";
+constexpr char kConfig[] = "cfg.stash", kDirectory[] = "dir.stash", kLog[] = "log";
 
-// ---- The cases of this program; the secret lies in the buffer and is wiped by its owner ----
-
-char secret[kSecretBytes + 1];
-
-const unsigned char* bytesOfSecret() {
-  return reinterpret_cast<const unsigned char*>(secret);
-}
-
-void useSchemes() {
-  AesKeyData* keys = nullptr;
-  char salt[] = "ab", value[1024];
-  setAESKeyData(kDirectory, &keys);
-  for (const int scheme : {2, 3, 4, 9, 128, 133, 134, 135}) {
-    char* clear = nullptr;
-    const int length = format_password(scheme, salt, keys, secret, kSecretBytes, value, sizeof value);
-    verify_password(secret, kSecretBytes, value, length, 1, keys);
-    verify_password("wrong", 5, value, length, 1, keys);
-    morva_decodePW(&clear, std::string(value, value + length).c_str(), keys);
-    _morva_utils_decode_buffer_free(&clear);
-  }
-  freeAesKeyData(keys);
-}
-
-void failInSchemes() {
-  void* context = nullptr;
-  initQelCrypto(&context);
-  pQEL_EVP_DigestFinal = [](auto...) { return 0; };
-  pQEL_EVP_EncryptFinal = pQEL_EVP_DecryptFinal = [](auto...) { return 0; };
-  useSchemes();
-}
-
-void useOperations() {
-  char *made = nullptr, *clear = nullptr;
-  unsigned char* bytes = nullptr;
-  int length = 0;
-  sha_digest digest;
-  SecBuffer key{reinterpret_cast<unsigned char*>(secret), kSecretBytes};
-  SHA(secret, kSecretBytes, &digest);
-  _crypt(secret, "ab");
-  for (const char* name : {"SHA1", "none"}) {
-    saltedHashEncrypt(secret, &made, name);
-    saltedHashVerify(secret, made, name);
-    free(std::exchange(made, nullptr));
-    unsaltedHashEncrypt(name, secret, &made);
-    free(std::exchange(made, nullptr));
-  }
-  for (const char* cipher : {"AES-192-CBC", "none"}) {
-    aesEncryptBuffer(secret, &made, cipher, &key, &key, kSecretBytes);
-    aesDecryptBuffer(made, &clear, cipher, &key, &key, nullptr);
-    _morva_utils_decode_buffer_free(&clear);
-    aesDecryptBuffer("{damaged}", &clear, cipher, &key, &key, nullptr);
-    free(std::exchange(made, nullptr));
-  }
-  _morva_utils_encode_buffer(secret, &made);
-  _morva_utils_decode_buffer(made, &clear);
-  _morva_utils_decode_buffer_free(&clear);
-  made[std::strlen(made) - 1] ^= 1;
-  _morva_utils_decode_buffer(made, &clear);
-  _morva_utils_decode_buffer_free(&clear);
-  _morva_utils_encode_buffer_free(&made);
-  _morva_utils_encode_binary(bytesOfSecret(), kSecretBytes, &made);
-  _morva_utils_decode_binary(made, &bytes, &length);
-  explicit_bzero(bytes, static_cast<size_t>(length));
-  free(bytes);
-  _morva_utils_encode_binary_free(&made);
-}
-
-void makeKeys() {
-  AesKeyData *keys = nullptr, *copy = nullptr;
-  char* sync = nullptr;
-  restoreKeyStashFile(kMade, secret, "saltsaltsalt");
-  restoreKeyStashFile("/dev/full", secret, "saltsaltsalt");
-  createKeyStashFiles(kMade, kMade, secret, &sync, nullptr);
-  createKeyStashFiles("/dev/full", kMade, secret, &sync, nullptr);
-  validateCryptoString(secret, 0);
-  genTmpKeyDataVal(secret, "saltsaltsalt", &keys);
-  freeAesKeyData(keys);
-  free(sync);
-  initAesKeyData(&keys);
-  std::memcpy(keys->aesKeys[1].data, secret, kSecretBytes);
-  copyAesKeyData(keys, &copy);
-  freeAesKeyData(copy);
-  freeAesKeyData(keys);
-}
-
-// The key that is looked for comes from the file.
-void loadKeys() {
-  AesKeyData *keys = nullptr, *half = nullptr;
-  std::filesystem::copy_file(kDirectory, "half.stash", std::filesystem::copy_options::overwrite_existing);
-  std::filesystem::resize_file("half.stash", std::filesystem::file_size(kDirectory) - 1);
-  setAESKeyData(kDirectory, &keys);
-  setAESKeyData("half.stash", &half);
-  readKeyStashFile(kDirectory, keys);
-  freeAesKeyData(keys);
-  freeAesKeyData(half);
-}
-
-void leaveACopy() {
-  [[maybe_unused]] static char* copy = strdup(secret);
-}
-
-const struct {
-  const char* name;
-  void (*run)();
-} kOwnCases[] = {{"leaves a copy", leaveACopy},      {"uses schemes", useSchemes}, {"fails in schemes", failInSchemes},
-                 {"uses operations", useOperations}, {"makes keys", makeKeys},     {"loads keys", loadKeys}};
-
-int runOwnCase(const std::string& name) {
-  if (read(STDIN_FILENO, secret, kSecretBytes) != static_cast<ssize_t>(kSecretBytes)) return 2;
-  for (const auto& each : kOwnCases) {
-    if (name == each.name) each.run();
-  }
-  explicit_bzero(secret, sizeof secret);
-  return 0;
+// The control: a program that keeps what it reads.
+int leaveACopy() {
+  static char secret[kSecretBytes];
+  return read(STDIN_FILENO, secret, kSecretBytes) == static_cast<ssize_t>(kSecretBytes) ? 0 : 2;
 }
 
 // ---- The search ----
@@ -308,10 +198,9 @@ std::vector<Run> runsWith(const std::string& password, const std::string& seed) 
 }
 
 int examine(const std::string& command) {
-  const std::string self = "/proc/self/exe";
   std::mt19937 random{std::random_device{}()};
   const std::string password = randomText(random), seed = randomText(random);
-  if (leftBy({self, "leaves a copy"}, password, {password}).empty()) {
+  if (leftBy({"/proc/self/exe"}, password, {password}).empty()) {
     std::fputs("the search finds nothing\n", stderr);
     return 1;
   }
@@ -329,23 +218,17 @@ int examine(const std::string& command) {
     program.insert(program.end(), std::istream_iterator<std::string>(arguments), {});
     expectNothing(program, run);
   }
-  const std::string key = contentOf(kDirectory).substr(contentOf(kDirectory).size() - 32, 16);
-  for (const auto& each : kOwnCases) {
-    if (each.run == leaveACopy) continue;
-    expectNothing({self, each.name}, {each.name, each.run == makeKeys ? seed : password, {password, seed, key}});
-  }
   return failed;
 }
 
 }  // namespace
 
 int main(int argc, char** argv) {
-  const std::string argument = argc == 2 ? argv[1] : "";
-  if (argument.find('/') == std::string::npos) return runOwnCase(argument);
+  if (argc < 2) return leaveACopy();
   const std::filesystem::path folder = std::filesystem::temp_directory_path() / ("secrets-" + std::to_string(getpid()));
   std::filesystem::create_directory(folder);
   std::filesystem::current_path(folder);
-  const int failed = examine(argument);
+  const int failed = examine(argv[1]);
   std::filesystem::remove_all(folder);
   return failed;
 }

@@ -8,21 +8,13 @@
 
 namespace {
 
-thread_local bool watching = false;
-thread_local long counted = 0;
-thread_local long failing = -1;
-thread_local bool laterOnesToo = false;
-thread_local long live = 0;
-
-thread_local const std::string* soughtSecret = nullptr;
-thread_local long released = 0;
-thread_local long releasedWithSecret = 0;
+using test::watched;
 
 bool fails() {
-  if (!watching) return false;
-  const long number = counted++;
-  const bool failed = number == failing || (laterOnesToo && number > failing);
-  live += failed ? 0 : 1;
+  if (!watched.isCounting) return false;
+  const long number = watched.counted++;
+  const bool failed = number == watched.failing || (watched.andLater && number > watched.failing);
+  watched.live += failed ? 0 : 1;
   if (failed) errno = ENOMEM;
   return failed;
 }
@@ -82,53 +74,12 @@ char* __wrap_strdup(const char* text) {
 }
 void __wrap_free(void* data) {
   if (data != nullptr) checkFence(data);
-  if (data != nullptr && soughtSecret != nullptr) {
-    ++released;
-    const size_t bytes = malloc_usable_size(data);
-    if (memmem(data, bytes, soughtSecret->data(), soughtSecret->size()) != nullptr) ++releasedWithSecret;
+  if (data != nullptr && watched.secret != nullptr) {
+    const std::string& secret = *watched.secret;
+    if (memmem(data, malloc_usable_size(data), secret.data(), secret.size()) != nullptr) ++watched.withSecret;
   }
-  if (data != nullptr && watching) --live;
+  if (data != nullptr && watched.isCounting) --watched.live;
   __real_free(data);
 }
 }
 #pragma GCC visibility pop
-
-namespace test {
-
-AllocationWatch::AllocationWatch(long failingNumber, bool andLater) {
-  counted = live = 0;
-  failing = failingNumber;
-  laterOnesToo = andLater;
-  watching = true;
-}
-
-AllocationWatch::~AllocationWatch() {
-  watching = false;
-}
-
-long AllocationWatch::count() const {
-  return counted;
-}
-
-long AllocationWatch::unreleased() const {
-  return live;
-}
-
-ReleaseWatch::ReleaseWatch(std::string secret) : secret_(std::move(secret)) {
-  released = releasedWithSecret = 0;
-  soughtSecret = &secret_;
-}
-
-ReleaseWatch::~ReleaseWatch() {
-  soughtSecret = nullptr;
-}
-
-long ReleaseWatch::releases() const {
-  return released;
-}
-
-long ReleaseWatch::withSecret() const {
-  return releasedWithSecret;
-}
-
-}  // namespace test

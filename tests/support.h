@@ -72,29 +72,39 @@ class TraceCapture {
   std::vector<Record> records_;
 };
 
+// What the watches below see on this thread.
+struct Watched {
+  bool isCounting = false, andLater = false;
+  long counted = 0, failing = -1, live = 0, withSecret = 0;
+  const std::string* secret = nullptr;
+};
+inline thread_local Watched watched;
+
 // Counts the product's allocations on this thread and fails the one with the given number (from 0; -1 for none), or all
 // from that one on. Calls of malloc, calloc, strdup and free in the product's objects are routed here by the linker,
 // and a write behind the end of what they give ends the suite.
 class AllocationWatch {
  public:
-  explicit AllocationWatch(long failing = -1, bool andLater = false);
-  ~AllocationWatch();
-  long count() const;
-  long unreleased() const;
+  explicit AllocationWatch(long failing = -1, bool andLater = false) {
+    watched.counted = watched.live = 0;
+    watched.failing = failing;
+    watched.andLater = andLater;
+    watched.isCounting = true;
+  }
+  ~AllocationWatch() { watched.isCounting = false; }
+  long count() const { return watched.counted; }
+  long unreleased() const { return watched.live; }
 };
 
 // Looks into what the product releases on this thread, just before it goes: whether the secret still lies in it.
 class ReleaseWatch {
  public:
-  explicit ReleaseWatch(std::string secret);
-  ~ReleaseWatch();
-  ReleaseWatch(const ReleaseWatch&) = delete;
-  ReleaseWatch& operator=(const ReleaseWatch&) = delete;
-  long releases() const;
-  long withSecret() const;
-
- private:
-  std::string secret_;
+  explicit ReleaseWatch(const std::string& secret) {  // which outlives it
+    watched.withSecret = 0;
+    watched.secret = &secret;
+  }
+  ~ReleaseWatch() { watched.secret = nullptr; }
+  long withSecret() const { return watched.withSecret; }
 };
 
 // Leaves no zeros where the next call has its locals.
