@@ -3,23 +3,14 @@
  * that the library must see change. With decoys preloaded it shows that the library keeps to its own functions. Each
  * scheme is used with the stack at every distance from a multiple of 16, as hosts of the older 32-bit convention do. */
 #include <alloca.h>
-#include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
-#include <unistd.h>
 
 #include "aes_keys.h"
+#include "check.h"
 #include "crypto_provider.h"
 #include "encoding_utils.h"
 #include "password_schemes.h"
-
-#define CHECK(condition)                                                    \
-  do {                                                                      \
-    if (!(condition)) {                                                     \
-      fprintf(stderr, "line %d: %s does not hold\n", __LINE__, #condition); \
-      return 1;                                                             \
-    }                                                                       \
-  } while (0)
 
 static int noRandomBytes(void* ctx, unsigned char* buffer, int count) {
   (void)ctx, (void)buffer, (void)count;
@@ -30,7 +21,7 @@ static int matches(const char* password, const char* stored, AesKeyData* keys) {
   return verify_password(password, (int)strlen(password), stored, (int)strlen(stored), 1, keys) == 0;
 }
 
-static int usedOnStackMovedBy(size_t distance, int scheme, char* salt, AesKeyData* keys) {
+static void useOnStackMovedBy(size_t distance, int scheme, char* salt, AesKeyData* keys) {
   volatile char* moved = alloca(distance);
   char value[1024];
   char* clear = NULL;
@@ -39,11 +30,10 @@ static int usedOnStackMovedBy(size_t distance, int scheme, char* salt, AesKeyDat
   CHECK(matches("secret", value, keys) && !matches("Secret", value, keys));
   CHECK(scheme < FORMAT_QVEIL || (unformat_password(value, &clear, keys, NULL) == 1 && strcmp(clear, "secret") == 0));
   _morva_utils_decode_buffer_free(&clear);
-  return 0;
 }
 
 /* The tags are arrays of the library's own, back to back with one NUL behind the last, that a host may write to. */
-static int tagsHold(void) {
+static void checkTags(void) {
   char* const tags[] = {SHA_BRACED,    SSHA_BRACED,   MD5_BRACED,    crypt_BRACED, qVEIL_BRACED,
                         AES128_BRACED, AES192_BRACED, AES256_BRACED, VLDL_BRACED};
   char* const texts[] = {"{SHA}",    "{SSHA}",   "{MD5}",    "{crypt}", "{qVEIL}",
@@ -60,7 +50,6 @@ static int tagsHold(void) {
     }
   }
   CHECK(*next == '\0');
-  return 0;
 }
 
 int main(void) {
@@ -81,11 +70,10 @@ int main(void) {
 
   generate_crypt_salt(salt);
   for (size_t i = 0; i < sizeof schemes / sizeof schemes[0]; ++i) {
-    for (size_t distance = 4; distance <= 64; distance += 4)
-      CHECK(usedOnStackMovedBy(distance, schemes[i], salt, keys) == 0);
+    for (size_t distance = 4; distance <= 64; distance += 4) useOnStackMovedBy(distance, schemes[i], salt, keys);
   }
 
-  CHECK(tagsHold() == 0);
+  checkTags();
   free(sync);
   freeAesKeyData(keys);
   unlink(stash);

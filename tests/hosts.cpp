@@ -22,21 +22,15 @@
 #include <thread>
 #include <vector>
 
+#include "check.h"
 #include "crypto_provider.h"
 #include "ldtr.h"
 #include "password_schemes.h"
+#include "support.h"
 
 extern "C" int bump_refuse(long number, int andLater) __attribute__((weak));  // of bump.c, where that is preloaded
 
 namespace {
-
-#define CHECK(condition)                                                         \
-  do {                                                                           \
-    if (!(condition)) {                                                          \
-      std::fprintf(stderr, "line %d: %s does not hold\n", __LINE__, #condition); \
-      _exit(1);                                                                  \
-    }                                                                            \
-  } while (0)
 
 AesKeyData* newKeys() {
   AesKeyData* keys = nullptr;
@@ -181,18 +175,16 @@ void runsOutOfMemory() {
     for (const int andLater : {0, 1}) {
       int status = 0;
       for (long number = 0; status == 0; number += 1 + number / 50) {
-        const pid_t child = fork();
-        if (child == 0) {
-          _exit(scheme == kMaking       ? makeKeysWithoutMemory(number, andLater)
-                : scheme == kRebuilding ? restoreWithoutMemory(path, number, andLater)
-                                        : useWithoutMemory(scheme, number, andLater));
-        }
-        CHECK(waitpid(child, &status, 0) == child);
-        if (status != 0 && status != 77 << 8U) {
+        status = test::inChild([&] {
+          return scheme == kMaking       ? makeKeysWithoutMemory(number, andLater)
+                 : scheme == kRebuilding ? restoreWithoutMemory(path, number, andLater)
+                                         : useWithoutMemory(scheme, number, andLater);
+        });
+        if (status != 0 && status != 77) {
           std::fprintf(stderr, "scheme %d, request %ld%s\n", scheme, number, andLater ? " and later" : "");
         }
       }
-      CHECK(status == 77 << 8U);
+      CHECK(status == 77);
     }
   }
   unlink(path);
@@ -470,16 +462,9 @@ int main(int argc, char** argv) {
   int failed = 0;
   for (const Host& host : kHosts) {
     for (int i = 0; i < (host.countsOnLuck ? times : 1); ++i) {
-      const pid_t child = fork();
-      if (child == 0) {
-        alarm(60);
-        host.run();
-        std::exit(0);
-      }
-      int status = -1;
-      waitpid(child, &status, 0);
+      const int status = test::inChild([&host] { return host.run(), std::exit(0), 0; });
       if (status == 0) continue;
-      std::fprintf(stderr, "a host that %s: status %#x\n", host.name, static_cast<unsigned>(status));
+      std::fprintf(stderr, "a host that %s: status %d\n", host.name, status);
       failed = 1;
     }
   }

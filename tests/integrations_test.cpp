@@ -224,14 +224,7 @@ TEST(KeyFile, IsOpenedOnceAndReadNoFurtherThanAKeyFileGoes) {
 
 // ---- slapd ----
 
-using Check = int(const berval*, const berval*, const berval*, const char**);
-using Hash = int(const berval*, const berval*, berval*, const char**);
-struct Registered {
-  const berval* name;
-  Check* check;
-  Hash* hash;
-};
-std::vector<Registered> registered;
+std::string registered;  // the names, in their order
 
 void* openPlugin(const char* path) {
   void* handle = dlopen(path, RTLD_NOW | RTLD_GLOBAL);
@@ -239,36 +232,20 @@ void* openPlugin(const char* path) {
   return handle;
 }
 
-berval bervalOf(std::string& text) {
-  return {text.size(), text.data()};
-}
-
-// Loads the module as slapd does, stores and checks one password under each scheme, and ends.
+// Loads the module as slapd does, and ends.
 [[noreturn]] void runSlapd(std::vector<std::string> arguments) {
   alarm(60);
   void* handle = openPlugin(LDAPPW_SLAPD_MODULE);
   std::vector<char*> argv;
   for (std::string& argument : arguments) argv.push_back(argument.data());
-  const int started =
-      reinterpret_cast<int (*)(int, char**)>(dlsym(handle, "init_module"))(static_cast<int>(argv.size()), argv.data());
-  for (const Registered& row : registered) {
-    std::string password = "horse", known = password;
-    const berval clear = bervalOf(password);
-    const char* text = "cannot be made";
-    berval value{};
-    const bool isMade = row.hash != nullptr && row.hash(row.name, &clear, &value, &text) == 0;
-    if (row.hash != nullptr) known = make(*plugin::findScheme(row.name->bv_val), password, keys().data);
-    std::string payload = (isMade ? value.bv_val : known).substr(row.hash != nullptr ? row.name->bv_len : 0);
-    const berval stored = bervalOf(payload);
-    std::fprintf(stderr, "[%s %s %d]\n", row.name->bv_val, isMade ? "made" : text,
-                 row.check(row.name, &stored, &clear, nullptr));
-    ber_memfree(value.bv_val);
-  }
+  const auto start = reinterpret_cast<int (*)(int, char**)>(dlsym(handle, "init_module"));
+  const int started = start(static_cast<int>(argv.size()), argv.data());
+  std::fprintf(stderr, "%s", registered.c_str());
   reinterpret_cast<int (*)()>(dlsym(handle, "term_module"))();
   std::exit(started == 0 ? 0 : 1);
 }
 
-TEST(SlapdDeathTest, ServesWhatItsArgumentsSay) {
+TEST(SlapdDeathTest, RegistersWhatItsArgumentsSay) {
   testing::FLAGS_gtest_death_test_style = "threadsafe";
   const std::string file = "keys=" + keys().path;
   const struct {
@@ -276,11 +253,9 @@ TEST(SlapdDeathTest, ServesWhatItsArgumentsSay) {
     int code;
     const char* said;
   } rows[] = {
-      {{file}, 0, "\\[.qVEIL. made 0\\](.|\n)*\\[.AES256. made 0\\](.|\n)*\\[.VLDL. cannot be made -1\\]"},
-      {{file, "schemes=SSHA,{crypt},md5,"}, 0, "\\[.qVEIL. this scheme is not served -1\\](.|\n)*\\[.SSHA. made 0\\]"},
-      {{"keys=/"},
-       0,
-       "file /: Is a directory; no value of .*(.|\n)*.AES128. the server has no keys for this scheme -1\\]"},
+      {{file}, 0, "^\\[.qVEIL.\\]\\[.AES128.\\]\\[.AES192.\\]\\[.AES256.\\]\\[.VLDL.\\]$"},
+      {{file, "schemes=SSHA,{crypt},md5,"}, 0, "\\[.SSHA.\\]"},
+      {{"keys=/"}, 0, "file /: Is a directory; no value of "},
       {{"schemes="}, 1, "unknown scheme \"\" in schemes="},
       {{"schemes=qveil", "schemes=sha"}, 1, "unknown or repeated argument \"schemes=sha\"; there are keys=FILE and"},
   };
@@ -371,8 +346,8 @@ int fstat(int fd, struct stat* found) noexcept {
   if (swappedIn != nullptr && std::rename(swappedIn, swappedOut) == 0) swappedIn = nullptr;
   return rc;
 }
-int lutil_passwd_add(berval* scheme, Check* check, Hash* hash) {
-  registered.push_back({scheme, check, hash});
+int lutil_passwd_add(berval* scheme, void*, void*) {
+  registered += "[" + std::string(scheme->bv_val) + "]";
   return 0;
 }
 void lutil_debug(int, int, const char* format, ...) {

@@ -3,9 +3,10 @@
  * memory stays as it is, and that the library path which it has set outlives it: loader_loop LIBRARY [TIMES]. */
 #include <dlfcn.h>
 #include <malloc.h>
-#include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
+
+#include "check.h"
 
 typedef int (*Format)(int, char*, void*, const char*, int, char*, int);
 
@@ -20,43 +21,29 @@ static int isMapped(const char* library) {
 
 int main(int argc, char** argv) {
   enum { kWithoutProvider = 2, kWithProvider = 9 }; /* {SHA} and {SSHA} */
+  CHECK(argc > 1);
   const int times = argc > 2 ? atoi(argv[2]) : 200;
   size_t before = 0;
   setenv("LD_LIBRARY_PATH", "/opt/x", 1);
-  for (int i = 0; argc > 1 && i < times; ++i) {
+  for (int i = 0; i < times; ++i) {
     void* library = dlopen(argv[1], RTLD_NOW | RTLD_LOCAL);
     Format format = NULL;
     int (*setPath)(void) = NULL;
     char value[128];
-    if (library == NULL) {
-      fprintf(stderr, "%s\n", dlerror());
-      return 1;
-    }
+    CHECK(library != NULL);
     void* symbol = dlsym(library, "format_password");
     memcpy(&format, &symbol, sizeof symbol);
     symbol = dlsym(library, "setDefLibpath");
     memcpy(&setPath, &symbol, sizeof symbol);
     setPath();
     const int scheme = i % 2 == 0 ? kWithoutProvider : kWithProvider;
-    if (format == NULL || format(scheme, NULL, NULL, "abc", 3, value, sizeof value) == 0) {
-      fprintf(stderr, "round %d: nothing was formatted\n", i);
-      return 1;
-    }
-    if (dlclose(library) != 0 || dlopen(argv[1], RTLD_NOW | RTLD_NOLOAD) != NULL) {
-      fprintf(stderr, "round %d: the library stays\n", i);
-      return 1;
-    }
-    if (strcmp(getenv("LD_LIBRARY_PATH"), "/opt/x:/usr/lib") != 0) {
-      fprintf(stderr, "round %d: the library path is gone\n", i);
-      return 1;
-    }
+    CHECK(format != NULL && format(scheme, NULL, NULL, "abc", 3, value, sizeof value) > 0);
+    CHECK(dlclose(library) == 0 && dlopen(argv[1], RTLD_NOW | RTLD_NOLOAD) == NULL);
+    CHECK(strcmp(getenv("LD_LIBRARY_PATH"), "/opt/x:/usr/lib") == 0);
     if (i == 20) before = mallinfo2().uordblks;
   }
   const size_t after = mallinfo2().uordblks;
-  if (argc > 1 && !(isMapped("libtresk7qels.so") && isMapped("libcrypto.so"))) {
-    fprintf(stderr, "the provider or OpenSSL is gone\n");
-    return 1;
-  }
-  if (argc > 1 && after > before) fprintf(stderr, "%zu bytes became %zu\n", before, after);
-  return argc > 1 && after <= before ? 0 : 2;
+  CHECK(isMapped("libtresk7qels.so") && isMapped("libcrypto.so"));
+  CHECK(after <= before);
+  return 0;
 }

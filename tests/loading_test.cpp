@@ -33,10 +33,7 @@ using test::TraceCapture;
 // copy, and returns what they were called with.
 std::string staged(const char* system, const char* shipped, const Body& body) {
   const test::TempFolder folder;
-  std::fflush(nullptr);
-  const pid_t child = fork();
-  if (child == 0) {
-    alarm(60);
+  const auto run = [&] {
     namespace fs = std::filesystem;
     fs::current_path(folder.file(""));
     fs::create_directories("install/qel/qellib");
@@ -49,9 +46,9 @@ std::string staged(const char* system, const char* shipped, const Body& body) {
     setenv("STANDIN_PATH", "/toolkit", 1);
     body();
     std::exit(testing::Test::HasFailure() ? 1 : 0);
-  }
-  int status = -1;
-  EXPECT_TRUE(waitpid(child, &status, 0) == child && status == 0) << status;
+    return 0;
+  };
+  EXPECT_EQ(test::inChild(run), 0);
   return test::fileContent(folder.file("log"));
 }
 
@@ -194,16 +191,7 @@ TEST(ProviderContext, IsMadeOverOneLibraryAndReleasedOnceHoweverOftenThatIsUnloa
   const std::string log = staged("complete", nullptr, [] {
     void* context = nullptr;
     char* attachPath = nullptr;
-    const TraceCapture trace;
     EXPECT_EQ(initQelCrypto(&context), 0);
-    EXPECT_EQ(test::outlineOf(trace),
-              ">initQelCrypto: Entering. qelCtx = #\n>loadQelCrypto: Entering. attachPath = #\n"
-              ">getQelInstallLibPath: Entering.\ngetQelInstallLibPath: Leaving. rc = 0\n<"
-              "loadQelCrypto:- qelAttachPath = /toolkit\nloadQelCrypto: Leaving. rc = 0\n<initQelCrypto: Leaving. "
-              "rc = 0\n<");
-    for (const test::Record& r : trace.records()) {
-      EXPECT_TRUE((r.id & 0xffff00ffU) == 0x50010000U && r.level == 43 && r.mask == 0x10000) << r.text;
-    }
     qelLibraryName = "not_there.so";  // not opened any more
     void** cell = qelLoadGlobal;
     EXPECT_EQ(loadQelCrypto(&attachPath), 0);
@@ -259,8 +247,6 @@ TEST(ProviderContext, FailuresLeaveItAbsentAndMayBeRetried) {
     char untouched = 0;
     void* context = &untouched;
     const TraceCapture trace(TraceCapture::kLinesOnly);
-    EXPECT_EQ(loadQelCrypto(nullptr), 1);
-    EXPECT_EQ(initQelCrypto(nullptr), 1);
     failingPutEnvVar = 1;
     EXPECT_EQ(initQelCrypto(&context), 7);
     setenv("STANDIN_FAILS", "1", 1);
@@ -270,13 +256,9 @@ TEST(ProviderContext, FailuresLeaveItAbsentAndMayBeRetried) {
     unsetenv("STANDIN_FAILS");
     EXPECT_EQ(initQelCrypto(&context), 0);
     EXPECT_EQ(context, qelCtxGlobal);
-    const Lines expected = {"Error - loadQelCrypto: Invalid parameter. rc = 1\n",
-                            "Error - initQelCrypto: Invalid parameter. rc = 1\n",
-                            "Error - loadQelCrypto: putEnvVar failed rc = 7\n",
-                            "Error - initQelCrypto: loadQelCrypto() failed. \n",
-                            kToolkit,
-                            "Error - initQelCrypto: QEL_Init() returned NULL context. rc = 1\n",
-                            kToolkit};
+    const Lines expected = {"Error - loadQelCrypto: putEnvVar failed rc = 7\n",
+                            "Error - initQelCrypto: loadQelCrypto() failed. \n", kToolkit,
+                            "Error - initQelCrypto: QEL_Init() returned NULL context. rc = 1\n", kToolkit};
     EXPECT_EQ(trace.messages(), expected);
     test::expectErrorClasses(trace);
   });
@@ -316,9 +298,6 @@ TEST(ProviderStatus, MapsToAnLdapCodeAndShowsItselfGivenOrAskedFor) {
     EXPECT_EQ(qelStatusToLdap(&provider, nullptr), row.rc);
     EXPECT_EQ(testing::internal::GetCapturedStdout(), row.output + row.output);
   }
-  const TraceCapture trace;
-  EXPECT_EQ(qelStatusToLdap(nullptr, nullptr), 1);
-  EXPECT_EQ(trace.messages(), Lines{"Error - qelStatusToLdap: Invalid parameter. rc = 1\n"});
 }
 
 }  // namespace

@@ -11,7 +11,6 @@
 #include <openssl/err.h>
 #include <openssl/provider.h>
 #include <sys/mman.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -21,7 +20,6 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <functional>
 #include <future>
 #include <mutex>
 #include <set>
@@ -620,25 +618,14 @@ TEST_F(Qel, ThreadsShareAContextWhileOthersComeAndGo) {
 
 // ---- What happens once in a process: in children of it, before it starts OpenSSL ----
 
-constexpr int kGood = 3, kBad = 4, kRefused = 5, kCrashed = -1;
-
-int inChild(const std::function<int()>& run) {
-  const pid_t child = fork();
-  if (child == 0) {
-    alarm(60);
-    _exit(run());
-  }
-  int status = 0;
-  waitpid(child, &status, 0);
-  return WIFEXITED(status) ? WEXITSTATUS(status) : kCrashed;
-}
+constexpr int kGood = 3, kBad = 4, kRefused = 5;
 
 // Refuses all allocations from one on, the first in the first use of OpenSSL. Afterwards everything works that says so.
 // An OpenSSL newer than 3.0 has its base first: without memory it waits for itself there.
 TEST(QelDeathTest, RefusedMemoryIsAResult) {
   int refused = 0;
   for (long n = 0; n < 300; ++n) {
-    const int result = inChild([n] {
+    const int result = test::inChild([n] {
       if (OPENSSL_version_minor() > 0) OPENSSL_init_crypto(OPENSSL_INIT_NO_ATEXIT, nullptr);
       allocationsLeft = n;
       const Handles first;
@@ -701,10 +688,10 @@ int holdAll() {
 }
 
 TEST(QelDeathTest, WhatHappensOnce) {
-  EXPECT_EQ(inChild(startWithoutMemory), kGood);
-  EXPECT_EQ(inChild(endOpenssl), kGood);
-  EXPECT_EQ(inChild(outliveExit), kGood);
-  EXPECT_EQ(inChild(holdAll), kGood);
+  EXPECT_EQ(test::inChild(startWithoutMemory), kGood);
+  EXPECT_EQ(test::inChild(endOpenssl), kGood);
+  EXPECT_EQ(test::inChild(outliveExit), kGood);
+  EXPECT_EQ(test::inChild(holdAll), kGood);
 }
 
 // ---- The library as the loader sees it ----
@@ -753,7 +740,7 @@ TEST(QelDeathTest, ReportsItsFolder) {
       const std::string expected = row.folder.empty() ? "" : row.folder + '\0';
       return works == !expected.empty() && buffer.find_first_of('?') == expected.size() ? kGood : kBad;
     };
-    EXPECT_EQ(inChild(report), kGood) << row.name << " from " << row.from << " into " << row.bytes;
+    EXPECT_EQ(test::inChild(report), kGood) << row.name << " from " << row.from << " into " << row.bytes;
     std::filesystem::remove_all(root + "/" + deep);
   }
 }

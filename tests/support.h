@@ -5,8 +5,10 @@
 #include <gnu/libc-version.h>
 #include <pthread.h>
 #include <sys/mman.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
@@ -106,6 +108,19 @@ class ReleaseWatch {
   ~ReleaseWatch() { watched.secret = nullptr; }
   long withSecret() const { return watched.withSecret; }
 };
+
+// Runs in a child process, which has a minute: what is returned there, or -1 for a signal.
+template <typename Run>
+int inChild(Run run) {
+  std::fflush(nullptr);
+  const pid_t child = fork();
+  if (child == 0) {
+    alarm(60);
+    _exit(run());
+  }
+  int status = 0;
+  return waitpid(child, &status, 0) == child && WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
 
 // Leaves no zeros where the next call has its locals.
 [[gnu::noinline]] inline void dirtyStack() {
