@@ -221,6 +221,7 @@ TEST_F(Keys, PairsAreCreatedAndRebuiltTheSame) {
   for (const std::string& secret : {std::string(seed), key.substr(0, 16)}) {
     const ReleaseWatch watch(secret);
     EXPECT_EQ(restore(), 0);
+    replacing(path, "/dev/full")([&] { EXPECT_EQ(create() + restore(), 2); });
     EXPECT_EQ(watch.withSecret(), 0) << secret;
   }
   replacing(salt, nullptr)([&] { ASSERT_EQ(create(), 0); });

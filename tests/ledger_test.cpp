@@ -604,10 +604,11 @@ TEST_F(Ledger, HoldsForEveryOperation) {
   }
 }
 
-// What log readers find operations by, as tests/data/scopes.vec has it: the scope's number, level and mask, and the
-// line on entering, where there is one. The line on leaving has the same name, but for a few.
+// What log readers find operations by, as tests/data/scopes.vec has it: the scope's number, level and mask, the
+// code that it gives, and the line on entering, where there is one. The line on leaving has the same name, but for a few.
 TEST_F(Ledger, ScopesNameThemselves) {
   std::map<std::string, std::string> scopes;
+  std::map<std::string, std::string> exits;  // the last ones
   std::map<unsigned, std::string> entered;
   std::set<std::string> oddlyLeft;
   const TraceCapture trace;
@@ -620,6 +621,7 @@ TEST_F(Ledger, ScopesNameThemselves) {
     char scope[32];
     std::snprintf(scope, sizeof scope, "%08x %u %x", r.id, r.level, r.mask);
     if (r.kind == LDTR_ENTRY) scopes.emplace(scope, "\n");
+    if (r.kind == LDTR_EXIT) exits[scope] = std::to_string(r.rc);
     const bool isLeft = r.text.find(": Leaving.") != std::string::npos;
     const std::regex usual(entered[r.id] + ": Leaving\\. rc = -?\\d+\n");
     if (isLeft && !std::regex_match(r.text, usual)) oddlyLeft.insert(r.text);
@@ -628,7 +630,7 @@ TEST_F(Ledger, ScopesNameThemselves) {
     scopes[scope] = " " + std::regex_replace(r.text, std::regex("0x[0-9a-f]+|\\(nil\\)"), "#");
   }
   std::string all;
-  for (const auto& [scope, line] : scopes) all += scope + line;
+  for (const auto& [scope, line] : scopes) all += scope + " gives " + exits[scope] + line;
   EXPECT_EQ(all, fileContent(LDAPPW_TEST_DATA "/scopes.vec"));
   const std::set<std::string> expected = {"genKeyStashFile: Leaving. rc = 0\n", "unsaltedHashEncrypt: Leaving. rc=0\n",
                                           "validateCryptoString: Leaving. rc = 0\n"};

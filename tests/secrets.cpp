@@ -157,6 +157,7 @@ std::vector<Run> runsWith(const std::string& password, const std::string& seed) 
   const Words encoded = {base64, password};
   free(base64);
   std::ofstream("salt") << "saltsaltsalt\n";
+  std::ofstream("short.stash") << content.substr(0, content.size() - 1);
   std::ofstream("bad") << password << '\n';
   std::ofstream("changes") << "dn: cn=a\nchangetype: modify\ndelete: userPassword\nuserPassword: " + password +
                                   "\n-\nadd: userPassword\nuserPassword: " + ssha + "\n-\n\n";
@@ -166,6 +167,7 @@ std::vector<Run> runsWith(const std::string& password, const std::string& seed) 
       {"keys restore --salt-file salt none/at/all", seed, {seed}, 5},
       {"keys create --config none/at --directory none/all", seed, {seed}, 5},
       {"keys show dir.stash", "", keyAlone},
+      {"keys show short.stash", "", keyAlone, 4},
       {"keys show --json dir.stash", "", keyAlone},
       {"keys compare dir.stash dir.stash", "", keyAlone},
       {"keys check --sync other dir.stash", "", keyAlone, 1},
