@@ -1,8 +1,7 @@
 /* SPDX-License-Identifier: Apache-2.0 */
-/* For programs that are tests themselves: a condition that has to hold. */
+/* For programs that are tests themselves: a condition that has to hold. Who includes it includes the standard output. */
 #pragma once
 
-#include <stdio.h>
 #include <unistd.h>
 
 #define CHECK(condition)                                                    \

@@ -3,6 +3,7 @@
  * that the library must see change. With decoys preloaded it shows that the library keeps to its own functions. Each
  * scheme is used with the stack at every distance from a multiple of 16, as hosts of the older 32-bit convention do. */
 #include <alloca.h>
+#include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
 

@@ -3,6 +3,7 @@
  * memory stays as it is, and that the library path which it has set outlives it: loader_loop LIBRARY [TIMES]. */
 #include <dlfcn.h>
 #include <malloc.h>
+#include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
 
