@@ -1,5 +1,5 @@
 /* SPDX-License-Identifier: Apache-2.0 */
-/* For programs that are tests themselves: a condition that has to hold. Who includes it includes the standard output. */
+/* For programs that are tests themselves: a condition that has to hold. Include stdio.h before it. */
 #pragma once
 
 #include <unistd.h>

@@ -604,8 +604,8 @@ TEST_F(Ledger, HoldsForEveryOperation) {
   }
 }
 
-// What log readers find operations by, as tests/data/scopes.vec has it: the scope's number, level and mask, the code that
-// it gives, and the line on entering, where there is one. The line on leaving has the same name, but for a few.
+// What log readers find operations by, as tests/data/scopes.vec has it: the scope's number, level and mask, the code
+// that it gives, and the line on entering, where there is one. The line on leaving has the same name, but for a few.
 TEST_F(Ledger, ScopesNameThemselves) {
   std::map<std::string, std::string> scopes;
   std::map<std::string, std::string> exits;  // the last ones
