@@ -14,10 +14,8 @@
 #include <cstdlib>
 #include <cstring>
 #include <exception>
-#include <fstream>
 #include <iterator>
 #include <mutex>
-#include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -116,14 +114,13 @@ void worksInThreads() {
 // In a child: a stash file is rebuilt while memory runs out, and has its former bytes or the new ones afterwards.
 int restoreWithoutMemory(const char* path, long number, int andLater) {
   const std::string former(200, 'x');
-  std::ofstream(path) << former;
+  test::putFile(path, former);
   alarm(20);
   bump_refuse(number, andLater);
   const int rc = restoreKeyStashFile(path, "a-seed-of-characters", "saltsaltsalt");
   const bool isEnd = bump_refuse(-1, 0) != 0;
-  std::ostringstream content;
-  content << std::ifstream(path).rdbuf();
-  CHECK(rc == 0 ? content.str().size() == 116 : content.str() == former);
+  const std::string content = test::fileContent(path);
+  CHECK(rc == 0 ? content.size() == 116 : content == former);
   return isEnd ? 77 : 0;
 }
 

@@ -23,6 +23,7 @@
 #include "aes_keys.h"
 #include "encoding_utils.h"
 #include "password_schemes.h"
+#include "support.h"
 
 namespace {
 
@@ -98,15 +99,14 @@ std::string leftBy(const Words& program, const std::string& input, const Words& 
     delivered = WSTOPSIG(status) == SIGTRAP ? 0 : WSTOPSIG(status);
   } while (status >> 8 != (SIGTRAP | PTRACE_EVENT_EXIT << 8));
   std::string found;
-  std::ostringstream log;
-  log << std::ifstream(kLog).rdbuf();
+  const std::string log = test::fileContent(kLog);
   for (const std::string& word : words) {
     found += placeOf(child, word);
-    if (has(log.str(), word)) found += "\n  in the log";
+    if (has(log, word)) found += "\n  in the log";
   }
   unsigned long code = 0;
   ptrace(PTRACE_GETEVENTMSG, child, nullptr, &code);
-  if (code >> 8 != expected) found += "\n  exit code " + std::to_string(code >> 8) + "\n" + log.str();
+  if (code >> 8 != expected) found += "\n  exit code " + std::to_string(code >> 8) + "\n" + log;
   ptrace(PTRACE_CONT, child, nullptr, 0);
   waitpid(child, &status, 0);
   return found;
@@ -116,12 +116,6 @@ std::string randomText(std::mt19937& random) {
   std::string text;
   while (text.size() < kSecretBytes) text += static_cast<char>('A' + random() % 26);
   return text;
-}
-
-std::string contentOf(const char* path) {
-  std::ostringstream content;
-  content << std::ifstream(path, std::ios::binary).rdbuf();
-  return content.str();
 }
 
 // A stored value under the keys of the case.
@@ -147,7 +141,7 @@ struct Run {
 };
 
 std::vector<Run> runsWith(const std::string& password, const std::string& seed) {
-  const std::string keys = " --keys dir.stash", content = contentOf(kDirectory);
+  const std::string keys = " --keys dir.stash", content = test::fileContent(kDirectory);
   const Words both = {password, content.substr(content.size() - 32, 16)}, keyAlone = {both[1]};
   const std::string aes = valueOf(password, FORMAT_AES256), ssha = valueOf(password, FORMAT_SSHA);
   const std::string mixed = exportOf(aes) + exportOf(password) + exportOf(valueOf(password, FORMAT_QVEIL));
@@ -227,10 +221,7 @@ int examine(const std::string& command) {
 
 int main(int argc, char** argv) {
   if (argc < 2) return leaveACopy();
-  const std::filesystem::path folder = std::filesystem::temp_directory_path() / ("secrets-" + std::to_string(getpid()));
-  std::filesystem::create_directory(folder);
-  std::filesystem::current_path(folder);
-  const int failed = examine(argv[1]);
-  std::filesystem::remove_all(folder);
-  return failed;
+  const test::TempFolder folder;
+  std::filesystem::current_path(folder.file(""));
+  return examine(argv[1]);
 }
