@@ -74,6 +74,7 @@ cmake --build "$work/cmake" >>"$work/log"
 "$work/cmake/outside"
 
 # These packages are not in Debian, so their first version closes no bug there. The standard may be newer than lintian.
+# Compilers copy short texts in halves that overlap, which lintian reads as misspelt words ("rep" + "port").
 lintian --allow-root -I --pedantic --fail-on warning,info,pedantic \
-  --suppress-tags initial-upload-closes-no-bugs,newer-standards-version "$packages"/*.changes
+  --suppress-tags initial-upload-closes-no-bugs,newer-standards-version,spelling-error-in-binary "$packages"/*.changes
 echo "package_test: the packages of version $version are in order"

@@ -126,6 +126,7 @@ test_other_users() {
   run "another user's link" 5 keys restore theirs --force --seed-file seed --salt-file salt
   same "another user's link" mine "$(<victim)"
   # Root owns the memory, as the kernel shows it, of a process that is not to be dumped.
+  setpriv --reuid=65534 --clear-groups test -x "$tool" || return 0  # out of its reach
   chmod 711 .
   coproc setpriv --reuid=65534 --clear-groups "$tool" identify 2>/dev/null
   until_true isWaiting $COPROC_PID

@@ -113,8 +113,10 @@ void nameLeftovers(const Place& place, std::string (*describe)(int fd)) {
     }
     const Descriptor file = place.open(name);
     if (file.valid() && flock(file.get(), LOCK_SH | LOCK_NB) != 0 && errno == EWOULDBLOCK) continue;
-    const std::string content = describe != nullptr && file.valid() ? ", " + describe(file.get()) : "";
-    warning("a run that was ended has left " + place.folderPath() + "/" + name + content);
+    std::string left = "a run that was ended has left " + place.folderPath();
+    left.append("/").append(name);
+    if (describe != nullptr && file.valid()) left.append(", ").append(describe(file.get()));
+    warning(left);
   }
 }
 

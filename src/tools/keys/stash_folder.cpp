@@ -9,8 +9,10 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
+#include <cstdint>
 #include <cstdio>
 #include <fstream>
+#include <sstream>
 #include <string>
 #include <thread>
 
@@ -27,15 +29,17 @@ constexpr std::chrono::milliseconds kBetweenTries{100};
 // Who has locked the folder, as /proc/locks lists it: "1: FLOCK ADVISORY WRITE 4711 08:01:1234 0 EOF".
 std::string holderOf(int folder) {
   struct stat locked {};
+  fstat(folder, &locked);
+  char place[64];
+  snprintf(place, sizeof place, "%02x:%02x:%ju", major(locked.st_dev), minor(locked.st_dev), uintmax_t{locked.st_ino});
   std::ifstream locks("/proc/locks");
   std::string line;
-  while (fstat(folder, &locked) == 0 && std::getline(locks, line)) {
+  while (std::getline(locks, line)) {
+    std::istringstream fields(line);
+    std::string number, kind, way, access, file;
     int process = 0;
-    unsigned major = 0;
-    unsigned minor = 0;
-    unsigned long long number = 0;
-    if (sscanf(line.c_str(), "%*d: FLOCK %*s %*s %d %x:%x:%llu", &process, &major, &minor, &number) != 4) continue;
-    if (number != locked.st_ino || makedev(major, minor) != locked.st_dev || process <= 0) continue;
+    if (!(fields >> number >> kind >> way >> access >> process >> file)) continue;
+    if (kind != "FLOCK" || file != place || process <= 0) continue;
     std::string name = "?";
     std::getline(std::ifstream("/proc/" + std::to_string(process) + "/comm"), name);
     return "process " + std::to_string(process) + " (" + name + ")";

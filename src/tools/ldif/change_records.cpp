@@ -81,7 +81,7 @@ void EarlierChanges::load(const std::string& path, const AttributeSet& attribute
     std::uint64_t record = 0;
     while (walker.next()) {
       if (!walker.atPassword()) continue;
-      if (walker.entries() != record) {
+      if (values == nullptr || walker.entries() != record) {
         keys.clear();
         values = &entries_[walker.dn()];
       }

@@ -73,7 +73,7 @@ constexpr ContextKind kDigest{
 
 // ---- The end of the process, and of the library ----
 
-bool isUnloading = false;  // dlclose has begun
+bool isUnloading = false;  // dlclose has begun, or the last part of exit
 bool isExiting = false;    // exit has begun, with other threads about: no context is made any more
 
 // Runs before the exit handlers of a library that is unloaded, and after those of a process that exits.
@@ -87,14 +87,21 @@ bool isOnlyThread() noexcept {
   return stat("/proc/self/task", &tasks) == 0 && tasks.st_nlink == 3;
 }
 
+void noteExit() noexcept {
+  if (!isUnloading && !isOnlyThread()) __atomic_store_n(&isExiting, true, __ATOMIC_RELEASE);
+}
+
+// Registered before any context is made: a context that a thread makes while the process exits would be released by its
+// own handler as by dlclose.
+[[gnu::constructor]] void watchExit() noexcept {
+  std::atexit(noteExit);
+}
+
 // Threads that still work when the process exits would lose the code under them: they keep the provider, which the
 // process takes with it anyway.
 void unloadAtExit() noexcept {
-  if (isUnloading || isOnlyThread()) {
-    unloadQelCrypto();
-  } else {
-    __atomic_store_n(&isExiting, true, __ATOMIC_RELEASE);
-  }
+  noteExit();
+  if (!__atomic_load_n(&isExiting, __ATOMIC_ACQUIRE)) unloadQelCrypto();
 }
 
 // ---- The process-wide context ----
