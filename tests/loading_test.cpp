@@ -19,7 +19,7 @@ extern "C" char* getKUBInstallLibPath(void) {
   return installFolder == nullptr ? nullptr : strdup(installFolder);
 }
 extern "C" int putEnvVar(const char* name, const char* value) {
-  return --failingPutEnvVar == 0 ? 7 : setenv(name, value, 1);
+  return __atomic_sub_fetch(&failingPutEnvVar, 1, __ATOMIC_RELAXED) == 0 ? 7 : setenv(name, value, 1);
 }
 
 namespace {
