@@ -372,7 +372,7 @@ void exitsAmongThreads() {
     if (child == 0) {
       alarm(20);
       std::atomic<int> started{0};
-      useEachScheme();  // who finds no context is refused
+      useEachScheme();                    // who finds no context is refused
       std::atexit([] { usleep(2000); });  // comes after the library's own handler
       for (int i = 0; i < 8; ++i) {
         std::thread([&started] {
