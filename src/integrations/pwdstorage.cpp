@@ -70,7 +70,7 @@ __attribute__((format(printf, 2, 3))) void report(int level, const char* format,
   slapi_log_error(level, subsystem, whole, line);
 }
 
-// The server knows the scheme by the function alone, so each scheme has its own.
+// One function for each scheme: the server knows the scheme by the function alone.
 template <SchemeIndex kIndex>
 int compare(const char* presented, const char* payload) noexcept {
   if (presented == nullptr || payload == nullptr) return kError;

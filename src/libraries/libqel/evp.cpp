@@ -34,7 +34,7 @@ int sizeOf(const QEL_CTX* ctx, const T* handle, size_t Algorithm::*size) noexcep
   return found == nullptr ? 0 : static_cast<int>(found->*size);
 }
 
-// Where the thread's own room is full, in a place that any thread may take.
+// Uses the thread's own room, or a place that any thread may take when that room is full.
 template <typename T>
 T* make(const QEL_CTX* ctx) noexcept {
   const Call call{ctx};

@@ -92,9 +92,9 @@ const Algorithm* findAlgorithm(Type type, const char* name) noexcept;
 
 enum class Phase { kFresh, kFailed, kEnded, kRunning };  // the first two need an init
 
-// A digest or cipher context. Its secrets go through wipe(): when it is cleaned up or freed, in QEL_Cleanup, and when
-// its thread ends. There the state is overwritten by another start, of a cipher with a key, a vector and a block of
-// zeros; or it is released, which the algorithms do with a wipe.
+// A digest or cipher context. wipe() removes its secrets: when it is cleaned up or freed, in QEL_Cleanup, and when its
+// thread ends. The state is wiped by re-initialising it, a cipher with a zero key, vector and block, or is released,
+// which the algorithms do with a wipe.
 struct Work : Entry {
   bool take(const Algorithm& wanted) noexcept;  // a state; false when memory has run out
   [[gnu::cold]] bool takeOver() noexcept;       // by the calling thread; likewise

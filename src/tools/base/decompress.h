@@ -17,8 +17,7 @@ class Decompressor {
   Decompressor& operator=(const Decompressor&) = delete;
   virtual ~Decompressor() = default;
 
-  // Decodes from the front of in, which is cut off in, and appends at most so many bytes to out. Throws Failure
-  // (kIoError) for damaged data.
+  // Consumes input from the front of in; appends at most bytes to out. Throws Failure (kIoError) for damaged data.
   virtual void decode(std::string_view& in, Secret& out, size_t bytes) = 0;
   // True where the input may end.
   virtual bool complete() const noexcept = 0;

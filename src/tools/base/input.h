@@ -63,8 +63,8 @@ constexpr LineLimit kPasswordLine{size_t{1} << 20, "a password"};
 constexpr LineLimit kSeedLine{1016, "a seed"};
 constexpr LineLimit kSaltLine{12, "a salt"};
 
-// Splits an input into lines. The newline, or the other end that is asked for, is no part of a line, a carriage return
-// stays, and a last line without a newline counts.
+// Splits input at newlines (or another terminator), which are dropped. A carriage return stays, and a last line without
+// a newline counts.
 class LineReader {
  public:
   LineReader(Input input, LineLimit limit, char end = '\n') : input_(std::move(input)), limit_(limit), end_(end) {}

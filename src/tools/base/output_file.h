@@ -61,7 +61,7 @@ class OutputFile {
   void write(std::string_view bytes);
   // Brings the content to the disk. Nothing has appeared under the target's name yet.
   void sync();
-  // Does that where it has not been done, then gives the file its name and brings the folder to the disk.
+  // Calls sync() if needed, then renames the file and syncs the folder.
   void commit();
   // The two steps of that, for several files.
   void giveName();

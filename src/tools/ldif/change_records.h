@@ -17,9 +17,9 @@ namespace tool {
 // The changes of one entry after the other.
 class ChangeWriter {
  public:
-  // old becomes made. Records of the entry before are written to part.
+  // Replaces old by made. Writes the records of the entry before to part.
   void replace(const RecordWalker& walker, const Secret& old, const Secret& made, ExportPart& part);
-  // old comes to made, which the entry has already: old goes. Not isNew: old is made itself, which need not be added.
+  // Deletes old, because the entry already holds made. Not isNew: old is made itself, and nothing is added.
   void drop(const RecordWalker& walker, const Secret& old, const Secret& made, bool isNew, ExportPart& part);
   void flush(ExportPart& part);
 

@@ -26,7 +26,7 @@ class AttributeSet {
   // The place of the name that covers the description, or kNone.
   size_t find(std::string_view description) const noexcept;
   const std::string& name(size_t place) const { return names_[place]; }
-  // How many of the first are names that were given, not those that are meant without any.
+  // Number of names the caller gave; 0 for the defaults.
   size_t given() const noexcept { return given_; }
 
  private:

@@ -16,8 +16,8 @@ namespace {
 
 constexpr char kFooter[] =
     R"(Findings, as --fail-on takes them: clear, known-bad, name-as-password, empty, reused, reversible, unsalted,
-des-crypt, malformed, wrapped, salted-fast, no-password, unopened, unknown, broken, unchecked. The number of a finding
-is one of entries, that of a scheme or strength one of values. No password is shown, nor any part of a value.
+des-crypt, malformed, wrapped, salted-fast, no-password, unopened, unknown, broken, unchecked. Findings count entries;
+schemes and strengths count values. No password is shown, nor any part of a value.
 Passwords are compared where they can be read: clear ones, masked ones, and AES values that --keys opens. Equal values
 of unsalted schemes, and of AES without keys, count as reused as well. One-way values are tried only with
 --check-hashes.

@@ -37,7 +37,7 @@ class StashFile {
   bool write(const void* data, size_t bytes) noexcept { return wholly(::write, static_cast<const char*>(data), bytes); }
   bool write(const SecBuffer& buffer) noexcept { return write(buffer.data, buffer.length); }
 
-  // Whether a regular file is known to hold less than so many further bytes.
+  // True if a regular file has fewer than bytes left.
   bool endsBefore(size_t bytes) noexcept {
     struct stat about {};
     const off_t at = lseek(descriptor_, 0, SEEK_CUR);

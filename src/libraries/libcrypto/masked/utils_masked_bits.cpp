@@ -15,7 +15,7 @@ constexpr unsigned bitCount(unsigned byte) {
   return count;
 }
 
-// That a pattern table has so many masks of so many bits, and a zero after them.
+// Checks mask count, bits per mask and the zero terminator of a pattern table.
 template <size_t kSize>
 constexpr bool holdsPatterns(const unsigned char (&table)[kSize], size_t masks, unsigned bits) {
   if (kSize != masks + 1 || table[masks] != 0) return false;

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What is to know about each scheme, a row a scheme: its code and tag, how long values are, which key it takes. Makers
-// and verification stand on these rows and pass them around, so that a row is looked up once.
+// The scheme table, one row per scheme: its code and tag, how long values are, which key it takes. Makers and
+// verification pass rows around, so that a row is looked up once.
 #pragma once
 
 #include <cstddef>

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Where the base64 text of an operation goes, and the digest and AES operations as the password module calls them: with
-// such a target, and with counted texts, which need no terminator and so no copy.
+// Output target for base64, and variants of the digest and AES operations that write to one and take counted texts,
+// which need no NUL and so no copy.
 #pragma once
 
 #include "aes_keys.h"

@@ -3,7 +3,7 @@
 // Lemire, "Faster Base64 Encoding and Decoding Using AVX2 Instructions", ACM Transactions on the Web 12 (2018), in
 // vectors of 16 bytes. Any other alphabet is looked up in its rows of sixteen. The last step of a text is taken back so
 // far that it ends where the text ends: nothing outside is read, and what it does again comes out the same.
-// Registers are left as they are: all that was in them is in the caller's text and result too.
+// Registers are not cleared: they hold nothing that the caller's buffers do not.
 #include "support/utils_base64.h"
 
 #include <immintrin.h>
