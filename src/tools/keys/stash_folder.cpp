@@ -9,7 +9,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
-#include <cstdint>
 #include <cstdio>
 #include <fstream>
 #include <sstream>
@@ -31,7 +30,8 @@ std::string holderOf(int folder) {
   struct stat locked {};
   fstat(folder, &locked);
   char place[64];
-  snprintf(place, sizeof place, "%02x:%02x:%ju", major(locked.st_dev), minor(locked.st_dev), uintmax_t{locked.st_ino});
+  snprintf(place, sizeof place, "%02x:%02x:%llu", major(locked.st_dev), minor(locked.st_dev),
+           static_cast<unsigned long long>(locked.st_ino));
   std::ifstream locks("/proc/locks");
   std::string line;
   while (std::getline(locks, line)) {
